@@ -1,0 +1,346 @@
+/*
+ * The task scheduler of the storage appliance: tasks are stored, started by cron and run as their
+ * owner. This header is usable from C and C++.
+ *
+ * Unless a declaration says otherwise, functions return 0 on success and -1 on failure. A failure
+ * sets the process's error state (PLATCErrGet, PLATCErrorGetFile and PLATCErrorGetLine of platc.h)
+ * and logs one line with syslog at LOG_ERR. A NULL pointer or a zero size is error 0x0D00
+ * everywhere.
+ *
+ *   0x0100, 0x0200  out of memory             0x2000  no backend, no such value or name
+ *   0x0400, 0x0500  run lock                  0x2700  a file's status could not be read
+ *   0x0900          cannot open or create     0x2800  a file could not be moved into place
+ *   0x0B00          read, write or look-up    0x2A00  a system call failed
+ *   0x0D00          invalid argument          0x4000  bad format
+ *
+ * The library is made for single-threaded processes: some functions return static buffers.
+ */
+#ifndef TAVISCHEDULER_H
+#define TAVISCHEDULER_H
+
+#include <stddef.h>
+#include <stdint.h>
+#include <stdio.h>
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+#define TAVI_SCHED_API __attribute__((visibility("default")))
+
+/* ---- Task record ---- */
+
+/* The backends that keep tasks. */
+#define TAVI_SCHED_BACKEND_SCHEDULE (-2)
+#define TAVI_SCHED_BACKEND_AUTOPOWER (-3)
+
+#define TAVI_SCHED_STATE_DISABLED 0
+#define TAVI_SCHED_STATE_ENABLED 1
+#define TAVI_SCHED_STATE_NOT_EXISTED 2
+
+#define TAVI_SCHED_TYPE_ONCE 0
+#define TAVI_SCHED_TYPE_DAILY 1
+#define TAVI_SCHED_TYPE_WEEKLY 2
+#define TAVI_SCHED_TYPE_MONTHLY 3
+#define TAVI_SCHED_TYPE_YEARLY 4
+
+/* The number of days in a week mask and of names in TAVISchedWeekDayNames. */
+#define TAVI_SCHED_WEEK_DAYS 7
+
+/* One scheduled task. It holds no pointer but `next`, so a byte-wise copy is a full copy. Flags
+ * hold 0 or 1. */
+typedef struct TAVI_SCHED_TASK {
+    struct TAVI_SCHED_TASK *next; /* next task of a list, or NULL */
+    int32_t backend;              /* id of the backend that keeps the task */
+    int32_t id;                   /* id within its backend; -1 = new, kept nowhere yet */
+    uint32_t owner;               /* user id that the command runs as */
+    char name[4096];
+    char nextTriggerTime[1024]; /* "YYYY-MM-DD hh:mm" or "N/A"; computed, never stored */
+    int32_t state;              /* TAVI_SCHED_STATE_* */
+    int32_t type;               /* TAVI_SCHED_TYPE_* */
+    char week[8];               /* seven characters, Sunday first: '0' = not on that day */
+    uint32_t startYear;         /* first day of the schedule: four digits */
+    uint32_t startMonth;        /* 1-12 */
+    uint32_t startDay;          /* 1-31 */
+    uint32_t runHour;           /* first run of a day: 0-23 */
+    uint32_t runMin;            /* 0-59 */
+    uint32_t repeatHour;        /* hours between the runs of a day; 0 = one run a day */
+    uint32_t lastWorkHour;      /* last hour of the day at which a repeated run may start */
+    char editDialog[1024];      /* web interface: dialog that edits the task */
+    char editForm[1024];        /* web interface: form inside that dialog */
+    int32_t simpleEditForm;
+    int32_t listable;
+    int32_t canEditName;
+    int32_t canEditOwner;
+    int32_t canRunAppSameTime;  /* may run while another task of its application runs */
+    int32_t canRunTaskSameTime; /* may run while an earlier run of itself goes on */
+    int32_t canRunFromUI;
+    int32_t canDeleteFromUI;
+    int32_t canEditFromUI;
+    char app[1024];      /* identifier of the application that the task belongs to */
+    char appName[1024];  /* its display name */
+    char appArgs[8192];  /* its arguments, free text */
+    char action[1024];   /* short description of what the task does */
+    char command[16384]; /* shell command; more than 12,285 bytes cannot be stored */
+} TAVI_SCHED_TASK;
+
+#include "tavischedgetter.h"
+#include "tavischedsetter.h"
+
+/* ---- Enumerations, selections, built-in applications ---- */
+
+/* A row of a name table; the table ends with value -1 and name NULL. */
+typedef struct TAVI_SCHED_ENUM {
+    int32_t value;
+    const char *name;
+} TAVI_SCHED_ENUM;
+
+/* "once", "daily", "weekly", "monthly", "yearly" */
+extern TAVI_SCHED_API const TAVI_SCHED_ENUM TAVISchedTypeTable[];
+/* "disabled", "enabled", "NotExisted" */
+extern TAVI_SCHED_API const TAVI_SCHED_ENUM TAVISchedStateTable[];
+/* "Sun" to "Sat" */
+extern TAVI_SCHED_API const char *const TAVISchedWeekDayNames[TAVI_SCHED_WEEK_DAYS];
+/* Identifiers of the built-in applications, ended by NULL. */
+extern TAVI_SCHED_API const char *const TAVISchedBuildInApps[];
+
+/* The name of a value, or NULL with error 0x2000 (not logged) when the table has no such value. */
+TAVI_SCHED_API const char *TAVISchedEnumToName(const TAVI_SCHED_ENUM *table, int32_t value);
+/* The value of a name (case matters), or -1 with error 0x2000 (not logged). */
+TAVI_SCHED_API int32_t TAVISchedEnumToValue(const TAVI_SCHED_ENUM *table, const char *szName);
+/* Turns a comma-separated list of names (any letter case, not trimmed) into `count` characters '0'
+ * or '1', one for each of `names`. Returns a static buffer of 4096 bytes that the next call
+ * overwrites, or NULL (no error, no log) when an argument is NULL or 0 or the text holds no name.
+ */
+TAVI_SCHED_API const char *TAVISchedMultiSelectFromText(const char *szText,
+                                                        const char *const *names, size_t count);
+/* The other way: the names of all characters that are not '0', separated by commas. `names` has an
+ * entry for every character of `szSelect`, which has at least `count`. Returns a static buffer of
+ * 4096 bytes of its own, or NULL (no error, no log). */
+TAVI_SCHED_API const char *TAVISchedMultiSelectToText(const char *szSelect,
+                                                      const char *const *names, size_t count);
+/* 1 when the task's application is a built-in one, else 0; 0 for NULL. */
+TAVI_SCHED_API int TAVISchedTaskIsBuildInApp(const TAVI_SCHED_TASK *pTask);
+
+/* ---- Hash and JSON forms ---- */
+
+struct PLATCSZHASH;
+
+/* Writes the task's stored form into an existing hash, whose content is discarded: a key for every
+ * persistent field, line feeds as blanks, the command in base64. */
+TAVI_SCHED_API int TAVISchedInitHashFromTask(struct PLATCSZHASH **ppHash,
+                                             const TAVI_SCHED_TASK *pTask);
+/* Fills the task from its stored form. Fields that the hash does not determine keep their values.
+ * 0x4000 for a bad number; a failure leaves the task partly written. */
+TAVI_SCHED_API int TAVISchedInitTaskFromHash(struct PLATCSZHASH *pHash, TAVI_SCHED_TASK *pTask);
+
+/* Renders the task as one JSON object of its stored form; every member's text is itself a JSON
+ * string. `cbBuf` is at least 40960; a longer text (it can reach 139,077 bytes) is cut silently. */
+TAVI_SCHED_API int TAVISchedTaskConvertToJson(const TAVI_SCHED_TASK *pTask, char *szBuf,
+                                              size_t cbBuf);
+/* The same for a stored task. */
+TAVI_SCHED_API int TAVISchedTaskConvertToJsonById(int32_t id, char *szBuf, size_t cbBuf);
+/* Saves a task from such a text: overwrites the stored task of that id when application and name
+ * are the same, else creates a new one; `create` non-zero always creates. Returns the task's id, or
+ * -1 with nothing stored. An empty object stores nothing and returns -1, the id of a new task. */
+TAVI_SCHED_API int32_t TAVISchedTaskSaveFromJson(const char *szJson, int create);
+
+/* ---- Dates, local time ---- */
+
+typedef struct TAVI_SCHED_DATE {
+    uint32_t year;
+    uint32_t month; /* 1-12 */
+    uint32_t day;   /* 1-31 */
+    uint32_t wday;  /* 0 = Sunday */
+    uint32_t hour;
+    uint32_t minute;
+} TAVI_SCHED_DATE;
+
+/* The current date and time. 0x2A00 when it cannot be had. */
+TAVI_SCHED_API int TAVISchedDateGet(TAVI_SCHED_DATE *pDate);
+/* Compares the days alone: -1 when the first is earlier, 0 for the same day, 1 when it is later;
+ * also -1, with error 0x0D00, when an argument is NULL. */
+TAVI_SCHED_API int TAVISchedDateComp(const TAVI_SCHED_DATE *pDate1, const TAVI_SCHED_DATE *pDate2);
+/* Parses "YYYY/M/D" into year, month and day without a range check. 0x4000 for a bad text. */
+TAVI_SCHED_API int TAVISchedDateParse(const char *szDateOrg, TAVI_SCHED_DATE *pDate);
+/* Parses "h:m" into hour and minute without a range check. 0x4000 for a bad text. */
+TAVI_SCHED_API int TAVISchedTimeParse(const char *szTimeOrg, TAVI_SCHED_DATE *pDate);
+/* Carries fields that have run past their ranges and computes wday. The time is taken as standard
+ * time: in a daylight-saving period it comes back an hour later. 0x2A00 when it cannot be done. */
+TAVI_SCHED_API int TAVISchedDateNormalize(TAVI_SCHED_DATE *pDate);
+/* Seeds rand() on the first call in the process; always 0. */
+TAVI_SCHED_API int TAVISchedRandInit(void);
+
+/* Writes the next minute at which the task will run into its `nextTriggerTime`, or "N/A". 0x2A00
+ * when the date cannot be had; the text is then left as it was. */
+TAVI_SCHED_API int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask);
+
+/* ---- Backends ---- */
+
+/* 1 when the task is to be kept. */
+typedef int (*TAVI_SCHED_FILTER)(TAVI_SCHED_TASK *pTask);
+
+/* A backend: what it is called and what it offers; operations that it does not offer are NULL. */
+typedef struct TAVI_SCHED_BACKEND_RECORD {
+    int32_t id;
+    const char *name;
+    int (*sync)(void);
+    int (*create)(TAVI_SCHED_TASK *pTask);
+    int (*edit)(TAVI_SCHED_TASK *pTask);
+    int (*remove)(int32_t id);
+    int (*get_default)(TAVI_SCHED_TASK *pTask);
+    int (*owns_id)(int32_t id);
+    int (*get_by_id)(int32_t id, TAVI_SCHED_TASK *pTask); /* 1 found, 0 not there, -1 */
+    int (*run)(TAVI_SCHED_TASK *pTask, int *pStatusCode, char *szComment, size_t cbComment);
+    int (*list_get)(TAVI_SCHED_TASK **pTaskList,
+                    TAVI_SCHED_FILTER filter); /* how many were added */
+} TAVI_SCHED_BACKEND_RECORD;
+
+#define TAVI_SCHED_MAX_BACKENDS 16
+
+/* The registered backends, and how many rows are in use. */
+extern TAVI_SCHED_API TAVI_SCHED_BACKEND_RECORD SchedBackends[TAVI_SCHED_MAX_BACKENDS];
+extern TAVI_SCHED_API unsigned int cBackend;
+
+/* Registers the built-in backends; every operation below calls it. Cheap after the first success.
+ */
+TAVI_SCHED_API int TAVISchedBackendInit(void);
+/* Fills a backend's row; the name must be the backend's own. */
+TAVI_SCHED_API int tavischedule_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend);
+
+/* ---- Task operations ---- */
+
+/* A new task with the schedule backend's defaults, or NULL with error 0x0200 or the failing
+ * operation's. Freed with TAVISchedTaskFree. */
+TAVI_SCHED_API TAVI_SCHED_TASK *TAVISchedTaskAlloc(void);
+/* Frees the one task, not what follows in a list. */
+TAVI_SCHED_API int TAVISchedTaskFree(TAVI_SCHED_TASK *pTask);
+/* Fills the task with the defaults of the backend in its `backend` field, which the caller sets. */
+TAVI_SCHED_API int TAVISchedTaskGetDefault(TAVI_SCHED_TASK *pTask);
+/* Reads a stored task. 0x2000 when no backend keeps it. */
+TAVI_SCHED_API int TAVISchedTaskGetByID(int32_t id, TAVI_SCHED_TASK *pTask);
+/* Id -1: as TAVISchedTaskGetDefault (the caller sets `backend`); any other as TAVISchedTaskGetByID.
+ */
+TAVI_SCHED_API int TAVISchedTaskLoad(int32_t id, TAVI_SCHED_TASK *pTask);
+/* Stores a new task in its backend, which sets the task's id. The task must not be NULL. 0x2000
+ * when no backend serves it. */
+TAVI_SCHED_API int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask);
+/* Replaces the stored task of the same id. Returns the backend's result. */
+TAVI_SCHED_API int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask);
+/* Creates a task whose id is -1, edits any other. */
+TAVI_SCHED_API int TAVISchedTaskSave(TAVI_SCHED_TASK *pTask);
+TAVI_SCHED_API int TAVISchedTaskRemove(int32_t id);
+/* Lists the tasks of every backend that the filter keeps (NULL keeps all). Returns their number;
+ * when it is above 0 the head is overwritten with a list that the caller frees. */
+TAVI_SCHED_API int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter);
+/* The task after this one in a list, or NULL. */
+TAVI_SCHED_API TAVI_SCHED_TASK *TAVISchedTaskNext(const TAVI_SCHED_TASK *pTask);
+/* Frees all tasks of a list and empties the head. */
+TAVI_SCHED_API void TAVISchedTaskListFree(TAVI_SCHED_TASK **pTaskList);
+/* Brings every backend's outside state (crontab) in line with its tasks. Backends that fail are
+ * only logged. */
+TAVI_SCHED_API int TAVISchedTaskSync(void);
+
+/* Sorts a list by a row of the field table, 0 to 30 (not checked). Direction 1 is ascending, any
+ * other the exact reverse. Text fields order by their bytes. Number fields order by where the tasks
+ * lie in memory, whatever the field: the order of crontab lines is defined by it. 0x0100 out of
+ * memory, 0x0D00 for an empty list. */
+TAVI_SCHED_API int TAVISchedTaskListSortEx(TAVI_SCHED_TASK **pTaskList, unsigned int row,
+                                           int direction);
+/* The same by the field's stored key ("name", "next trigger time", ...). An empty list is a
+ * success; an unknown key is -1 without an error or a log line. */
+TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char *szKey,
+                                         int direction);
+
+/* ---- Running ---- */
+
+/* Runs a stored task in a detached child, which waits for conflicting runs, runs the command as the
+ * task's owner and records the result. Mode 1: only when it is due in this minute; mode 0: at once;
+ * any other: nothing. `enabledOnly` 1 skips a disabled task. Returns 0 when the task was skipped or
+ * the child was started; -1 when the task cannot be read or is marked not existing (0x2000), or the
+ * date or the fork fails (0x2A00). */
+TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
+
+/* The run lock's open file while it is held, else NULL. */
+extern TAVI_SCHED_API FILE *pfLock;
+
+/* ---- Status database ---- */
+
+#define SCHED_STATUS_CODE_NONE 0        /* no status; "any" in updates */
+#define SCHED_STATUS_CODE_INTERRUPTED 1 /* reported for a running row whose process is gone */
+#define SCHED_STATUS_CODE_RUNNING 2
+#define SCHED_STATUS_CODE_SUCCESS 3      /* the command exited with 0 */
+#define SCHED_STATUS_CODE_START_FAILED 4 /* the command could not be started */
+#define SCHED_STATUS_CODE_STOPPED 5      /* stopped; the comment is the signal number */
+#define SCHED_STATUS_CODE_SIGNALED 6     /* killed; the comment is the signal number */
+#define SCHED_STATUS_CODE_EXIT_FAILED 7  /* exited with another code; the comment is the code */
+
+typedef struct TAVI_SCHED_STATUS {
+    int32_t found; /* 1 once a row was taken, or a live running row was found */
+    int32_t pid;
+    int32_t statusId;
+    int32_t timestamp; /* seconds since the epoch */
+    int32_t taskId;
+    char app[1024];
+    int32_t statusCode; /* SCHED_STATUS_CODE_* */
+    char comment[1024];
+} TAVI_SCHED_STATUS;
+
+struct sqlite3;
+
+/* Opens the status database, made when missing; the caller closes it with sqlite3_close. NULL with
+ * error 0x0900, or without one when the table cannot be made. A statement that meets a locked
+ * database is tried up to 101 times with a pause of up to a second between. */
+TAVI_SCHED_API struct sqlite3 *TAVISchedDBInit(void);
+/* Adds a running row of this process for the task. 0x0B00 when the row is not found again. */
+TAVI_SCHED_API int TAVISchedDBAddRecord(struct sqlite3 *db, const TAVI_SCHED_TASK *pTask,
+                                        int32_t *pStatusId);
+/* Sets code and, when given and not empty, comment of a row (id -1: of all rows), but only where
+ * the present code is `orgStatusCode` unless that is 0; id -1 with code 0 is refused. */
+TAVI_SCHED_API int TAVISchedDBSetStatus(struct sqlite3 *db, int32_t statusId, int32_t orgStatusCode,
+                                        int32_t newStatusCode, const char *szComment);
+/* The task's newest run: 1 found, 0 none (outputs untouched), -1. The start time (seconds since the
+ * epoch) and the comment buffer are optional. */
+TAVI_SCHED_API int TAVISchedDBGetStatusByTaskID(struct sqlite3 *db, int32_t taskId,
+                                                int32_t *pTimestamp, int32_t *pStatusCode,
+                                                char *szComment, size_t cbComment);
+/* The same for one row. */
+TAVI_SCHED_API int TAVISchedDBGetStatusByStatusID(struct sqlite3 *db, int32_t statusId,
+                                                  int32_t *pStatusCode, char *szComment,
+                                                  size_t cbComment);
+/* Looks for a live run of the task or application; the record, which the caller has zeroed, tells
+ * by `found`. */
+TAVI_SCHED_API int TAVISchedDBIsTaskRunning(struct sqlite3 *db, int32_t taskId,
+                                            TAVI_SCHED_STATUS *pStatus);
+TAVI_SCHED_API int TAVISchedDBIsAppRunning(struct sqlite3 *db, const char *szApp,
+                                           TAVI_SCHED_STATUS *pStatus);
+
+/* ---- Plug-in hooks ---- */
+
+struct PLATPLUGIN;
+
+/* A call of the plug-in "task_scheduler". */
+typedef struct TAVI_SCHED_PLUGIN {
+    struct PLATPLUGIN *handle; /* NULL while the context is not usable */
+    int32_t result;            /* the operation's result, handed to the handlers */
+    const TAVI_SCHED_TASK *orgTask;
+    const TAVI_SCHED_TASK *newTask;
+} TAVI_SCHED_PLUGIN;
+
+#define TAVI_SCHED_PLUGIN_PRE 4
+#define TAVI_SCHED_PLUGIN_POST 5
+
+/* Prepares a context for an action; one of the tasks may be NULL. */
+TAVI_SCHED_API int TAVISchedTaskPluginInit(TAVI_SCHED_PLUGIN *pPlugin, const char *szAction,
+                                           const TAVI_SCHED_TASK *pOrgTask,
+                                           const TAVI_SCHED_TASK *pNewTask);
+/* Runs the handlers for a phase. */
+TAVI_SCHED_API int TAVISchedTaskPlugin(int phase, TAVI_SCHED_PLUGIN *pPlugin);
+/* Releases the context's handle; the caller frees the context. */
+TAVI_SCHED_API int TAVISchedTaskPluginExit(TAVI_SCHED_PLUGIN *pPlugin);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif

@@ -1,0 +1,92 @@
+// The one way in which the library fails: the error state is set and one line is logged that begins
+// with source name and line. Support scripts match these lines, so some sites carry a number of
+// their own that does not move with the source; the _AT forms take it.
+//
+// The macros call syslog themselves: the compiler then checks every format against its arguments.
+#pragma once
+
+#include "platc.h"
+#include "sched_text.h"
+
+#include <algorithm>
+#include <array>
+#include <string_view>
+#include <syslog.h>
+
+namespace sched {
+
+constexpr unsigned int kSortOutOfMemory = 0x0100;
+constexpr unsigned int kTaskOutOfMemory = 0x0200;
+constexpr unsigned int kLockFailed = 0x0400;
+constexpr unsigned int kUnlockFailed = 0x0500;
+constexpr unsigned int kOpenFailed = 0x0900;
+constexpr unsigned int kReadWriteFailed = 0x0B00;
+constexpr unsigned int kInvalidArgument = 0x0D00;
+constexpr unsigned int kNotFound = 0x2000;
+constexpr unsigned int kStatFailed = 0x2700;
+constexpr unsigned int kRenameFailed = 0x2800;
+constexpr unsigned int kSystemCallFailed = 0x2A00;
+constexpr unsigned int kBadFormat = 0x4000;
+
+// A source's name as messages carry it: the path below lib/ or include/.
+constexpr const char *sourceName(const char *path) {
+    constexpr size_t npos = std::string_view::npos;
+    const std::string_view text(path);
+    size_t start = 0;
+    for (const std::string_view folder : {std::string_view("lib/"), std::string_view("include/")}) {
+        for (size_t at = text.find(folder); at != npos; at = text.find(folder, at + 1)) {
+            if (at == 0 || text[at - 1] == '/') {
+                start = std::max(start, at + folder.size());
+            }
+        }
+    }
+    return path + start;
+}
+
+// A place that messages and the error state name; helpers report for their callers with it.
+struct Site {
+    const char *file;
+    int line;
+};
+
+// A text from outside, cut for a log line: the system log drops very long messages without a word.
+class LogText {
+  public:
+    explicit LogText(const char *text) { copyText(text_.data(), text_.size(), text); }
+    const char *c_str() const { return text_.data(); }
+
+  private:
+    std::array<char, 4097> text_;
+};
+
+} // namespace sched
+
+#define SCHED_SOURCE sched::sourceName(__FILE__)
+#define SCHED_SITE                                                                                 \
+    sched::Site {                                                                                  \
+        SCHED_SOURCE, __LINE__                                                                     \
+    }
+
+// The three arguments of a message's "[0x%04X %s:%d]" tail.
+#define SCHED_LAST_ERROR PLATCErrGet(), PLATCErrorGetFile(), PLATCErrorGetLine()
+
+#define SCHED_LOG_FOR(site, format, ...)                                                           \
+    syslog(LOG_ERR, "%s:%d " format, (site).file, (site).line __VA_OPT__(, ) __VA_ARGS__)
+#define SCHED_LOG_AT(line, format, ...)                                                            \
+    syslog(LOG_ERR, "%s:%d " format, SCHED_SOURCE, line __VA_OPT__(, ) __VA_ARGS__)
+#define SCHED_LOG(format, ...) SCHED_LOG_AT(__LINE__, format __VA_OPT__(, ) __VA_ARGS__)
+
+#define SCHED_SET_ERROR_AT(line, code) PLATCErrSetEx((code), SCHED_SOURCE, (line))
+#define SCHED_SET_ERROR(code) SCHED_SET_ERROR_AT(__LINE__, code)
+
+// Leaves the function with `result` when an argument is bad. `text` is the condition as messages
+// have always shown it.
+#define SCHED_REQUIRE_AT(line, condition, text, result)                                            \
+    do {                                                                                           \
+        if (!(condition)) {                                                                        \
+            SCHED_LOG_AT(line, "Invaild Argument (%s)=[%d]\n", text, 0);                           \
+            SCHED_SET_ERROR_AT(line, sched::kInvalidArgument);                                     \
+            return result;                                                                         \
+        }                                                                                          \
+    } while (false)
+#define SCHED_REQUIRE(condition, text, result) SCHED_REQUIRE_AT(__LINE__, condition, text, result)

@@ -1,0 +1,31 @@
+// Replacing a stored task, between the plug-in hooks.
+#include "sched_backend.h"
+#include "sched_error.h"
+#include "sched_hook.h"
+#include "tavischeduler.h"
+
+namespace {
+
+int editBetweenHooks(sched::ChangeHook &hook, TAVI_SCHED_TASK *task) {
+    hook.before();
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    return sched::dispatch(SCHED_SITE, "edit", task, &TAVI_SCHED_BACKEND_RECORD::edit).value_or(-1);
+}
+
+} // namespace
+
+int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
+    TAVI_SCHED_TASK oldTask{};
+    if (TAVISchedTaskGetByID(pTask->id, &oldTask) < 0) {
+        SCHED_LOG("get task failed. id:[%ld] [0x%04X %s:%d]", static_cast<long>(pTask->id),
+                  SCHED_LAST_ERROR);
+        return -1;
+    }
+    sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
+    const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;
+    hook.after(result);
+    return result;
+}

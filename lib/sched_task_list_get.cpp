@@ -1,0 +1,44 @@
+// Task lists: gathering the tasks of all backends, walking a list and freeing it.
+#include "sched_backend.h"
+#include "sched_error.h"
+#include "sched_handle.h"
+#include "tavischeduler.h"
+
+int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
+    SCHED_REQUIRE(pTaskList, "((void *)0) != pTaskList", -1);
+    sched::TaskList tasks;
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    int total = 0;
+    int count = 0; // the last that any row answered: a row without the operation adds it once more
+    const auto rows = sched::registeredBackends();
+    for (size_t row = 0; row < rows.size(); ++row) {
+        if (rows[row].list_get) {
+            const int result = rows[row].list_get(tasks.address(), filter);
+            if (result < 0) {
+                SCHED_LOG("Failed to list_get for backend [%d] [0x%04X %s:%d]",
+                          static_cast<int>(row), SCHED_LAST_ERROR);
+                continue;
+            }
+            count = result;
+        }
+        total += count;
+    }
+    if (total > 0) {
+        *pTaskList = tasks.release();
+    }
+    return total;
+}
+
+TAVI_SCHED_TASK *TAVISchedTaskNext(const TAVI_SCHED_TASK *pTask) {
+    return pTask ? pTask->next : nullptr;
+}
+
+void TAVISchedTaskListFree(TAVI_SCHED_TASK **pTaskList) {
+    while (pTaskList && *pTaskList) {
+        TAVI_SCHED_TASK *const task = *pTaskList;
+        *pTaskList = task->next;
+        std::free(task);
+    }
+}

@@ -135,7 +135,9 @@ TAVI_SCHED_API int TAVISchedInitHashFromTask(struct PLATCSZHASH **ppHash,
 TAVI_SCHED_API int TAVISchedInitTaskFromHash(struct PLATCSZHASH *pHash, TAVI_SCHED_TASK *pTask);
 
 /* Renders the task as one JSON object of its stored form; every member's text is itself a JSON
- * string. `cbBuf` is at least 40960; a longer text (it can reach 139,077 bytes) is cut silently. */
+ * string. Bytes that are no UTF-8 come out as U+FFFD. `cbBuf` is at least 40960, and 160 KiB hold
+ * every task; a longer text is cut silently and cannot be saved. The JSON functions log their
+ * failures but set no error code of their own. */
 TAVI_SCHED_API int TAVISchedTaskConvertToJson(const TAVI_SCHED_TASK *pTask, char *szBuf,
                                               size_t cbBuf);
 /* The same for a stored task. */
@@ -233,7 +235,7 @@ TAVI_SCHED_API int TAVISchedTaskRemove(int32_t id);
 /* Lists the tasks of every backend that the filter keeps (NULL keeps all). Returns their number;
  * when it is above 0 the head is overwritten with a list that the caller frees. */
 TAVI_SCHED_API int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter);
-/* The task after this one in a list, or NULL. */
+/* The task after this one in a list, or NULL; also NULL for NULL. */
 TAVI_SCHED_API TAVI_SCHED_TASK *TAVISchedTaskNext(const TAVI_SCHED_TASK *pTask);
 /* Frees all tasks of a list and empties the head. */
 TAVI_SCHED_API void TAVISchedTaskListFree(TAVI_SCHED_TASK **pTaskList);

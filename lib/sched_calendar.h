@@ -36,8 +36,8 @@ inline int toLocalDate(time_t time, TAVI_SCHED_DATE &date, const Site &site) {
         PLATCErrSetEx(kSystemCallFailed, site.file, site.line);
         return -1;
     }
-    date = {.year = static_cast<uint32_t>(local->tm_year + 1900),
-            .month = static_cast<uint32_t>(local->tm_mon + 1),
+    date = {.year = static_cast<uint32_t>(local->tm_year) + 1900,
+            .month = static_cast<uint32_t>(local->tm_mon) + 1,
             .day = static_cast<uint32_t>(local->tm_mday),
             .wday = static_cast<uint32_t>(local->tm_wday),
             .hour = static_cast<uint32_t>(local->tm_hour),

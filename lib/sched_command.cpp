@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <csignal>
 #include <fcntl.h>
+#include <grp.h>
 #include <new>
 #include <string>
 #include <string_view>
@@ -17,11 +18,11 @@
 
 namespace {
 
-// What the command starts with when its owner is not the caller: an environment of the owner's own
-// and the owner's home. Nothing of the caller's leaks in but language and time zone.
-struct OwnerSetting {
-    std::vector<std::string> variables;
-    std::string home;
+// What a command starts with: who it becomes, in which environment and where.
+struct Setting {
+    sched::User user; // the owner; none when the caller's identity serves as it is
+    std::vector<std::string> variables; // an environment of the owner's own
+    std::vector<char *> environment;    // the same for execve; empty: the caller's
 };
 
 bool isLocaleVariable(std::string_view variable) {
@@ -29,21 +30,36 @@ bool isLocaleVariable(std::string_view variable) {
            variable.starts_with("TZ=");
 }
 
-bool readOwnerSetting(OwnerSetting &setting) {
-    TAVIUSER *found = nullptr;
-    if (TAVIUserGetByUID(geteuid(), &found) != 0) {
-        return false;
-    }
-    const sched::User user(found);
-    const std::string name(user->szName);
-    setting.home = user->szHome;
-    setting.variables = {"HOME=" + setting.home, "USER=" + name, "LOGNAME=" + name,
-                         "SHELL=" + std::string(user->szShell),
-                         "PATH=/usr/local/bin:/usr/bin:/bin"};
+// Nothing of the caller's leaks into another owner's environment but language and time zone.
+void addOwnersEnvironment(Setting &setting) {
+    const TAVIUSER &user = *setting.user;
+    const std::string name(user.szName);
+    const std::string shell(*user.szShell != '\0' ? user.szShell : "/bin/sh");
+    setting.variables = {"HOME=" + std::string(user.szHome), "USER=" + name, "LOGNAME=" + name,
+                         "SHELL=" + shell, "PATH=/usr/local/bin:/usr/bin:/bin"};
     for (char **variable = environ; variable && *variable; ++variable) {
         if (isLocaleVariable(*variable)) {
             setting.variables.emplace_back(*variable);
         }
+    }
+    for (std::string &variable : setting.variables) {
+        setting.environment.push_back(variable.data());
+    }
+    setting.environment.push_back(nullptr);
+}
+
+bool prepare(Setting &setting) {
+    const bool ownerIsCaller = geteuid() == getuid();
+    if (ownerIsCaller && geteuid() != 0) {
+        return true;
+    }
+    TAVIUSER *found = nullptr;
+    if (TAVIUserGetByUID(geteuid(), &found) != 0) {
+        return false;
+    }
+    setting.user.reset(found);
+    if (!ownerIsCaller) {
+        addOwnersEnvironment(setting);
     }
     return true;
 }
@@ -86,21 +102,35 @@ class WaitingSignals {
     sigset_t mask_{};
 };
 
-bool takeEffectiveIdentity() {
-    const gid_t group = getegid();
+// Root may have come with groups of its own; any other owner's were set when the user was switched.
+bool takeEffectiveIdentity(const TAVIUSER *owner) {
     const uid_t user = geteuid();
-    return setresgid(group, group, group) == 0 && setresuid(user, user, user) == 0;
+    const bool isRoot = user == 0 && owner;
+    const gid_t group = isRoot ? owner->gid : getegid();
+    return (!isRoot || initgroups(owner->szName, group) == 0) &&
+           setresgid(group, group, group) == 0 && setresuid(user, user, user) == 0;
+}
+
+void markInheritedDescriptors() {
+    if (close_range(3, ~0U, CLOSE_RANGE_CLOEXEC) == 0) {
+        return;
+    }
+    for (long fd = sysconf(_SC_OPEN_MAX) - 1; fd >= 3; --fd) { // a kernel that does not have it
+        fcntl(static_cast<int>(fd), F_SETFD, FD_CLOEXEC);
+    }
 }
 
 // In the child: becomes the shell. `report` is written to when the command must not be started.
-[[noreturn]] void becomeShell(const char *command, const char *home, char *const *environment,
-                              const WaitingSignals &signals, int report) {
+[[noreturn]] void becomeShell(const char *command, Setting &setting, const WaitingSignals &signals,
+                              int report) {
     signals.restoreForCommand();
-    const bool ready = takeEffectiveIdentity() && close_range(3, ~0U, CLOSE_RANGE_CLOEXEC) == 0 &&
-                       (!home || chdir(home) == 0 || chdir("/") == 0);
-    if (ready) {
+    const bool ownEnvironment = !setting.environment.empty();
+    markInheritedDescriptors();
+    if (takeEffectiveIdentity(setting.user.get()) &&
+        (!ownEnvironment || chdir(setting.user->szHome) == 0 || chdir("/") == 0)) {
         const char *const argv[] = {"sh", "-c", command, nullptr};
-        execve("/bin/sh", const_cast<char *const *>(argv), environment);
+        execve("/bin/sh", const_cast<char *const *>(argv),
+               ownEnvironment ? setting.environment.data() : environ);
     } else {
         const char failed = 1;
         (void)!write(report, &failed, 1);
@@ -123,7 +153,7 @@ int waitForShell(pid_t pid, int report) {
     return reported == 1 ? -1 : status;
 }
 
-int startAndWait(const char *command, const char *home, char *const *environment) {
+int startAndWait(const char *command, Setting &setting) {
     int report[2];
     if (pipe2(report, O_CLOEXEC) != 0) {
         return -1;
@@ -131,7 +161,7 @@ int startAndWait(const char *command, const char *home, char *const *environment
     const WaitingSignals signals;
     const pid_t pid = fork();
     if (pid == 0) {
-        becomeShell(command, home, environment, signals, report[1]);
+        becomeShell(command, setting, signals, report[1]);
     }
     close(report[1]);
     const int status = pid == -1 ? -1 : waitForShell(pid, report[0]);
@@ -139,26 +169,12 @@ int startAndWait(const char *command, const char *home, char *const *environment
     return status;
 }
 
-int runAsOwner(const char *command) {
-    OwnerSetting setting;
-    if (!readOwnerSetting(setting)) {
-        return -1;
-    }
-    std::vector<char *> environment;
-    environment.reserve(setting.variables.size() + 1);
-    for (std::string &variable : setting.variables) {
-        environment.push_back(variable.data());
-    }
-    environment.push_back(nullptr);
-    return startAndWait(command, setting.home.c_str(), environment.data());
-}
-
 } // namespace
 
 int sched::runCommand(const char *command) {
     try {
-        return geteuid() == getuid() ? startAndWait(command, nullptr, environ)
-                                     : runAsOwner(command);
+        Setting setting;
+        return prepare(setting) ? startAndWait(command, setting) : -1;
     } catch (const std::bad_alloc &) {
         return -1;
     }

@@ -90,11 +90,13 @@ const char *TAVISchedMultiSelectToText(const char *szSelect, const char *const *
     }
     text.fill('\0');
     size_t length = 0;
+    const char *separator = "";
     for (size_t i = 0; szSelect[i] != '\0' && length < text.size(); ++i) {
         if (szSelect[i] != '0') {
             // The length that the text would have: at the buffer's size or past it, it is full.
             length += static_cast<size_t>(std::snprintf(text.data() + length, text.size() - length,
-                                                        "%s%s", length == 0 ? "" : ",", names[i]));
+                                                        "%s%s", separator, names[i]));
+            separator = ",";
         }
     }
     return text.data();

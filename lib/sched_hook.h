@@ -4,7 +4,10 @@
 
 #include "sched_error.h"
 #include "sched_handle.h"
+#include "sched_text.h"
 #include "tavischeduler.h"
+
+#include <array>
 
 namespace sched {
 
@@ -27,10 +30,23 @@ class ChangeHook {
     }
 
     // Tells the handlers the result and releases the context. Nothing when it was never allocated.
+    // The error of an operation that failed outlives its handlers' errors.
     void after(int result) {
         if (!context_) {
             return;
         }
+        const unsigned int code = PLATCErrGet();
+        const int line = PLATCErrorGetLine();
+        std::array<char, 256> file;
+        copyText(file.data(), file.size(), PLATCErrorGetFile());
+        tellHandlers(result);
+        if (result < 0) {
+            PLATCErrSetEx(code, file.data(), line);
+        }
+    }
+
+  private:
+    void tellHandlers(int result) {
         context_->result = result;
         if (TAVISchedTaskPlugin(TAVI_SCHED_PLUGIN_POST, context_.get()) < 0) {
             SCHED_LOG_FOR(site_, "Fail to execute task plugin (POST)");
@@ -39,7 +55,6 @@ class ChangeHook {
         context_.reset();
     }
 
-  private:
     Site site_;
     Allocated<TAVI_SCHED_PLUGIN> context_;
     bool initialised_;

@@ -136,14 +136,24 @@ int reportStatus(const TAVI_SCHED_STATUS &status, int32_t *code, char *comment, 
     return 1;
 }
 
-// A journal that another user put beside the database would make SQLite write what it says. The
-// write-ahead log is only ever dropped: SQLite takes an empty one for a sign to use it.
+// A journal or a write-ahead log that another user put beside the database would be obeyed; SQLite
+// looks for them again and again, so their names are held by empty files.
 int claimDatabase() {
-    return sched::dropStrangeFile("/tmp/sched_status.sqlite-wal") == 0 &&
-                   sched::claimSharedFile("/tmp/sched_status.sqlite-journal") == 0 &&
-                   sched::claimSharedFile(kDatabase) == 0
-               ? 0
-               : -1;
+    for (const char *path :
+         {"/tmp/sched_status.sqlite-wal", "/tmp/sched_status.sqlite-journal", kDatabase}) {
+        if (sched::claimSharedFile(path) != 0) {
+            return -1;
+        }
+    }
+    return 0;
+}
+
+// The pragma counts for the next commit. While the database is locked it fails, and the statement
+// that matters does the waiting.
+int createTable(sqlite3 *db) {
+    const bool keeps = sqlite3_exec(db, kKeepJournal, nullptr, nullptr, nullptr) == SQLITE_OK;
+    const int created = execute(db, kCreateTable);
+    return created != 0 || keeps ? created : execute(db, kKeepJournal);
 }
 
 // A statement put together piece by piece in a bounded buffer.
@@ -171,8 +181,8 @@ class BoundedStatement {
 sqlite3 *TAVISchedDBInit() {
     TAVISchedRandInit();
     if (claimDatabase() != 0) {
-        SCHED_SET_ERROR(sched::kOpenFailed);
         SCHED_LOG("Can't open database: %s\n", std::strerror(errno));
+        SCHED_SET_ERROR(sched::kOpenFailed);
         return nullptr;
     }
     sqlite3 *handle = nullptr;
@@ -183,10 +193,7 @@ sqlite3 *TAVISchedDBInit() {
         SCHED_LOG("Can't open database: %s\n", sqlite3_errmsg(db.get()));
         return nullptr;
     }
-    if (execute(db.get(), kKeepJournal) != 0 || execute(db.get(), kCreateTable) != 0) {
-        return nullptr;
-    }
-    return db.release();
+    return createTable(db.get()) == 0 ? db.release() : nullptr;
 }
 
 int TAVISchedDBAddRecord(sqlite3 *db, const TAVI_SCHED_TASK *pTask, int32_t *pStatusId) {

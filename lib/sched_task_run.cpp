@@ -91,17 +91,18 @@ bool takeLock() {
     if (sched::claimSharedFolder(kLockFolder) != 0 || sched::claimSharedFile(kLockFile) != 0) {
         return false;
     }
-    for (int i = 0; i < kLockTries; ++i) {
+    for (int tries = 0; tries < kLockTries; ++tries) {
         if (pfLock) {
             return true;
+        }
+        if (tries > 0) {
+            usleep(kLockPause);
         }
         sched::File file(std::fopen(kLockFile, "re"));
         if (file && flock(fileno(file.get()), LOCK_EX) == 0) {
             pfLock = file.release();
             return true;
         }
-        file.reset();
-        usleep(kLockPause);
     }
     SCHED_SET_ERROR(sched::kLockFailed);
     return false;

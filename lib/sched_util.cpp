@@ -95,11 +95,14 @@ int TAVISchedTimeParse(const char *szTimeOrg, TAVI_SCHED_DATE *pDate) {
     return 0;
 }
 
+// A forked child is another process: with its parent's sequence, runs that one caller starts would
+// draw the same pauses and meet again and again.
 int TAVISchedRandInit() {
-    static bool seeded = false;
-    if (!seeded) {
-        std::srand(static_cast<unsigned int>(std::time(nullptr) + getpid()));
-        seeded = true;
+    static pid_t seeded = 0;
+    const pid_t process = getpid();
+    if (seeded != process) {
+        std::srand(static_cast<unsigned int>(std::time(nullptr) + process));
+        seeded = process;
     }
     return 0;
 }

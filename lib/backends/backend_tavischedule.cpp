@@ -164,8 +164,17 @@ int32_t smallestFreeId(std::span<int32_t> ids) {
     return (gap == ids.end() ? ids.back() : *gap) + 1;
 }
 
-// An id is in use when a task has it, and also when a section of that name cannot be read: its task
-// must not be overwritten.
+// Adds the name when it is the id of a section: one that cannot be read must not be overwritten.
+void addSectionId(const char *name, int32_t *ids, size_t &count) {
+    const char *const end = name + std::strlen(name);
+    int32_t id = 0;
+    const auto parsed = std::from_chars(name, end, id);
+    if (parsed.ec == std::errc() && parsed.ptr == end && id > 0) {
+        ids[count++] = id;
+    }
+}
+
+// An id is in use when a task has it or a section is named by it.
 int GetNextId(int32_t *pID) {
     SCHED_REQUIRE_AT(310, pID, "((void *)0) != pID", -1);
     TaskList tasks;
@@ -176,8 +185,11 @@ int GetNextId(int32_t *pID) {
         return -1;
     }
     const auto room = static_cast<size_t>(taskCount) + static_cast<size_t>(sectionCount);
-    const sched::Allocated<int32_t> ids(
-        static_cast<int32_t *>(std::calloc(std::max<size_t>(room, 1), sizeof(int32_t))));
+    if (room == 0) {
+        *pID = 1;
+        return 0;
+    }
+    const sched::Allocated<int32_t> ids(static_cast<int32_t *>(std::calloc(room, sizeof(int32_t))));
     if (!ids) {
         SCHED_LOG_AT(321, "Alloc id slot failed. num:[%d] [0x%04X %s:%d]", taskCount,
                      SCHED_LAST_ERROR);
@@ -188,10 +200,7 @@ int GetNextId(int32_t *pID) {
         ids.get()[count++] = task->id;
     }
     for (int i = 0; i < sectionCount; ++i) {
-        const std::string_view name(PLATCSzListGet(sections.get(), i));
-        const auto end = name.data() + name.size();
-        const auto parsed = std::from_chars(name.data(), end, ids.get()[count]);
-        count += parsed.ec == std::errc() && parsed.ptr == end ? 1 : 0;
+        addSectionId(PLATCSzListGet(sections.get(), i), ids.get(), count);
     }
     *pID = smallestFreeId({ids.get(), count});
     return 0;
@@ -199,15 +208,16 @@ int GetNextId(int32_t *pID) {
 
 // ---- Writing ----
 
+int logCopyFailure(const char *from, const char *to, int line) {
+    SCHED_LOG_AT(line, "Copy sched conf failed. [%s] -> [%s] [0x%04X %s:%d]", from, to,
+                 SCHED_LAST_ERROR);
+    return -1;
+}
+
 // Runs cp without a shell; a failure is logged under the site number.
 int copyFile(const char *from, const char *to, int line) {
     const std::array<const char *, 4> arguments = {"-f", from, to, nullptr};
-    if (PLATCExec("/bin/cp", arguments.data()) != 0) {
-        SCHED_LOG_AT(line, "Copy sched conf failed. [%s] -> [%s] [0x%04X %s:%d]", from, to,
-                     SCHED_LAST_ERROR);
-        return -1;
-    }
-    return 0;
+    return PLATCExec("/bin/cp", arguments.data()) == 0 ? 0 : logCopyFailure(from, to, line);
 }
 
 // The scratch file of one change, named for this process.
@@ -223,15 +233,20 @@ class Scratch {
     // Starts as a copy of the working copy, or empty when there is none.
     int prepare(bool workingCopyExists) const {
         unlink(path());
-        if (sched::claimSharedFile(path()) != 0) {
+        const bool claimed = sched::claimSharedFile(path()) == 0;
+        if (!claimed) {
             SCHED_SET_ERROR(sched::kOpenFailed);
-        } else if (workingCopyExists) {
-            return copyFile(kWorkingCopy, path(), 379);
-        } else if (PLATCFileTouch(path()) == 0) {
-            return 0;
         }
-        SCHED_LOG_AT(374, "PLATCFileTouch [%s] failed. [0x%04X %s:%d]", path(), SCHED_LAST_ERROR);
-        return -1;
+        if (workingCopyExists) {
+            return claimed ? copyFile(kWorkingCopy, path(), 379)
+                           : logCopyFailure(kWorkingCopy, path(), 379);
+        }
+        if (!claimed || PLATCFileTouch(path()) != 0) {
+            SCHED_LOG_AT(374, "PLATCFileTouch [%s] failed. [0x%04X %s:%d]", path(),
+                         SCHED_LAST_ERROR);
+            return -1;
+        }
+        return 0;
     }
 
   private:
@@ -271,29 +286,49 @@ int removeSection(const char *path, const char *section, bool workingCopyExists)
     return removed;
 }
 
-// Without a working copy the change starts from nothing and would erase every task of the
-// persistent file for good, so that file is put aside first.
-int savePersistent() {
+off_t sizeOf(const char *path) {
     struct stat status {};
-    if (stat(kPersistent, &status) != 0 || status.st_size == 0) {
+    return stat(path, &status) == 0 ? status.st_size : 0;
+}
+
+// Without a working copy, or with one that a failed copy left empty, a change starts from nothing
+// and would erase every task of the persistent file for good, so that file is put aside first. What
+// was put aside before moves on to the next free number.
+int savePersistent() {
+    if (sizeOf(kWorkingCopy) > 0 || sizeOf(kPersistent) == 0) {
         return 0;
+    }
+    if (PLATCFileExist(kPersistentCopy)) {
+        std::array<char, 512> older{};
+        int number = 0;
+        do {
+            std::snprintf(older.data(), older.size(), "%s.%d", kPersistentCopy, ++number);
+        } while (PLATCFileExist(older.data()));
+        if (rename(kPersistentCopy, older.data()) != 0) {
+            SCHED_SET_ERROR(sched::kRenameFailed);
+            return logCopyFailure(kPersistentCopy, older.data(), __LINE__);
+        }
     }
     return copyFile(kPersistent, kPersistentCopy, __LINE__);
 }
 
 // A working copy that this process makes is made before cp opens it, so that cp follows no link
-// that somebody put there in between.
+// that somebody put there in between; it goes again when cp fails, as an empty one would hide a
+// lost one.
 int publish(const char *scratch) {
     if (copyFile(scratch, kPersistent, 419) != 0) {
         return -1;
     }
+    const bool isNew = sched::checkSharedFile(kWorkingCopy) == 0;
     if (sched::claimSharedFile(kWorkingCopy) != 0) {
         SCHED_SET_ERROR(sched::kOpenFailed);
-        SCHED_LOG_AT(424, "Copy sched conf failed. [%s] -> [%s] [0x%04X %s:%d]", scratch,
-                     kWorkingCopy, SCHED_LAST_ERROR);
-        return -1;
+        return logCopyFailure(scratch, kWorkingCopy, 424);
     }
-    return copyFile(scratch, kWorkingCopy, 424);
+    const int result = copyFile(scratch, kWorkingCopy, 424);
+    if (result != 0 && isNew) {
+        unlink(kWorkingCopy);
+    }
+    return result;
 }
 
 // Writes the task's section, or removes the id's when there is no task: 1 changed, 0 nothing to
@@ -306,7 +341,7 @@ int SetTaskSection(int32_t id, const TAVI_SCHED_TASK *task) {
         return -1;
     }
     const bool exists = PLATCFileExist(kWorkingCopy) == 1;
-    if (task && !exists && savePersistent() != 0) {
+    if (task && savePersistent() != 0) {
         return -1;
     }
     const Scratch scratch;

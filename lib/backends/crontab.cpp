@@ -6,6 +6,7 @@
 #include "sched_handle.h"
 
 #include <array>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -224,8 +225,19 @@ void appendTasks(const TAVI_SCHED_TASK *task, FILE *to, bool endsOpen) {
     }
 }
 
+// system() with SIGCHLD at its default: in a caller that ignores it there would be no result.
+int runSignalCommand() {
+    struct sigaction standard {};
+    struct sigaction callers {};
+    standard.sa_handler = SIG_DFL;
+    sigaction(SIGCHLD, &standard, &callers);
+    const int result = std::system(kSignalCron);
+    sigaction(SIGCHLD, &callers, nullptr);
+    return result;
+}
+
 void signalCron() {
-    if (PLATCFileExist(kCronPid) && std::system(kSignalCron) != 0) {
+    if (PLATCFileExist(kCronPid) && runSignalCommand() != 0) {
         syslog(LOG_ERR, "%s:%d Failed to hup crond.", kSource, 245);
     }
 }

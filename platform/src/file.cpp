@@ -7,7 +7,6 @@
 #include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
-#include <syslog.h>
 #include <unistd.h>
 
 namespace platform {
@@ -62,7 +61,7 @@ bool writeAll(int fd, std::string_view content) {
 }
 
 int refuse(const std::string &path, const char *reason) {
-    syslog(LOG_ERR, "%s refused: %s", path.c_str(), reason);
+    PLATFORM_LOG("%s refused: %s", path.c_str(), reason);
     return PLATFORM_FAIL(kOpenFailed);
 }
 

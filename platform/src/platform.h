@@ -7,6 +7,7 @@
 #include <cstring>
 #include <exception>
 #include <string_view>
+#include <syslog.h>
 
 namespace platform {
 
@@ -26,6 +27,10 @@ constexpr const char *baseName(const char *path) {
 
 // Records the failure and answers -1, so that a failing check reads "return PLATFORM_FAIL(code);".
 #define PLATFORM_FAIL(code) platform::fail((code), platform::baseName(__FILE__), __LINE__)
+
+// Logs one line that begins with source name and line, as every line of the system does.
+#define PLATFORM_LOG(format, ...)                                                                  \
+    syslog(LOG_ERR, "%s:%d " format, platform::baseName(__FILE__), __LINE__, __VA_ARGS__)
 
 inline int fail(unsigned int code, const char *file, int line) {
     PLATCErrSetEx(code, file, line);

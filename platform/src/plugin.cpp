@@ -11,7 +11,6 @@
 #include <string>
 #include <sys/stat.h>
 #include <sys/wait.h>
-#include <syslog.h>
 #include <unistd.h>
 #include <vector>
 
@@ -32,42 +31,58 @@ bool isTrusted(const std::filesystem::path &path, mode_t kind) {
            status.st_uid == 0 && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
 }
 
-std::vector<std::filesystem::path> findHandlers(const PLATPLUGIN &plugin) {
-    std::vector<std::filesystem::path> handlers;
+bool isHandler(const std::filesystem::path &path) {
     std::error_code error;
-    if (!std::filesystem::exists(plugin.folder, error)) {
-        return handlers;
+    if (access(path.c_str(), X_OK) != 0 || std::filesystem::is_directory(path, error)) {
+        return false;
     }
-    if (!isTrusted(plugin.folder, S_IFDIR)) {
+    if (!isTrusted(path, S_IFREG)) {
         syslog(LOG_ERR,
-               "plug-in folder %s skipped: it must be a folder of root's that nobody else "
-               "may write",
-               plugin.folder.c_str());
-        return handlers;
+               "plug-in handler %s skipped: it must be a file of root's that nobody else may write",
+               path.c_str());
+        return false;
     }
-    for (const auto &entry : std::filesystem::directory_iterator(plugin.folder, error)) {
-        if (access(entry.path().c_str(), X_OK) != 0 || entry.is_directory(error)) {
-            continue;
-        }
-        if (isTrusted(entry.path(), S_IFREG)) {
-            handlers.push_back(entry.path());
-        } else {
-            syslog(LOG_ERR,
-                   "plug-in handler %s skipped: it must be a file of root's that nobody "
-                   "else may write",
-                   entry.path().c_str());
+    return true;
+}
+
+// Adds the handlers in name order. 0, or -1 when the folder cannot be read to its end.
+int findHandlers(const std::filesystem::path &folder,
+                 std::vector<std::filesystem::path> &handlers) {
+    std::error_code error;
+    if (std::filesystem::symlink_status(folder, error).type() ==
+        std::filesystem::file_type::not_found) {
+        return 0;
+    }
+    if (!isTrusted(folder, S_IFDIR)) {
+        syslog(
+            LOG_ERR,
+            "plug-in folder %s skipped: it must be a folder of root's that nobody else may write",
+            folder.c_str());
+        return 0;
+    }
+    std::filesystem::directory_iterator entry(folder, error);
+    for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
+        if (isHandler(entry->path())) {
+            handlers.push_back(entry->path());
         }
     }
     std::sort(handlers.begin(), handlers.end());
-    return handlers;
+    if (error) {
+        PLATFORM_LOG("plug-in folder %s cannot be read: %s", folder.c_str(),
+                     error.message().c_str());
+        return PLATFORM_FAIL(platform::kOpenFailed);
+    }
+    return 0;
 }
 
-// The caller's environment with the call's arguments in place of variables of the same name.
+// The call's arguments and the caller's environment without what looks like arguments: a handler
+// that makes another call must not pass its own on to that call's handlers.
 std::vector<std::string> handlerEnvironment(const PLATPLUGIN &plugin) {
     std::vector<std::string> variables;
     for (char **variable = environ; variable && *variable; ++variable) {
         const std::string_view text(*variable);
-        if (plugin.args.find(text.substr(0, text.find('='))) == plugin.args.end()) {
+        if (!text.starts_with("ORG_") && !text.starts_with("NEW_") &&
+            !plugin.args.contains(text.substr(0, text.find('=')))) {
             variables.emplace_back(text);
         }
     }
@@ -86,13 +101,14 @@ int runHandlers(const PLATPLUGIN &plugin, const char *phase) {
     }
     envp.push_back(nullptr);
 
-    int result = 0;
-    for (const auto &handler : findHandlers(plugin)) {
+    std::vector<std::filesystem::path> handlers;
+    int result = findHandlers(plugin.folder, handlers);
+    for (const auto &handler : handlers) {
         const char *argv[] = {handler.c_str(), plugin.action.c_str(), phase, nullptr};
         const int status = platform::runProgram(handler.c_str(), argv, envp.data());
         if (status != 0) {
-            syslog(LOG_ERR, "plug-in handler %s failed on %s %s (wait status %d)", handler.c_str(),
-                   plugin.action.c_str(), phase, status);
+            PLATFORM_LOG("plug-in handler %s failed on %s %s (wait status %d)", handler.c_str(),
+                         plugin.action.c_str(), phase, status);
             result = PLATFORM_FAIL(platform::kSystemCallFailed);
         }
     }

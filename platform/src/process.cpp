@@ -1,5 +1,6 @@
 // Programs started without a shell, detached forks and process checks.
 #include "process.h"
+#include "file.h"
 #include "platform.h"
 
 #include <array>
@@ -78,22 +79,26 @@ int PLATCExec(const char *szProgram, const char *const *rgszArgs) {
         -1);
 }
 
+namespace {
+
+bool processExists(pid_t pid) {
+    return kill(pid, 0) == 0 || errno == EPERM;
+}
+
+} // namespace
+
 int PLATCProcAlive(pid_t pid) {
-    if (pid <= 0 || (kill(pid, 0) == -1 && errno != EPERM)) {
+    if (pid <= 0 || !processExists(pid)) {
         return 0;
     }
     // The state stands behind the program's name, which is in parentheses and may hold any byte.
     std::array<char, 64> path{};
     std::array<char, 512> stat{};
     std::snprintf(path.data(), path.size(), "/proc/%d/stat", static_cast<int>(pid));
-    const int fd = open(path.data(), O_RDONLY | O_CLOEXEC);
-    if (fd == -1) {
-        return errno != ENOENT;
-    }
-    const ssize_t length = read(fd, stat.data(), stat.size() - 1);
-    close(fd);
+    const platform::UniqueFd fd(open(path.data(), O_RDONLY | O_CLOEXEC));
+    const ssize_t length = read(fd.get(), stat.data(), stat.size() - 1);
     if (length <= 0) {
-        return 0; // the process ended between the open and the read
+        return processExists(pid); // it has ended since, or /proc does not show it
     }
     const char *nameEnd = std::strrchr(stat.data(), ')');
     return !(nameEnd && nameEnd[1] == ' ' && std::strchr("ZX", nameEnd[2]));

@@ -25,8 +25,8 @@ class ChildSignals {
 // Waits for the child to end. Its wait status, or -1.
 int waitForChild(pid_t pid);
 
-// Starts a program with arguments and environment (argv and envp forms) and waits for it.
-// Its wait status, or -1 when it could not be started.
+// Starts a program with arguments and environment (argv and envp forms), without the caller's
+// standard input, and waits for it. Its wait status, or -1 when it could not be started.
 int runProgram(const char *path, const char *const *argv, const char *const *envp);
 
 } // namespace platform

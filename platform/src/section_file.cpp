@@ -1,15 +1,17 @@
 // Section files. A file is read whole and split at its headers; a section's pairs are split when it
 // is asked for. The last file read is remembered, so that reading all of its sections by name takes
-// one pass. It is served only while device, inode, size and times are the same and the times were
-// older than the kernel's file clock when it was read: a change within the same tick of that clock
-// would leave no trace in the times, so until the tick has passed the file is read again.
+// one pass. It is served only while device, inode, size, times and the asking user are the same,
+// and only when a change since could not have left the same times: within one tick of the file
+// system's clock it could, and then the file is read again.
 #include "containers.h"
 #include "file.h"
 #include "platform.h"
 
 #include <ctime>
 #include <memory>
+#include <optional>
 #include <tuple>
+#include <unistd.h>
 #include <unordered_map>
 
 namespace {
@@ -53,19 +55,33 @@ void forEachLine(std::string_view text, size_t begin, size_t end, Function &&fun
     }
 }
 
+// The name in a header line; blanks behind it, which a hand may have left, do not count. Nothing
+// when the line is none.
+std::optional<std::string_view> headerName(std::string_view line) {
+    const size_t end = line.find_last_not_of(" \t\r");
+    if (end == std::string_view::npos || end == 0 || line[end] != ']') {
+        return std::nullopt;
+    }
+    return line.substr(1, end - 1);
+}
+
+// No key begins with "[", so every line that does ends the section before it.
 SectionFile::SectionFile(std::string text) : text_(std::move(text)) {
+    bool open = false;
     forEachLine(text_, 0, text_.size(), [&](std::string_view line, size_t begin, size_t next) {
-        if (line.size() < 2 || line.front() != '[' || line.back() != ']') {
+        if (!line.starts_with('[')) {
             return;
         }
-        if (!sections_.empty()) {
+        if (open) {
             sections_.back().end = begin;
         }
-        sections_.push_back({.name = line.substr(1, line.size() - 2),
-                             .header = begin,
-                             .body = next,
-                             .end = text_.size()});
-        byName_.emplace(sections_.back().name, sections_.size() - 1);
+        const auto name = headerName(line);
+        open = name.has_value();
+        if (open) {
+            sections_.push_back(
+                {.name = *name, .header = begin, .body = next, .end = text_.size()});
+            byName_.emplace(*name, sections_.size() - 1);
+        }
     });
 }
 
@@ -74,48 +90,67 @@ const Section *SectionFile::find(std::string_view name) const {
     return found == byName_.end() ? nullptr : &sections_[found->second];
 }
 
-using Identity = std::tuple<dev_t, ino_t, off_t, time_t, long, time_t, long>;
+using Identity = std::tuple<dev_t, ino_t, off_t, time_t, long, time_t, long, uid_t>;
 
 Identity identityOf(const struct stat &status) {
-    return {status.st_dev,         status.st_ino,          status.st_size,
-            status.st_mtim.tv_sec, status.st_mtim.tv_nsec, status.st_ctim.tv_sec,
-            status.st_ctim.tv_nsec};
+    return {status.st_dev,          status.st_ino,
+            status.st_size,         status.st_mtim.tv_sec,
+            status.st_mtim.tv_nsec, status.st_ctim.tv_sec,
+            status.st_ctim.tv_nsec, geteuid()};
+}
+
+// Whether a change at this moment or later would get another time than this one. File systems stamp
+// by the kernel's tick, or by seconds when there are no nanoseconds.
+bool wouldShow(const timespec &stamp, const timespec &now) {
+    constexpr time_t kMargin = 2;
+    if (stamp.tv_sec > now.tv_sec + kMargin) {
+        return true;
+    }
+    if (stamp.tv_nsec == 0) {
+        return stamp.tv_sec + kMargin <= now.tv_sec;
+    }
+    return std::tie(stamp.tv_sec, stamp.tv_nsec) < std::tie(now.tv_sec, now.tv_nsec);
+}
+
+bool changeWouldShow(const struct stat &status) {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME_COARSE, &now);
+    return wouldShow(status.st_mtim, now) && wouldShow(status.st_ctim, now);
 }
 
 struct Remembered {
     std::string path;
     Identity identity;
-    bool settled = false; // its times were older than the file clock when it was read
+    bool settled = false; // a change after the reading shows in the identity
     std::unique_ptr<SectionFile> file;
 };
 
 Remembered remembered;
 
-bool isOlder(const timespec &time, const timespec &clock) {
-    return std::tie(time.tv_sec, time.tv_nsec) < std::tie(clock.tv_sec, clock.tv_nsec);
+bool mayServeRemembered(const char *path) {
+    struct stat status {};
+    return remembered.settled && remembered.path == path && stat(path, &status) == 0 &&
+           identityOf(status) == remembered.identity && changeWouldShow(status);
 }
 
 // The file as it is now; valid until the next call. Nothing with the error state set.
 const SectionFile *load(const char *path) {
-    struct stat status {};
-    if (remembered.file && remembered.settled && remembered.path == path &&
-        stat(path, &status) == 0 && identityOf(status) == remembered.identity) {
+    if (mayServeRemembered(path)) {
         return remembered.file.get();
     }
-    timespec fileClock{};
-    clock_gettime(CLOCK_REALTIME_COARSE, &fileClock);
+    remembered.settled = false;
+    struct stat before {};
+    const bool settled = stat(path, &before) == 0 && changeWouldShow(before);
     auto content = platform::readFile(path);
     if (!content) {
         return nullptr;
     }
-    remembered.settled = false;
     if (!remembered.file || remembered.file->text() != content->text) {
         remembered.file = std::make_unique<SectionFile>(std::move(content->text));
     }
     remembered.path = path;
     remembered.identity = identityOf(content->status);
-    remembered.settled =
-        isOlder(content->status.st_mtim, fileClock) && isOlder(content->status.st_ctim, fileClock);
+    remembered.settled = settled && identityOf(before) == remembered.identity;
     return remembered.file.get();
 }
 
@@ -158,20 +193,28 @@ void appendSection(std::string &text, std::string_view section, const PLATCSZHAS
 }
 
 // Rewrites the file with the section replaced by the hash's pairs, or removed when there is none.
+// Further sections of the name, which a hand may have left, go.
 int rewriteSection(const char *path, std::string_view name, const PLATCSZHASH *hash) {
     const SectionFile *file = load(path);
     if (!file) {
         return -1;
     }
-    const Section *section = file->find(name);
-    if (!section) {
+    const Section *first = file->find(name);
+    if (!first) {
         return 0;
     }
-    std::string text = file->text().substr(0, section->header);
-    if (hash) {
-        appendSection(text, name, *hash);
+    std::string text;
+    size_t kept = 0;
+    for (const Section &section : file->sections()) {
+        if (section.name == name) {
+            text.append(file->text(), kept, section.header - kept);
+            kept = section.end;
+            if (hash && &section == first) {
+                appendSection(text, name, *hash);
+            }
+        }
     }
-    text.append(file->text(), section->end);
+    text.append(file->text(), kept);
     return platform::replaceFile(path, text) == 0 ? 1 : -1;
 }
 
@@ -190,7 +233,9 @@ int PLATCFileEnumSection(const char *szPath, PLATCSZLIST **ppList) {
             auto &texts = (*ppList)->texts;
             texts.clear();
             for (const Section &section : file->sections()) {
-                texts.emplace_back(section.name);
+                if (file->find(section.name) == &section) {
+                    texts.emplace_back(section.name);
+                }
             }
             return static_cast<int>(texts.size());
         },

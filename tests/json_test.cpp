@@ -1,0 +1,106 @@
+// Tasks as JSON text.
+#include "support.h"
+
+#include <regex>
+
+namespace {
+
+using namespace support;
+
+class Json : public SchedTest {
+  protected:
+    std::string rendered(int id) {
+        EXPECT_EQ(TAVISchedTaskConvertToJsonById(id, buffer_.data(), buffer_.size()), 0);
+        return buffer_.c_str();
+    }
+    static std::string replaced(const std::string &text, const char *from, const char *to) {
+        const std::string result = std::regex_replace(text, std::regex(from), to);
+        EXPECT_NE(result, text) << from;
+        return result;
+    }
+
+    std::string buffer_ = std::string(163840, '\0');
+};
+
+TEST_F(Json, RoundTripOverwritesAndAnotherNameCreates) {
+    Task task = newTask("echo \"1\"\necho 2");
+    TAVISchedCTaskSetName(task.get(), "back\"up \xc3\xa9");
+    TAVISchedCTaskSetAppArgs(task.get(), R"({"a": "b\n"})");
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    const std::string json = rendered(1);
+    EXPECT_THAT(json, HasSubstr(R"("type":"\"daily\"\n")"));
+    EXPECT_THAT(json, HasSubstr(R"("cmd":"\"ZWNobyAiMSIKZWNobyAy\"\n")"));
+    EXPECT_EQ(json.back(), '\n');
+
+    const std::string later = replaced(json, R"("run hour":"\\"0)", R"("run hour":"\"9)");
+    EXPECT_EQ(TAVISchedTaskSaveFromJson(later.c_str(), 0), 1);
+    EXPECT_EQ(TAVISchedTaskGetByID(1, task.get()), 0);
+    EXPECT_EQ(task->runHour, 9U);
+    EXPECT_STREQ(task->name, "back\"up \xc3\xa9");
+    EXPECT_STREQ(task->command, "echo \"1\"\necho 2");
+    EXPECT_STREQ(task->appArgs, R"({"a": "b\n"})");
+
+    EXPECT_EQ(TAVISchedTaskSaveFromJson(replaced(json, "back", "push").c_str(), 0), 2);
+    EXPECT_EQ(
+        TAVISchedTaskSaveFromJson(replaced(json, R"("app":"\\"\\")", R"("app":"\"X\")").c_str(), 0),
+        3);
+    EXPECT_EQ(TAVISchedTaskSaveFromJson(json.c_str(), 1), 4);
+    EXPECT_EQ(TAVISchedTaskSaveFromJson("{}", 0), -1);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3, 4));
+    EXPECT_THAT(readFile("/etc/crontab"), HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask"));
+}
+
+TEST_F(Json, BufferIsCheckedAndALongTextIsCut) {
+    Task task = storedTask();
+    EXPECT_EQ(TAVISchedTaskConvertToJson(task.get(), buffer_.data(), 40959), -1);
+    EXPECT_EQ(TAVISchedTaskConvertToJsonById(1, buffer_.data(), 40959), -1);
+    EXPECT_EQ(TAVISchedTaskConvertToJsonById(-1, buffer_.data(), 40960), -1);
+    EXPECT_EQ(logs().back(), "sched_task_convert_to_json_string.cpp:* Bad parameter");
+    TAVISchedCTaskSetAppArgs(task.get(), std::string(8191, '"').c_str());
+    TAVISchedCTaskSetCommand(task.get(), std::string(12285, 'x').c_str());
+    EXPECT_EQ(TAVISchedTaskConvertToJson(task.get(), buffer_.data(), 40960), 0);
+    EXPECT_EQ(std::string(buffer_.c_str()).size(), 40959U);
+    EXPECT_EQ(TAVISchedTaskConvertToJsonById(99, buffer_.data(), buffer_.size()), -1);
+    EXPECT_EQ(logs().back(),
+              "sched_task_convert_to_json_string.cpp:* cannot get scheduler task, id=99");
+}
+
+TEST_F(Json, BadTextsStoreNothing) {
+    std::string deep(100000, '[');
+    std::string noise;
+    for (int i = 0; i < 10 << 20; ++i) {
+        noise += static_cast<char>(33 + (i * 7919LL) % 90);
+    }
+    storedTask();
+    const std::string good = rendered(1);
+    const std::string parse = "sched_task_save_from_json_string.cpp:* parse json failed, szJson=";
+    const std::pair<std::string, std::string> cases[] = {
+        {"", "sched_task_save_from_json_string.cpp:* Bad parameter"},
+        {"[]", parse + "[]"},
+        {"\"x\"", parse + "\"x\""},
+        {"null", parse + "null"},
+        {"{\"id\":", parse + "{\"id\":"},
+        {"{\"id\":7}", parse + "{\"id\":7}"},
+        {"{\"id\":{}}", parse + "{\"id\":{}}"},
+        {"{\"id\":\"[1]\"}", parse + "{\"id\":\"[1]\"}"},
+        {"{\"i\\u0000d\":\"7\"}", parse + "{\"i\\u0000d\":\"7\"}"},
+        {deep, parse + deep.substr(0, 4096)},
+        {"{\"id\":\"" + deep + "\"}", parse + "{\"id\":\"" + deep.substr(0, 4089)},
+        {noise, parse + noise.substr(0, 4096)},
+        {replaced(good, "\"cmd\"", "\"cmx\""),
+         "sched_task_save_from_json_string.cpp:* hash to task failed, task id=1"},
+        {replaced(good, R"("owner":"\\"0)", R"("owner":"\"0x)"),
+         "sched_task_save_from_json_string.cpp:* hash to task failed, task id=1"},
+    };
+    const std::string stored = readFile("/usr/tavi/etc/scheduled_tasks");
+    logs();
+    for (const auto &[json, message] : cases) {
+        SCOPED_TRACE(json.substr(0, 40));
+        EXPECT_EQ(TAVISchedTaskSaveFromJson(json.c_str(), 1), -1);
+        EXPECT_EQ(logs().back(), message);
+    }
+    EXPECT_EQ(readFile("/usr/tavi/etc/scheduled_tasks"), stored);
+    EXPECT_EQ(TAVISchedTaskSaveFromJson(nullptr, 0), -1);
+}
+
+} // namespace

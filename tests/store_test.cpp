@@ -1,0 +1,176 @@
+// The schedule backend's task file.
+#include "support.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace support;
+
+constexpr const char *kWorking = "/tmp/scheduled_tasks";
+constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+
+// Bytes that a hand-written file format often loses.
+constexpr const char *kHardText = "  [x]=#;\\ \xff\xc3\xa9\t\"'\r ";
+
+class Store : public SchedTest {
+  protected:
+    // A working copy with sections of these names, all of which convert to a task of that id.
+    static void storeIds(const std::vector<std::string> &ids) {
+        std::string content;
+        for (const std::string &id : ids) {
+            content += "[" + id + "]\nid=" + id +
+                       "\nrun hour=1\nrun min=2\nname=n\napp=\napp name=\naction=\ncmd=\n"
+                       "state=enabled\ntype=daily\n";
+        }
+        writeFile(kWorking, content);
+    }
+};
+
+TEST_F(Store, HardTextsSurviveASaveAndALoad) {
+    Task task = newTask(kHardText);
+    TAVISchedCTaskSetName(task.get(), kHardText);
+    TAVISchedCTaskSetAppArgs(task.get(), kHardText);
+    TAVISchedCTaskSetAction(task.get(), "[1]\n[2]");
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    storedTask();
+    TAVI_SCHED_TASK back{};
+    ASSERT_EQ(TAVISchedTaskGetByID(1, &back), 0);
+    EXPECT_STREQ(back.name, kHardText);
+    EXPECT_STREQ(back.appArgs, kHardText);
+    EXPECT_STREQ(back.command, kHardText);
+    EXPECT_STREQ(back.action, "[1] [2]");
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2));
+    EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
+    EXPECT_EQ(shell("ls /tmp/scheduled_tasks.tmp*"), 2);
+}
+
+TEST_F(Store, NextIds) {
+    const std::pair<std::vector<std::string>, const char *> cases[] = {
+        {{}, "Task 1"},
+        {{"2", "3"}, "Task 1"},
+        {{"4", "2", "1"}, "Task 3"},
+        {{"1", "2", "3"}, "Task 4"},
+        {{"0", "5"}, "Task 1"},
+        {{"-1", "0"}, "Task 1"},
+        {{"7"}, "Task 1"},
+        {{"0"}, "Task 1"},
+        {{"1", "1", "3"}, "Task 2"},
+        {{"-2147483648", "2147483647"}, "Task -2147483647"}};
+    for (const auto &[ids, name] : cases) {
+        storeIds(ids);
+        EXPECT_STREQ(newTask()->name, name);
+    }
+}
+
+TEST_F(Store, UnreadableSectionsArePassedOverAndKept) {
+    storeIds({"2"});
+    const std::string bad = "[1]\nid=1\n[3]\nid=3x\nname=cut";
+    writeFile(kWorking, bad + "\n" + readFile(kWorking));
+    EXPECT_THAT(listedIds(), ElementsAre(2));
+    EXPECT_THAT(logs(true),
+                testing::Contains(HasSubstr(
+                    "backends/backend_tavischedule.cpp:60 Init task from hash failed. [0x")));
+    TAVI_SCHED_TASK task{};
+    EXPECT_EQ(TAVISchedTaskGetByID(1, &task), -1);
+    EXPECT_THAT(logs(true), testing::Contains(HasSubstr("backend_tavischedule.cpp:545 ")));
+    EXPECT_EQ(task.state, TAVI_SCHED_STATE_NOT_EXISTED);
+    EXPECT_EQ(storedTask()->id, 4); // 1 and 3 are in use
+    EXPECT_THAT(readFile(kWorking), HasSubstr(bad + "\n[2]"));
+}
+
+TEST_F(Store, WithoutAWorkingCopy) {
+    TAVI_SCHED_TASK task{};
+    EXPECT_THAT(listedIds(), IsEmpty());
+    EXPECT_EQ(SchedBackends[0].get_by_id(1, &task), 0);
+    EXPECT_EQ(task.state, TAVI_SCHED_STATE_NOT_EXISTED);
+    EXPECT_EQ(task.backend, -2);
+    writeFile(kPersistent, "[9]\n");
+    EXPECT_EQ(SchedBackends[0].remove(1), 0);
+    EXPECT_EQ(readFile(kPersistent), "[9]\n");
+    // The first change would otherwise erase what the persistent file still has.
+    EXPECT_EQ(storedTask()->id, 1);
+    EXPECT_EQ(readFile("/usr/tavi/etc/scheduled_tasks.bak"), "[9]\n");
+    const std::string first = readFile(kPersistent);
+    EXPECT_THAT(first, testing::StartsWith("[1]\n"));
+    writeFile(kWorking, ""); // as a copy that failed leaves it
+    storedTask();
+    EXPECT_EQ(readFile("/usr/tavi/etc/scheduled_tasks.bak"), first);
+    EXPECT_EQ(readFile("/usr/tavi/etc/scheduled_tasks.bak.1"), "[9]\n");
+    storedTask();
+    EXPECT_EQ(shell("test $(ls /usr/tavi/etc | wc -l) = 3"), 0);
+}
+
+TEST_F(Store, ChangesOfATask) {
+    Task task = newTask();
+    TAVISchedCTaskSetName(task.get(), "");
+    EXPECT_EQ(TAVISchedTaskSave(task.get()), 0);
+    EXPECT_STREQ(task->name, "Task 1");
+    TAVISchedCTaskSetID(task.get(), 42);
+    EXPECT_EQ(SchedBackends[0].edit(task.get()), 0); // an unknown id is added
+    EXPECT_THAT(listedIds(), ElementsAre(1, 42));
+    EXPECT_EQ(TAVISchedTaskRemove(1), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(42));
+    const std::string crontab = readFile("/etc/crontab");
+    writeFile("/etc/crontab", crontab + "# later\n");
+    EXPECT_EQ(SchedBackends[0].remove(1), 0);
+    EXPECT_EQ(readFile("/etc/crontab"), crontab + "# later\n"); // nothing removed, no rewrite
+    EXPECT_EQ(SchedBackends[0].remove(42), 1);
+    EXPECT_EQ(readFile("/etc/crontab"), std::string(kForeignCrontab) + "# later\n");
+}
+
+// Whatever stands between a task and both of its files, the change fails and the files stay whole.
+TEST_F(Store, FailedChangesLeaveTheFiles) {
+    Task task = storedTask();
+    const std::string stored = readFile(kWorking);
+    logs();
+    fakes.renameFails = true;
+    EXPECT_EQ(TAVISchedTaskEdit(task.get()), -1);
+    fakes.renameFails = false;
+    EXPECT_EQ(PLATCErrGet(), 0x2800U);
+    EXPECT_THAT(logs(true), testing::Contains(testing::MatchesRegex(
+                                "backends/backend_tavischedule.cpp:408 Save section \\[1\\] to "
+                                "\\[/tmp/scheduled_tasks.tmp.[0-9]+\\] failed. .*")));
+    shell("mv /usr/tavi/etc /usr/tavi/gone");
+    EXPECT_EQ(TAVISchedTaskEdit(task.get()), -1);
+    shell("mv /usr/tavi/gone /usr/tavi/etc");
+    EXPECT_THAT(logs(true),
+                testing::Contains(HasSubstr("backend_tavischedule.cpp:419 Copy sched")));
+    EXPECT_EQ(readFile(kWorking), stored);
+    EXPECT_EQ(readFile(kPersistent), stored);
+    EXPECT_EQ(shell("ls /tmp/scheduled_tasks.tmp*"), 2);
+    fakes.callocFails = sizeof(TAVI_SCHED_TASK);
+    TAVI_SCHED_TASK *list = nullptr;
+    EXPECT_EQ(SchedBackends[0].list_get(&list, nullptr), -1);
+    EXPECT_EQ(PLATCErrorGetLine(), 56);
+    EXPECT_EQ(list, nullptr);
+}
+
+TEST_F(Store, StrangeWorkingCopiesAreRefused) {
+    storeIds({"1"});
+    const std::string planted = readFile(kWorking);
+    Task task = newTask();
+    task->id = 1;
+    const auto expectRefused = [&] {
+        TAVI_SCHED_TASK *list = nullptr;
+        EXPECT_EQ(SchedBackends[0].list_get(&list, nullptr), -1);
+        EXPECT_EQ(SchedBackends[0].get_by_id(1, task.get()), -1);
+        EXPECT_EQ(SchedBackends[0].create(task.get()), -1);
+        EXPECT_EQ(SchedBackends[0].edit(task.get()), -1);
+        EXPECT_EQ(SchedBackends[0].remove(1), -1);
+        EXPECT_EQ(PLATCErrGet(), 0x0900U);
+        EXPECT_EQ(readFile(kPersistent), "");
+        EXPECT_EQ(readFile("/etc/crontab"), kForeignCrontab);
+    };
+    if (chown(kWorking, 4242, 4242) == 0) {
+        expectRefused();
+    }
+    writeFile("/etc/target", planted);
+    unlink(kWorking);
+    ASSERT_EQ(symlink("/etc/target", kWorking), 0);
+    expectRefused();
+    EXPECT_EQ(readFile("/etc/target"), planted);
+}
+
+} // namespace

@@ -56,8 +56,11 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
         GTEST_SKIP() << "needs several users";
     }
     shell("mkdir /tmp/home && chown 4242 /tmp/home");
-    setenv("SECRET", "1", 1);
-    setenv("LC_TIME", "C", 1);
+    clearenv();
+    for (const char *name : {"SECRET", "LANG", "LC_TIME"}) {
+        setenv(name, "C", 1);
+    }
+    setenv("TZ", "UTC", 1);
     Task task = newTask("{ grep -E '^(Uid|Gid|Groups|CapPrm):' /proc/self/status; "
                         "readlink /proc/$$/exe; pwd; ls -l /proc/$$/fd | grep -c passwd; "
                         "env | grep -v ^_= | sort; } > /tmp/home/seen");
@@ -72,12 +75,9 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
     EXPECT_EQ(readFile("/tmp/home/seen"),
               "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
               "Groups:\t4242 4343 \nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
-              "HOME=/tmp/home\n" +
-                  (getenv("LANG") ? "LANG=" + std::string(getenv("LANG")) + "\n" : std::string()) +
-                  "LC_TIME=C\nLOGNAME=tavitest\nPATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\n"
-                  "SHELL=/bin/false\n" +
-                  (getenv("TZ") ? "TZ=" + std::string(getenv("TZ")) + "\n" : std::string()) +
-                  "USER=tavitest\n");
+              "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
+              "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTZ=UTC\n"
+              "USER=tavitest\n");
     EXPECT_EQ(rows(), "1:3: ");
     struct stat status {};
     EXPECT_EQ(stat("/tmp/sched_status.sqlite", &status), 0);

@@ -22,8 +22,7 @@ using Database = std::unique_ptr<sqlite3, Releaser<sqlite3_close>>;
 using SqlText = std::unique_ptr<char, Releaser<sqlite3_free>>;
 using User = std::unique_ptr<TAVIUSER, Releaser<TAVIUserFree>>;
 
-// One zero-filled task, or nothing when out of memory. calloc leaves fresh pages untouched, so the
-// large text fields of a task cost no memory until they are written.
+// One zero-filled task, or nothing when out of memory.
 inline Allocated<TAVI_SCHED_TASK> allocateTask() {
     return Allocated<TAVI_SCHED_TASK>(
         static_cast<TAVI_SCHED_TASK *>(std::calloc(1, sizeof(TAVI_SCHED_TASK))));

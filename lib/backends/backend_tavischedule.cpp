@@ -74,34 +74,53 @@ sched::Allocated<TAVI_SCHED_TASK> readSection(const char *section, Hash &hash, b
     return task;
 }
 
-// A section that cannot be read is passed over.
-int ListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
-    SCHED_REQUIRE_AT(26, pTaskList, "((void *)0) != pTaskList", -1);
+// Lists the section names: their number, 0 when there is no working copy, or -1.
+int enumerateSections(sched::List &sections) {
     if (!PLATCFileExist(kWorkingCopy)) {
         return 0;
     }
-    sched::List sections(kCapacity);
-    const int sectionCount = sections ? PLATCFileEnumSection(kWorkingCopy, sections.address()) : -1;
-    if (sectionCount <= 0) {
-        return sectionCount;
-    }
+    return sections ? PLATCFileEnumSection(kWorkingCopy, sections.address()) : -1;
+}
+
+// Hands every task to the function, in file order; a section that cannot be read is passed over.
+// 0, or -1 when out of memory.
+template <typename Function>
+int forEachTask(const sched::List &sections, int sectionCount, Function &&function) {
     Hash hash(kCapacity);
     if (!hash) {
         return -1;
     }
-    TaskList tasks;
-    int count = 0;
     for (int i = 0; i < sectionCount; ++i) {
         bool outOfMemory = false;
         auto task = readSection(PLATCSzListGet(sections.get(), i), hash, outOfMemory);
         if (outOfMemory) {
             return -1;
         }
-        if (task && (!filter || filter(task.get()))) {
+        if (task) {
+            function(std::move(task));
+        }
+    }
+    return 0;
+}
+
+int ListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
+    SCHED_REQUIRE_AT(26, pTaskList, "((void *)0) != pTaskList", -1);
+    sched::List sections(kCapacity);
+    const int sectionCount = enumerateSections(sections);
+    if (sectionCount <= 0) {
+        return sectionCount;
+    }
+    TaskList tasks;
+    int count = 0;
+    const auto keep = [&](sched::Allocated<TAVI_SCHED_TASK> task) {
+        if (!filter || filter(task.get())) {
             task->backend = TAVI_SCHED_BACKEND_SCHEDULE;
             tasks.pushFront(std::move(task));
             ++count;
         }
+    };
+    if (forEachTask(sections, sectionCount, keep) != 0) {
+        return -1;
     }
     tasks.appendTo(pTaskList);
     return count;
@@ -142,15 +161,6 @@ int GetByID(int32_t id, TAVI_SCHED_TASK *pTask) {
 
 // ---- Ids ----
 
-// Section names that are ids; 0 sections when there is no working copy.
-int enumerateSections(sched::List &sections) {
-    if (!sections) {
-        return -1;
-    }
-    return PLATCFileExist(kWorkingCopy) ? PLATCFileEnumSection(kWorkingCopy, sections.address())
-                                        : 0;
-}
-
 // From 1 upward: a smallest id above 1 gives 1, else the first gap above the smallest id, else the
 // largest plus 1. Nothing below the smallest id is looked at, and that is kept.
 int32_t smallestFreeId(std::span<int32_t> ids) {
@@ -174,30 +184,29 @@ void addSectionId(const char *name, int32_t *ids, size_t &count) {
     }
 }
 
-// An id is in use when a task has it or a section is named by it.
+// An id is in use when a task has it or a section is named by it. The tasks are read as for a list
+// but none is kept: their number does not cost memory.
 int GetNextId(int32_t *pID) {
     SCHED_REQUIRE_AT(310, pID, "((void *)0) != pID", -1);
-    TaskList tasks;
     sched::List sections(kCapacity);
-    const int taskCount = ListGet(tasks.address(), nullptr);
-    const int sectionCount = taskCount < 0 ? -1 : enumerateSections(sections);
-    if (sectionCount < 0) {
-        return -1;
-    }
-    const auto room = static_cast<size_t>(taskCount) + static_cast<size_t>(sectionCount);
-    if (room == 0) {
+    const int sectionCount = enumerateSections(sections);
+    if (sectionCount <= 0) {
         *pID = 1;
-        return 0;
+        return sectionCount;
     }
-    const sched::Allocated<int32_t> ids(static_cast<int32_t *>(std::calloc(room, sizeof(int32_t))));
+    const sched::Allocated<int32_t> ids(static_cast<int32_t *>(
+        std::calloc(static_cast<size_t>(sectionCount) * 2, sizeof(int32_t))));
     if (!ids) {
-        SCHED_LOG_AT(321, "Alloc id slot failed. num:[%d] [0x%04X %s:%d]", taskCount,
+        SCHED_LOG_AT(321, "Alloc id slot failed. num:[%d] [0x%04X %s:%d]", sectionCount,
                      SCHED_LAST_ERROR);
         return -1;
     }
     size_t count = 0;
-    for (const TAVI_SCHED_TASK *task = tasks.head(); task; task = task->next) {
+    const auto addTaskId = [&](const sched::Allocated<TAVI_SCHED_TASK> &task) {
         ids.get()[count++] = task->id;
+    };
+    if (forEachTask(sections, sectionCount, addTaskId) != 0) {
+        return -1;
     }
     for (int i = 0; i < sectionCount; ++i) {
         addSectionId(PLATCSzListGet(sections.get(), i), ids.get(), count);

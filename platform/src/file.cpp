@@ -6,7 +6,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <fcntl.h>
-#include <filesystem>
 #include <unistd.h>
 
 namespace platform {
@@ -25,10 +24,10 @@ namespace {
 
 // In a folder with the sticky bit anybody may create files; it does not outlive a reboot either.
 bool isInSharedFolder(const std::string &path) {
-    const std::filesystem::path folder = std::filesystem::path(path).parent_path();
+    const size_t slash = path.rfind('/');
+    const std::string folder = slash == std::string::npos ? "." : path.substr(0, slash + 1);
     struct stat status {};
-    return stat(folder.empty() ? "." : folder.c_str(), &status) == 0 &&
-           (status.st_mode & S_ISVTX) != 0;
+    return stat(folder.c_str(), &status) == 0 && (status.st_mode & S_ISVTX) != 0;
 }
 
 bool readAll(int fd, std::string &text) {

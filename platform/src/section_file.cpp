@@ -254,6 +254,10 @@ int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH *
                 return file ? 0 : -1;
             }
             readPairs(*file, *section, **ppHash);
+            if (section == &file->sections().back()) {
+                remembered =
+                    {}; // a pass over all sections ends here, and so does the need for memory
+            }
             return 1;
         },
         -1);

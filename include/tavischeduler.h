@@ -207,8 +207,9 @@ extern TAVI_SCHED_API unsigned int cBackend;
 /* Registers the built-in backends; every operation below calls it. Cheap after the first success.
  */
 TAVI_SCHED_API int TAVISchedBackendInit(void);
-/* Fills a backend's row; the name must be the backend's own. */
+/* Each fills its backend's row; the name must be the backend's own. */
 TAVI_SCHED_API int tavischedule_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend);
+TAVI_SCHED_API int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend);
 
 /* ---- Task operations ---- */
 

@@ -74,15 +74,53 @@ int checkOpened(const std::string &path, bool shared, const struct stat &status)
     return 0;
 }
 
-// Fills the temporary file and gives it the old file's owner and mode.
-int fillReplacement(UniqueFd &fd, std::string_view content, const struct stat *old, bool durable) {
-    if (!writeAll(fd.get(), content) ||
-        (old && (fchown(fd.get(), old->st_uid, old->st_gid) != 0 ||
-                 fchmod(fd.get(), old->st_mode & ALLPERMS) != 0)) ||
-        (durable && fsync(fd.get()) != 0) || !fd.close()) {
+// How a file is replaced beyond its content.
+struct Replacement {
+    const struct stat *old; // owner and mode are taken from it; none for a new file
+    bool durable;
+    bool laterBySecond;
+};
+
+bool copyOwnerAndMode(int fd, const struct stat &old) {
+    return fchown(fd, old.st_uid, old.st_gid) == 0 && fchmod(fd, old.st_mode & ALLPERMS) == 0;
+}
+
+bool makeLater(int fd, const struct stat &old) {
+    struct stat status {};
+    if (fstat(fd, &status) != 0 || status.st_mtim.tv_sec > old.st_mtim.tv_sec) {
+        return true; // later already; a file without status fails elsewhere
+    }
+    const timespec times[] = {{.tv_sec = 0, .tv_nsec = UTIME_OMIT},
+                              {.tv_sec = old.st_mtim.tv_sec + 1, .tv_nsec = 0}};
+    return futimens(fd, times) == 0;
+}
+
+int fillReplacement(UniqueFd &fd, std::string_view content, const Replacement &how) {
+    if (!writeAll(fd.get(), content) || (how.old && !copyOwnerAndMode(fd.get(), *how.old)) ||
+        (how.old && how.laterBySecond && !makeLater(fd.get(), *how.old)) ||
+        (how.durable && fsync(fd.get()) != 0) || !fd.close()) {
         return PLATFORM_FAIL(kReadWriteFailed);
     }
     return 0;
+}
+
+int replace(const std::string &path, std::string_view content, bool laterBySecond) {
+    struct stat old {};
+    const bool exists = stat(path.c_str(), &old) == 0;
+    std::string temporary = path + ".XXXXXX";
+    UniqueFd fd(mkostemp(temporary.data(), O_CLOEXEC));
+    if (fd.get() == -1) {
+        return PLATFORM_FAIL(kOpenFailed);
+    }
+    const Replacement how{exists ? &old : nullptr, !isInSharedFolder(path), laterBySecond};
+    int result = fillReplacement(fd, content, how);
+    if (result == 0 && rename(temporary.c_str(), path.c_str()) != 0) {
+        result = PLATFORM_FAIL(kRenameFailed);
+    }
+    if (result != 0) {
+        unlink(temporary.c_str());
+    }
+    return result;
 }
 
 } // namespace
@@ -117,21 +155,11 @@ std::optional<FileContent> readFile(const std::string &path) {
 }
 
 int replaceFile(const std::string &path, std::string_view content) {
-    struct stat old {};
-    const bool exists = stat(path.c_str(), &old) == 0;
-    std::string temporary = path + ".XXXXXX";
-    UniqueFd fd(mkostemp(temporary.data(), O_CLOEXEC));
-    if (fd.get() == -1) {
-        return PLATFORM_FAIL(kOpenFailed);
-    }
-    int result = fillReplacement(fd, content, exists ? &old : nullptr, !isInSharedFolder(path));
-    if (result == 0 && rename(temporary.c_str(), path.c_str()) != 0) {
-        result = PLATFORM_FAIL(kRenameFailed);
-    }
-    if (result != 0) {
-        unlink(temporary.c_str());
-    }
-    return result;
+    return replace(path, content, false);
+}
+
+int replaceWatchedFile(const std::string &path, std::string_view content) {
+    return replace(path, content, true);
 }
 
 } // namespace platform
@@ -171,7 +199,7 @@ int PLATCFileSetLine(const char *szPath, const char *szMatch, const char *szLine
             const size_t end = text.find('\n', match);
             const size_t length = end == std::string::npos ? end : end + 1 - begin;
             text.replace(begin, length, szLine ? std::string(szLine) + "\n" : std::string());
-            return platform::replaceFile(szPath, text) == 0 ? 1 : -1;
+            return platform::replaceWatchedFile(szPath, text) == 0 ? 1 : -1;
         },
         -1);
 }

@@ -92,6 +92,10 @@ inline constexpr std::array<Field, 31> parm_table = {
 #undef SCHED_TEXT
 #undef SCHED_ENUM
 
+// Puts what a new task of any backend starts with into the hash; all other rows take the table's
+// defaults. The start date is zeros on purpose, unlike the table's: front ends fill it in.
+void setNewTaskValues(PLATCSZHASH **hash, const char *name, const char *appName);
+
 // Fills the task row by row from the hash, the defaults standing in for absent optional keys. The
 // command stays in the form that the hash has. Failures are logged for the site. 0 or -1.
 int fillTaskFromHash(PLATCSZHASH *hash, TAVI_SCHED_TASK &task, const Site &site);

@@ -166,6 +166,25 @@ int decodeCommand(TAVI_SCHED_TASK &task) {
 
 } // namespace
 
+void sched::setNewTaskValues(PLATCSZHASH **hash, const char *name, const char *appName) {
+    const std::array<std::array<const char *, 2>, 13> values = {{{"id", "-1"},
+                                                                 {"name", name},
+                                                                 {"run hour", "0"},
+                                                                 {"run min", "0"},
+                                                                 {"start year", "0"},
+                                                                 {"start month", "0"},
+                                                                 {"start day", "0"},
+                                                                 {"app", ""},
+                                                                 {"app name", appName},
+                                                                 {"action", ""},
+                                                                 {"cmd", ""},
+                                                                 {"state", "enabled"},
+                                                                 {"type", "daily"}}};
+    for (const auto &[key, value] : values) {
+        PLATCSzHashSetValue(hash, key, value);
+    }
+}
+
 int sched::fillTaskFromHash(PLATCSZHASH *hash, TAVI_SCHED_TASK &task, const Site &site) {
     for (size_t row = 0; row < parm_table.size(); ++row) {
         const Field &field = parm_table[row];

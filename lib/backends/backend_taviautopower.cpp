@@ -82,6 +82,14 @@ class Entries {
     int count_ = 0;
 };
 
+int readEntries(int kind, Entries &entries) {
+    if (!entries.read(kind)) {
+        SCHED_LOG("Get auto poweron conf failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return -1;
+    }
+    return 0;
+}
+
 // Nothing when hour or minute does not fit an entry: 300 must not become 44.
 std::optional<Entry> toEntry(const Task &task) {
     if (!hasRanges(0, task.runHour, task.runMin)) {
@@ -130,7 +138,6 @@ void setFields(int kind, const Entry &entry, Task &task) {
 
 // ---- Defaults ----
 
-// The start date is zero on purpose: power tasks are daily or weekly and never consult it.
 int GetDefault(Task *pTask) {
     SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
     sched::Hash hash(1024);
@@ -138,23 +145,7 @@ int GetDefault(Task *pTask) {
         SCHED_LOG("Alloc hash failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
         return -1;
     }
-    static constexpr std::array<std::array<const char *, 2>, 13> kValues = {
-        {{"id", "-1"},
-         {"name", "Power"},
-         {"run hour", "0"},
-         {"run min", "0"},
-         {"start year", "0"},
-         {"start month", "0"},
-         {"start day", "0"},
-         {"app", ""},
-         {"app name", "#schedule:power_on_off#"},
-         {"action", ""},
-         {"cmd", ""},
-         {"state", "enabled"},
-         {"type", "daily"}}};
-    for (const auto &[key, value] : kValues) {
-        PLATCSzHashSetValue(hash.address(), key, value);
-    }
+    sched::setNewTaskValues(hash.address(), "Power", "#schedule:power_on_off#");
     return sched::fillTaskFromHash(hash.get(), *pTask, SCHED_SITE);
 }
 
@@ -198,8 +189,7 @@ sched::Allocated<Task> makeTask(int kind, size_t index, const Entry &entry) {
 // Puts the kind's tasks in front of the list: the number of tasks kept, or -1.
 int listKind(int kind, TAVI_SCHED_FILTER filter, sched::TaskList &tasks) {
     Entries entries;
-    if (!entries.read(kind)) {
-        SCHED_LOG("Get auto poweron conf failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    if (readEntries(kind, entries) != 0) {
         return -1;
     }
     int count = 0;
@@ -241,8 +231,7 @@ int GetByID(int32_t id, Task *pTask) {
     }
     const int kind = kindOf(id);
     Entries entries;
-    if (!entries.read(kind)) {
-        SCHED_LOG("Get auto poweron conf failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    if (readEntries(kind, entries) != 0) {
         return -1;
     }
     const auto all = entries.all();
@@ -290,8 +279,7 @@ int SetSchedule(int32_t id, const Task *task) {
     }
     const int kind = kindOf(id);
     Entries entries;
-    if (!entries.read(kind)) {
-        SCHED_LOG("Get auto poweron conf failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    if (readEntries(kind, entries) != 0) {
         return -1;
     }
     const auto index = findEntry(id, entries.all());

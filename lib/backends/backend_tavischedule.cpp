@@ -435,7 +435,6 @@ int Remove(int32_t id) {
     return 1;
 }
 
-// The start date is all zeros on purpose, unlike the field table's defaults: front ends fill it in.
 int GetDefault(TAVI_SCHED_TASK *pTask) {
     SCHED_REQUIRE_AT(574, pTask, "((void *)0) != pTask", -1);
     Hash hash(kCapacity);
@@ -450,22 +449,7 @@ int GetDefault(TAVI_SCHED_TASK *pTask) {
     }
     std::array<char, 32> name{};
     std::snprintf(name.data(), name.size(), "Task %ld", static_cast<long>(id));
-    const std::array<std::array<const char *, 2>, 13> values = {{{"id", "-1"},
-                                                                 {"name", name.data()},
-                                                                 {"run hour", "0"},
-                                                                 {"run min", "0"},
-                                                                 {"start year", "0"},
-                                                                 {"start month", "0"},
-                                                                 {"start day", "0"},
-                                                                 {"app", ""},
-                                                                 {"app name", ""},
-                                                                 {"action", ""},
-                                                                 {"cmd", ""},
-                                                                 {"state", "enabled"},
-                                                                 {"type", "daily"}}};
-    for (const auto &[key, value] : values) {
-        PLATCSzHashSetValue(hash.address(), key, value);
-    }
+    sched::setNewTaskValues(hash.address(), name.data(), "");
     return sched::fillTaskFromHash(hash.get(), *pTask, {SCHED_SOURCE, 604});
 }
 

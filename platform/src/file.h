@@ -37,8 +37,8 @@ std::optional<FileContent> readFile(const std::string &path);
 // mode 0600. 0, or -1 with the error state set and the old file in place.
 int replaceFile(const std::string &path, std::string_view content);
 
-// The same for a file that a daemon watches: cron compares times by whole seconds, so the new file's
-// is later than the old one's by a second at least.
+// The same for a file that a daemon watches: cron compares times by whole seconds, so the new
+// file's is later than the old one's by a second at least.
 int replaceWatchedFile(const std::string &path, std::string_view content);
 
 } // namespace platform

@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <fcntl.h>
 #include <filesystem>
+#include <new>
 #include <string>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -24,7 +25,7 @@ bool isOurs(const struct stat &status, mode_t kind) {
 
 // Moves what is there into a folder of our own, where nobody can change it any more, and removes
 // it. It may meanwhile be a proper file that another process has made: that one goes back.
-int removeStrange(const std::string &path) {
+int moveAwayAndRemove(const std::string &path) {
     std::string folder = path + ".XXXXXX";
     if (!mkdtemp(folder.data())) {
         return -1;
@@ -39,6 +40,15 @@ int removeStrange(const std::string &path) {
     std::filesystem::remove_all(folder, ignored);
     errno = renameErrno;
     return result;
+}
+
+int removeStrange(const char *path) {
+    try {
+        return moveAwayAndRemove(path);
+    } catch (const std::bad_alloc &) {
+        errno = ENOMEM;
+        return -1;
+    }
 }
 
 } // namespace

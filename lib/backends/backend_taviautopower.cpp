@@ -462,6 +462,7 @@ int Remove(int32_t id) {
 }
 
 int Run(Task *pTask, int *pStatusCode, char *szComment, size_t cbComment) {
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
     SCHED_REQUIRE(pStatusCode, "((void *)0) != pStatusCode", -1);
     SCHED_REQUIRE(szComment, "((void *)0) != szComment", -1);
     SCHED_REQUIRE(cbComment > 0, "0 < cbComment", -1);

@@ -56,10 +56,12 @@ typedef struct TAVIAUTOPOWER {
     uint8_t minute;   /* 0-59 */
 } TAVIAUTOPOWER;
 
-/* Reads a kind's entries in order, `max` at most. Returns their number, 0 also without a
- * configuration. -1 with error 0x4000 for an entry that is damaged. */
+/* Reads a kind's entries in order, `max` and TAVI_AUTOPOWER_MAX_ENTRIES at most. Returns their
+ * number, 0 also without a configuration. -1 with error 0x4000 for an entry that is missing or
+ * damaged. */
 PLATC_API int TAVIAutoPowerConfGet(int kind, int max, TAVIAUTOPOWER *rgEntries);
-/* Replaces a kind's entries. More than TAVI_AUTOPOWER_MAX_ENTRIES are kept as well. */
+/* Replaces a kind's entries. More than TAVI_AUTOPOWER_MAX_ENTRIES are kept as well, but as they are
+ * not read they last only until the kind is written again. */
 PLATC_API int TAVIAutoPowerConfSet(int kind, int count, const TAVIAUTOPOWER *rgEntries);
 /* Arms the real-time clock to switch the machine on at the next time of all enabled power-on
  * entries, or disarms it when there is none. -1 with error 0x0900 when there is something to arm

@@ -4,8 +4,10 @@
 #include "platform.h"
 #include "tavisdk.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -35,6 +37,7 @@ bool isKind(int kind) {
 // ---- Configuration: a pair an entry, "000=enabled week-bits hour minute" ----
 
 using Hash = std::unique_ptr<PLATCSZHASH, decltype(&PLATCSzHashFree)>;
+using List = std::unique_ptr<PLATCSZLIST, decltype(&PLATCSzListFree)>;
 
 std::string entryKey(int index) {
     std::array<char, 16> key{};
@@ -42,30 +45,52 @@ std::string entryKey(int index) {
     return key.data();
 }
 
-bool parseEntry(const char *text, TAVIAUTOPOWER &entry) {
-    char rest = '\0';
-    return std::sscanf(text, "%hhu %hhu %hhu %hhu%c", &entry.enabled, &entry.weekBits, &entry.hour,
-                       &entry.minute, &rest) == 4;
+// Four numbers from 0 to 255 with single blanks between them.
+bool parseEntry(std::string_view text, TAVIAUTOPOWER &entry) {
+    const char *at = text.data();
+    const char *const end = at + text.size();
+    for (uint8_t *field : {&entry.enabled, &entry.weekBits, &entry.hour, &entry.minute}) {
+        if (field != &entry.enabled && (at == end || *at++ != ' ')) {
+            return false;
+        }
+        const auto parsed = std::from_chars(at, end, *field);
+        if (parsed.ec != std::errc()) {
+            return false;
+        }
+        at = parsed.ptr;
+    }
+    return at == end;
 }
 
+int refuseConfiguration(int kind, const std::string &key) {
+    PLATFORM_LOG("%s: entry [%s] in [%s] is missing or damaged", kConfiguration, key.c_str(),
+                 kSections[static_cast<size_t>(kind)]);
+    return PLATFORM_FAIL(platform::kBadFormat);
+}
+
+// How many pairs the section has, read into the hash; 0 without a configuration.
+int readSection(int kind, PLATCSZHASH **pairs) {
+    if (!PLATCFileExist(kConfiguration)) {
+        return 0;
+    }
+    List keys(PLATCSzListAlloc(TAVI_AUTOPOWER_MAX_ENTRIES), PLATCSzListFree);
+    PLATCSZLIST *list = keys.get();
+    const int found =
+        PLATCFileGetSection(kConfiguration, kSections[static_cast<size_t>(kind)], pairs);
+    return found <= 0 ? found : PLATCSzHashEnumKey(*pairs, &list);
+}
+
+// A gap in the numbering would hide the entries behind it, and the next change would erase them.
 int readEntries(int kind, int max, TAVIAUTOPOWER *entries) {
     Hash hash(PLATCSzHashAlloc(max), PLATCSzHashFree);
     PLATCSZHASH *pairs = hash.get();
-    const int found = pairs && PLATCFileExist(kConfiguration)
-                          ? PLATCFileGetSection(kConfiguration, kSections[kind], &pairs)
-                          : 0;
-    if (!pairs || found < 0) {
-        return -1;
-    }
-    int count = 0;
-    for (; count < max; ++count) {
-        const char *const text = PLATCSzHashGetValue(pairs, entryKey(count).c_str());
-        if (!text) {
-            break;
-        }
-        if (!parseEntry(text, entries[count])) {
-            PLATFORM_LOG("%s: bad entry [%s] in [%s]", kConfiguration, text, kSections[kind]);
-            return PLATFORM_FAIL(platform::kBadFormat);
+    const int stored = pairs ? readSection(kind, &pairs) : -1;
+    const int count = std::min(stored, max);
+    for (int i = 0; i < count; ++i) {
+        const std::string key = entryKey(i);
+        const char *const text = PLATCSzHashGetValue(pairs, key.c_str());
+        if (!text || !parseEntry(text, entries[i])) {
+            return refuseConfiguration(kind, key);
         }
     }
     return count;
@@ -82,20 +107,22 @@ int writeEntries(int kind, int count, const TAVIAUTOPOWER *entries) {
             return -1;
         }
     }
-    const int replaced = PLATCFileExist(kConfiguration)
-                             ? PLATCFileSetSection(kConfiguration, kSections[kind], pairs)
-                             : 0;
+    const int replaced =
+        PLATCFileExist(kConfiguration)
+            ? PLATCFileSetSection(kConfiguration, kSections[static_cast<size_t>(kind)], pairs)
+            : 0;
     if (replaced != 0) {
         return replaced < 0 ? -1 : 0;
     }
-    return PLATCFileAddSection(kConfiguration, kSections[kind], pairs) < 0 ? -1 : 0;
+    return PLATCFileAddSection(kConfiguration, kSections[static_cast<size_t>(kind)], pairs) < 0 ? -1
+                                                                                                : 0;
 }
 
 // ---- Wake alarm ----
 
 // The first time after now at which an enabled entry switches the machine on.
 std::optional<time_t> nextTime(const TAVIAUTOPOWER &entry, time_t now) {
-    if (entry.enabled != 1 || entry.hour > 23 || entry.minute > 59) {
+    if (entry.enabled != 1 || entry.weekBits > kEveryDay || entry.hour > 23 || entry.minute > 59) {
         return std::nullopt;
     }
     tm today{};
@@ -128,8 +155,8 @@ bool writeWakeAlarm(int fd, time_t time) {
 int armClock(std::optional<time_t> wake) {
     const platform::UniqueFd clock(open(kWakeAlarm, O_WRONLY | O_CLOEXEC));
     if (clock.get() == -1) {
-        if (!wake && errno == ENOENT) {
-            return 0;
+        if (!wake && (errno == ENOENT || errno == EROFS || errno == ENODEV || errno == ENXIO)) {
+            return 0; // there is no clock that could have been armed
         }
         PLATFORM_LOG("power-on cannot be armed: %s: %m", kWakeAlarm);
         return PLATFORM_FAIL(platform::kOpenFailed);
@@ -156,11 +183,13 @@ std::string dayField(unsigned int weekBits) {
     return days;
 }
 
-// cron would ignore the whole file for one bad line.
+// cron would ignore the whole file for one bad line; a command that is longer makes a line bad,
+// too.
 bool cronTakes(const TAVISCHEDULE &schedule) {
+    constexpr size_t kMaxCommand = 998;
+    const size_t length = strnlen(schedule.szCommand, sizeof schedule.szCommand);
     return schedule.weekBits <= kEveryDay && schedule.hour >= 0 && schedule.hour <= 23 &&
-           schedule.minute >= 0 && schedule.minute <= 59 && schedule.szCommand[0] != '\0' &&
-           memchr(schedule.szCommand, '\0', sizeof schedule.szCommand) &&
+           schedule.minute >= 0 && schedule.minute <= 59 && length > 0 && length <= kMaxCommand &&
            !std::strchr(schedule.szCommand, '\n');
 }
 
@@ -173,31 +202,25 @@ int addLine(const std::string &line) {
     if (!text.empty() && text.back() != '\n') {
         text += '\n';
     }
-    return platform::replaceWatchedFile(kCrontab, text + line + "\n");
+    return platform::replaceWatchedFile(kCrontab, text + line);
 }
 
-// The content without the lines that hold the text.
-std::string withoutLines(const std::string &content, std::string_view text) {
-    std::string kept;
-    for (size_t begin = 0; begin < content.size();) {
-        const size_t feed = content.find('\n', begin);
-        const size_t length = (feed == std::string::npos ? content.size() : feed + 1) - begin;
-        const std::string_view line(content.data() + begin, length);
-        if (line.find(text) == std::string_view::npos) {
-            kept += line;
-        }
-        begin += length;
-    }
-    return kept;
-}
-
-int removeLines(const char *program) {
+// Removes the lines of which the predicate is true; the lines come with their line feed.
+template <typename Predicate> int removeLines(Predicate &&isRemoved) {
     const auto content = platform::readFile(kCrontab);
     if (!content) {
         return -1;
     }
-    const std::string kept = withoutLines(content->text, program);
-    return kept == content->text ? 0 : platform::replaceWatchedFile(kCrontab, kept);
+    const std::string_view text = content->text;
+    std::string kept;
+    for (size_t begin = 0; begin < text.size();) {
+        const size_t feed = text.find('\n', begin);
+        const std::string_view line =
+            text.substr(begin, feed == std::string_view::npos ? feed : feed + 1 - begin);
+        kept += isRemoved(line) ? std::string_view() : line;
+        begin += line.size();
+    }
+    return kept.size() == text.size() ? 0 : platform::replaceWatchedFile(kCrontab, kept);
 }
 
 // No cron is running when there is no file with its process id.
@@ -254,13 +277,12 @@ int TAVIScheduleSet(const TAVISCHEDULE *pSchedule, int enable) {
     }
     return guarded(
         [&] {
-            const std::string line =
-                std::to_string(pSchedule->minute) + "\t" + std::to_string(pSchedule->hour) +
-                "\t*\t*\t" + dayField(pSchedule->weekBits) + "\troot\t" + pSchedule->szCommand;
-            if (enable != 0) {
-                return addLine(line);
-            }
-            return PLATCFileSetLine(kCrontab, line.c_str(), nullptr) < 0 ? -1 : 0;
+            const std::string line = std::to_string(pSchedule->minute) + "\t" +
+                                     std::to_string(pSchedule->hour) + "\t*\t*\t" +
+                                     dayField(pSchedule->weekBits) + "\troot\t" +
+                                     pSchedule->szCommand + "\n";
+            return enable != 0 ? addLine(line)
+                               : removeLines([&](std::string_view other) { return other == line; });
         },
         -1);
 }
@@ -271,7 +293,10 @@ int TAVIUpdateCrontab(const char *szProgram, int keepLines, int tellCronToo) {
     }
     return guarded(
         [&] {
-            if (keepLines == 0 && removeLines(szProgram) != 0) {
+            const auto holdsProgram = [&](std::string_view line) {
+                return line.find(szProgram) != std::string_view::npos;
+            };
+            if (keepLines == 0 && removeLines(holdsProgram) != 0) {
                 return -1;
             }
             if (tellCronToo != 0 && PLATCFileExist(kCronPid)) {

@@ -103,12 +103,18 @@ class WaitingSignals {
 };
 
 // Root may have come with groups of its own; any other owner's were set when the user was switched.
+// A root that may not set groups, as in a user namespace, could not have come by others either.
+bool takeRootsGroups(const TAVIUSER &root) {
+    return (initgroups(root.szName, root.gid) == 0 || errno == EPERM) &&
+           setresgid(root.gid, root.gid, root.gid) == 0;
+}
+
 bool takeEffectiveIdentity(const TAVIUSER *owner) {
+    const gid_t group = getegid();
     const uid_t user = geteuid();
-    const bool isRoot = user == 0 && owner;
-    const gid_t group = isRoot ? owner->gid : getegid();
-    return (!isRoot || initgroups(owner->szName, group) == 0) &&
-           setresgid(group, group, group) == 0 && setresuid(user, user, user) == 0;
+    const bool grouped =
+        user == 0 && owner ? takeRootsGroups(*owner) : setresgid(group, group, group) == 0;
+    return grouped && setresuid(user, user, user) == 0;
 }
 
 void markInheritedDescriptors() {

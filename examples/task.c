@@ -4,7 +4,7 @@
  *   task save FILE      stores the task that the file describes and prints its id
  *   task show ID        prints name, next run and last result
  *
- * Build: cc task.c -o task -ltavischeduler -ltaviplatform -lsqlite3
+ * Build: cc task.c -o task $(pkg-config --cflags --libs tavischeduler sqlite3)
  */
 #include <platc.h>
 #include <sqlite3.h>

@@ -10,6 +10,7 @@
  * else 0.
  */
 #ifndef TAVI_SCHED_GET_INT
+#include "tavischeduler.h"
 #define TAVI_SCHED_GET_INT(X, field)                                                               \
     TAVI_SCHED_API int TAVISchedCTaskGet##X(int *pVal, const TAVI_SCHED_TASK *pTask);
 #define TAVI_SCHED_GET_TEXT(X, field)                                                              \

@@ -11,6 +11,7 @@
  * size.
  */
 #ifndef TAVI_SCHED_SET_INT
+#include "tavischeduler.h"
 #define TAVI_SCHED_SET_INT(X, field)                                                               \
     TAVI_SCHED_API int TAVISchedCTaskSet##X(TAVI_SCHED_TASK *pTask, int value);
 #define TAVI_SCHED_SET_FLAG(X, field)                                                              \

@@ -1,6 +1,8 @@
 // A task's hash form, and the list sort, which reads the same field table.
 #include "support.h"
 
+#include <sstream>
+
 namespace {
 
 using namespace support;
@@ -10,20 +12,24 @@ class Convert : public SchedTest {
     Convert() : hash_(PLATCSzHashAlloc(64)) {}
     ~Convert() override { PLATCSzHashFree(hash_); }
 
-    std::string value(const char *key) {
-        const char *const text = PLATCSzHashGetValue(hash_, key);
-        return text ? text : "(none)";
+    // The texts of these keys, each followed by a semicolon.
+    std::string values(const std::vector<const char *> &keys) {
+        std::string result;
+        for (const char *key : keys) {
+            const char *const text = PLATCSzHashGetValue(hash_, key);
+            result += (text ? text : "(none)") + std::string(";");
+        }
+        return result;
     }
-    void set(const char *key, const char *text) { PLATCSzHashSetValue(&hash_, key, text); }
-    // A hash with every required key.
-    void fill() {
-        for (const char *key : {"name", "app", "app name", "action", "cmd", "type"}) {
-            set(key, "");
+    // Sets values from a text of the form "key=value;key=value;".
+    void set(const std::string &text) {
+        std::istringstream pairs(text);
+        for (std::string key, value; getline(pairs, key, '=') && getline(pairs, value, ';');) {
+            PLATCSzHashSetValue(&hash_, key.c_str(), value.c_str());
         }
-        for (const char *key : {"id", "run hour", "run min"}) {
-            set(key, "0");
-        }
-        set("state", "disabled");
+    }
+    void setRequired() {
+        set("name=;app=;app name=;action=;cmd=;type=;id=0;run hour=0;run min=0;state=disabled;");
     }
 
     PLATCSZHASH *hash_;
@@ -35,17 +41,11 @@ TEST_F(Convert, HashHoldsEveryPersistentFieldOnOneLine) {
     TAVISchedCTaskSetAppArgs(task.get(), "{\n}\n");
     task->owner = 4294967295;
     task->id = -5;
-    set("left over", "x");
+    set("left over=x;");
     EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, task.get()), 0);
-    EXPECT_EQ(value("name"), "a b");
-    EXPECT_EQ(value("app args"), "{ } ");
-    EXPECT_EQ(value("owner"), "4294967295");
-    EXPECT_EQ(value("id"), "-5");
-    EXPECT_EQ(value("cmd"), "ZWNobyAxCmVjaG8gMg==");
-    EXPECT_EQ(value("type") + value("state"), "dailyenabled");
-    for (const char *key : {"left over", "backend", "next trigger time"}) {
-        EXPECT_EQ(value(key), "(none)") << key;
-    }
+    EXPECT_EQ(values({"name", "app args", "owner", "id", "cmd", "type", "state"}),
+              "a b;{ } ;4294967295;-5;ZWNobyAxCmVjaG8gMg==;daily;enabled;");
+    EXPECT_EQ(values({"left over", "backend", "next trigger time"}), "(none);(none);(none);");
     TAVI_SCHED_TASK back{};
     EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &back), 0);
     EXPECT_STREQ(back.command, "echo 1\necho 2");
@@ -53,71 +53,46 @@ TEST_F(Convert, HashHoldsEveryPersistentFieldOnOneLine) {
 
     task->state = 5; // has no name, so its key is left out
     EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, task.get()), 0);
-    EXPECT_EQ(value("state"), "(none)");
+    EXPECT_EQ(values({"state"}), "(none);");
     EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &back), -1);
-    EXPECT_THAT(logs().back(), HasSubstr("Get hash value failed. key:[state]. [0x"));
+    EXPECT_THAT(lastLog(), HasSubstr("Get hash value failed. key:[state]. [0x"));
 }
 
 TEST_F(Convert, TaskTakesDefaultsClampsNumbersAndIgnoresStrangers) {
-    fill();
-    set("backend", "-3");
-    set("next trigger time", "soon");
-    set("can edit name", "2x");
-    set("type", "hourly");
-    set("start month", "");
-    set("id", "99999999999");
+    setRequired();
+    set("backend=-3;next trigger time=soon;can edit name=2x;type=hourly;start month=;"
+        "id=99999999999;");
     TAVI_SCHED_TASK task{};
     task.backend = -2;
-    task.type = TAVI_SCHED_TYPE_MONTHLY;
+    task.type = Monthly;
     EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &task), 0);
-    EXPECT_STREQ(task.week, "1111111");
-    EXPECT_STREQ(task.editDialog, "TAVI.VEX.TaskScheduler.EditDialog");
-    EXPECT_STREQ(task.nextTriggerTime, "");
-    EXPECT_EQ(task.startYear, 2012U);
-    EXPECT_EQ(task.startMonth, 0U);
-    EXPECT_EQ(task.canEditName, 2);
-    EXPECT_EQ(task.canRunTaskSameTime, 0);
-    EXPECT_EQ(task.type, TAVI_SCHED_TYPE_MONTHLY);
     EXPECT_EQ(task.backend, -2);
-    EXPECT_EQ(task.id, 2147483647);
-    for (const auto &[text, owner] :
-         std::vector<std::pair<const char *, uint32_t>>{{"1000", 1000},
-                                                        {"-1", 4294967295},
-                                                        {"4294967296", 4294967295},
-                                                        {"-4294967296", 4294967295},
-                                                        {"-18446744073709551615", 4294967295},
-                                                        {"99999999999999999999", 4294967295}}) {
-        set("owner", text);
+    EXPECT_STREQ(task.nextTriggerTime, "");
+    EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, &task), 0);
+    EXPECT_EQ(values({"week", "edit dialog", "start year", "start month", "can edit name",
+                      "can run task same time", "type", "id"}),
+              "1111111;TAVI.VEX.TaskScheduler.EditDialog;2012;0;2;0;monthly;2147483647;");
+    // A number that is no user's becomes nobody's, never root's or another's.
+    for (const char *owner :
+         {"-1", "4294967296", "-4294967296", "-18446744073709551615", "99999999999999999999"}) {
+        set("owner=" + std::string(owner) + ";");
         EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &task), 0);
-        EXPECT_EQ(task.owner, owner) << text;
+        EXPECT_EQ(task.owner, 4294967295) << owner;
     }
     EXPECT_THAT(logs(), IsEmpty());
 }
 
-TEST_F(Convert, FailuresAreReported) {
+TEST_F(Convert, BadValuesAreReported) {
     TAVI_SCHED_TASK task{};
-    PLATCSZHASH *none = nullptr;
-    EXPECT_EQ(TAVISchedInitHashFromTask(nullptr, nullptr), -1);
-    EXPECT_EQ(TAVISchedInitHashFromTask(&none, nullptr), -1);
-    EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, nullptr), -1);
-    EXPECT_EQ(TAVISchedInitTaskFromHash(nullptr, &task), -1);
-    EXPECT_THAT(
-        logs(),
-        ElementsAre("sched_task_convert.cpp:* Invaild Argument (((void *)0) != ppHash)=[0]\n",
-                    "sched_task_convert.cpp:* Invaild Argument (((void *)0) != *ppHash)=[0]\n",
-                    "sched_task_convert.cpp:* Invaild Argument (NULL != pTask)=[0]\n",
-                    "sched_task_convert.cpp:* Invaild Argument (((void *)0) != pHash)=[0]\n"));
-    fill();
-    set("start year", "2013x");
-    EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &task), -1);
-    EXPECT_EQ(PLATCErrGet(), 0x4000U);
-    EXPECT_THAT(logs(),
-                ElementsAre("sched_task_convert.cpp:* parm_table[12].fnFromHashStr failed."));
-    set("start year", "2013");
+    setRequired();
+    set("start year=2013x;");
+    EXPECT_EQ(failure(TAVISchedInitTaskFromHash(hash_, &task)), 0x4000U);
+    EXPECT_THAT(logs(), ElementsAre(HasSubstr("cpp:* parm_table[12].fnFromHashStr failed.")));
+    set("start year=2013;");
     // Cut at the field's end a text must fail: a shortened command must never run.
     for (const std::string &bad :
-         {std::string("dHJ1ZQ="), std::string("dHJ1 ZQ=="), std::string(16384, 'A')}) {
-        set("cmd", bad.c_str());
+         std::vector<std::string>{"dHJ1ZQ=", "dHJ1 ZQ==", std::string(16384, 'A')}) {
+        set("cmd=" + bad + ";");
         EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &task), -1);
         EXPECT_THAT(logs(), ElementsAre(HasSubstr("Base64 decoding failed. [" + bad.substr(0, 4))));
     }
@@ -159,25 +134,12 @@ TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
     EXPECT_THAT(logs(), IsEmpty());
 }
 
-TEST_F(Sort, FailuresLeaveTheListAlone) {
-    TAVI_SCHED_TASK *list = nullptr;
-    EXPECT_EQ(TAVISchedTaskListSort(&list, "id", 1), 0);
-    EXPECT_EQ(TAVISchedTaskListSortEx(&list, 0, 1), -1);
-    EXPECT_EQ(PLATCErrGet(), 0x0D00U);
-    EXPECT_EQ(TAVISchedTaskListSort(nullptr, nullptr, 1), -1);
-    EXPECT_EQ(TAVISchedTaskListSort(&list, nullptr, 1), -1);
+TEST_F(Sort, OutOfMemoryLeavesTheListAlone) {
     fakes.callocFails = 3 * sizeof(void *);
     EXPECT_EQ(sorted("name", 1), "8b 9B 10b ");
-    EXPECT_EQ(result_, -1);
-    EXPECT_EQ(PLATCErrGet(), 0x0100U);
+    EXPECT_EQ(failure(result_), 0x0100U);
     EXPECT_EQ(PLATCErrorGetLine(), 67);
-    fakes.callocFails = 0;
-    const std::string source = "sched_task_list_sort.cpp";
-    EXPECT_THAT(logs(true),
-                ElementsAre(source + ":59 Invaild Argument (NULL != *pTaskList)=[0]\n",
-                            source + ":125 Invaild Argument (((void *)0) != pTaskList)=[0]\n",
-                            source + ":125 Invaild Argument (NULL != szKey)=[0]\n",
-                            source + ":66 calloc [3] failed. Cannot allocate memory"));
+    EXPECT_THAT(lastLog(true), HasSubstr("cpp:66 calloc [3] failed. Cannot allocate memory"));
 }
 
 } // namespace

@@ -1,67 +1,45 @@
-// The schedule backend's lines of /etc/crontab.
+// The schedule backend's lines of /etc/crontab, and that Debian's cron starts tasks from them.
 #include "support.h"
 
+#include <csignal>
 #include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
 
 namespace {
 
 using namespace support;
 using namespace std::string_literals;
-
-class Crontab : public SchedTest {
-  protected:
-    static struct stat statusOf(const char *path) {
-        struct stat status {};
-        stat(path, &status);
-        return status;
-    }
-};
+using Crontab = SchedTest;
+using Cron = SchedTest;
 
 TEST_F(Crontab, LinesOfTasks) {
-    struct Case {
-        void (*change)(TAVI_SCHED_TASK &);
-        const char *line; // up to the user; nullptr: no line
+    constexpr const char *kNow = "2024-05-08 09:00";
+    // The list's buffer ends it, in front of the entry that does not fit.
+    constexpr const char *kWrapped = "0\t0,1000000000,2000000000,-1294967296,-294967296\t*\t*\t*\t";
+    constexpr const char *kLong =
+        "0\t100,101,102,103,104,105,106,107,108,109,110,111,112,113,114,115,116,117,118,119,120,"
+        "121,122,123,124,125,126,127,128,129,130,131\t*\t*\t*\t";
+    const When cases[] = {
+        {kNow, Daily, {}, {3, 30}, 0, 0, "", "30\t3\t*\t*\t*\t"},
+        {kNow, Weekly, {}, {}, 0, 0, "0100010", "0\t0\t*\t*\t1,5\t"},
+        {kNow, Weekly, {}, {}, 0, 0, "1x00001", "0\t0\t*\t*\t0,1,6\t"},
+        {kNow, Weekly, {}, {}, 0, 0, "0000000", "0\t0\t*\t*\t\t"},
+        {kNow, Monthly, {0, 0, 15}, {8, 0}, 4, 20, "", "0\t8,12,16,20\t15\t*\t*\t"},
+        {kNow, Yearly, {0, 12, 31}, {}, 0, 0, "", "0\t0\t31\t12\t*\t"},
+        {kNow, Once, {9, 2, 1}, {}, 0, 0, "", "0\t0\t1\t2\t*\t"},
+        {kNow, Daily, {}, {8, 0}, 5, 20, "", "0\t8,13,18\t*\t*\t*\t"},
+        {kNow, Daily, {}, {22, 0}, 3, 5, "", "0\t22\t*\t*\t*\t"},
+        {kNow, Daily, {}, {18, 5}, 1, 23, "", "5\t18,19,20,21,22,23\t*\t*\t*\t"},
+        {kNow, Daily, {}, {}, 1000000000, kLargest, "", kWrapped},
+        {kNow, Daily, {}, {100, 0}, 1, kLargest, "", kLong},
     };
-    const Case cases[] = {
-        {[](TAVI_SCHED_TASK &t) { t.runHour = 3, t.runMin = 30; }, "30\t3\t*\t*\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.state = 0; }, nullptr},
-        {[](TAVI_SCHED_TASK &t) { t.type = 2, TAVISchedCTaskSetWeek(&t, "0100010"); },
-         "0\t0\t*\t*\t1,5\t"},
-        {[](TAVI_SCHED_TASK &t) { t.type = 2, TAVISchedCTaskSetWeek(&t, "1x00001"); },
-         "0\t0\t*\t*\t0,1,6\t"},
-        {[](TAVI_SCHED_TASK &t) { t.type = 2, TAVISchedCTaskSetWeek(&t, "0000000"); },
-         "0\t0\t*\t*\t\t"},
-        {[](TAVI_SCHED_TASK &t) {
-             t.type = 3, t.startDay = 15, t.runHour = 8, t.repeatHour = 4, t.lastWorkHour = 20;
-         },
-         "0\t8,12,16,20\t15\t*\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.type = 4, t.startDay = 31, t.startMonth = 12; },
-         "0\t0\t31\t12\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.type = 0, t.startDay = 1, t.startMonth = 2, t.startYear = 9; },
-         "0\t0\t1\t2\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.runHour = 8, t.repeatHour = 5, t.lastWorkHour = 20; },
-         "0\t8,13,18\t*\t*\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.runHour = 22, t.repeatHour = 3, t.lastWorkHour = 5; },
-         "0\t22\t*\t*\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.repeatHour = 1, t.lastWorkHour = 23; },
-         "0\t0,1,2,3,4,5,6,7,8,9,10,11,12,13,14,15,16,17,18,19,20,21,22,23\t*\t*\t*\t"},
-        // The list's buffer ends it, in front of the entry that does not fit.
-        {[](TAVI_SCHED_TASK &t) { t.repeatHour = 1000000000, t.lastWorkHour = 4294967295; },
-         "0\t0,1000000000,2000000000,-1294967296,-294967296\t*\t*\t*\t"},
-        {[](TAVI_SCHED_TASK &t) { t.runHour = 100, t.repeatHour = 1, t.lastWorkHour = 4294967295; },
-         "0\t100,101,102,103,104,105,106,107,108,109,110,111,112,113,114,115,116,117,118,119,120,"
-         "121,122,123,124,125,126,127,128,129,130,131\t*\t*\t*\t"},
-    };
-    for (const Case &c : cases) {
-        Task task = newTask();
-        c.change(*task);
+    for (const When &row : cases) {
+        Task task = taskOf(row);
         ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
-        EXPECT_EQ(
-            readFile("/etc/crontab"),
-            std::string(kForeignCrontab) +
-                (c.line ? std::string(c.line) + "root\t/tmp/tavischedtask --run id=1\n" : ""));
+        EXPECT_EQ(readFile(kCrontab), std::string(kForeignCrontab) + row.expected +
+                                          "root\t/tmp/tavischedtask --run id=1\n");
+        TAVISchedCTaskSetState(task.get(), 0);
+        EXPECT_EQ(TAVISchedTaskEdit(task.get()), 0);
+        EXPECT_EQ(readFile(kCrontab), kForeignCrontab); // a disabled task has none
         EXPECT_EQ(TAVISchedTaskRemove(1), 0);
     }
 }
@@ -69,89 +47,115 @@ TEST_F(Crontab, LinesOfTasks) {
 TEST_F(Crontab, ForeignLinesOwnerAndModeStay) {
     storedTask();
     const std::string foreign = "A=b\n\n\xff bytes \0 here\n# /tmp/other\n@daily root x"s;
-    const std::string own = "0\t0\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n";
-    writeFile("/etc/crontab", "# /tmp/tavischedtask lines go\n9 9 * * * root "
-                              "/tmp/tavischedtask --run id=9\n" +
-                                  foreign);
-    chmod("/etc/crontab", 0640);
-    const bool owned = chown("/etc/crontab", 0, 7) == 0;
+    writeFile(kCrontab, "# /tmp/tavischedtask lines go\n9 9 * * * root "
+                        "/tmp/tavischedtask --run id=9\n" +
+                            foreign);
+    chmod(kCrontab, 0640);
+    const bool owned = chown(kCrontab, 0, 7) == 0;
     EXPECT_EQ(TAVISchedTaskSync(), 0);
-    EXPECT_EQ(readFile("/etc/crontab"), foreign + "\n" + own);
-    EXPECT_EQ(statusOf("/etc/crontab").st_mode & 07777, 0640U);
-    EXPECT_TRUE(!owned || statusOf("/etc/crontab").st_gid == 7);
+    EXPECT_EQ(readFile(kCrontab), foreign + "\n" + kOwnLine);
+    EXPECT_EQ(statusOf(kCrontab).st_mode & 07777, 0640U);
+    EXPECT_TRUE(!owned || statusOf(kCrontab).st_gid == 7);
     // Without a task the last line stays as it is, and again once there is nothing left to drop.
     TAVISchedTaskRemove(1);
-    EXPECT_EQ(readFile("/etc/crontab"), foreign + "\n");
-    writeFile("/etc/crontab", "last");
+    EXPECT_EQ(readFile(kCrontab), foreign + "\n");
+    writeFile(kCrontab, "last");
     EXPECT_EQ(TAVISchedTaskSync(), 0);
-    EXPECT_EQ(readFile("/etc/crontab"), "last");
+    EXPECT_EQ(readFile(kCrontab), "last");
 }
 
 TEST_F(Crontab, EveryRewriteIsLaterByAWholeSecond) {
     const timespec future[] = {{.tv_sec = 0, .tv_nsec = UTIME_NOW},
                                {.tv_sec = 4000000000, .tv_nsec = 999999999}};
-    utimensat(AT_FDCWD, "/etc/crontab", future, 0);
-    TAVISchedTaskSync();
-    EXPECT_EQ(statusOf("/etc/crontab").st_mtim.tv_sec, 4000000001);
-    TAVISchedTaskSync();
-    EXPECT_EQ(statusOf("/etc/crontab").st_mtim.tv_sec, 4000000002);
+    utimensat(AT_FDCWD, kCrontab, future, 0);
+    for (const time_t expected : {4000000001, 4000000002}) {
+        TAVISchedTaskSync();
+        EXPECT_EQ(statusOf(kCrontab).st_mtim.tv_sec, expected);
+    }
 }
 
 TEST_F(Crontab, CronIsSignalledWhenItRuns) {
-    fakes.systemIsCounted = true;
-    TAVISchedTaskSync();
-    EXPECT_EQ(systemCalls(), 0);
-    writeFile("/var/run/crond.pid", "1\n");
-    fakes.systemResult = 256;
-    EXPECT_EQ(SchedBackends[0].sync(), 0);
-    EXPECT_EQ(systemCalls(), 1);
-    EXPECT_THAT(logs(true),
-                ElementsAre("backends/backend_tavischedule.cpp:245 Failed to hup crond."));
+    const pid_t cron = fork();
+    if (cron == 0) {
+        alarm(5);
+        pause();
+    }
+    writeFile("/var/run/crond.pid", std::to_string(cron) + "\n");
+    storedTask();
+    int status = 0;
+    EXPECT_EQ(waitpid(cron, &status, 0), cron);
+    EXPECT_EQ(status, SIGHUP);
+    EXPECT_EQ(SchedBackends[0].sync(), 0); // it is gone
+    EXPECT_THAT(logs(true), ElementsAre(HasSubstr("tavischedule.cpp:245 Failed to hup crond.")));
 }
 
 // A failed rewrite answers the number of tasks, and the change counts as done.
 TEST_F(Crontab, FailedRewritesKeepTheOldFile) {
     struct Case {
-        const char *name;
         void (*arrange)();
         unsigned int code;
         int line;
+        bool keeps; // there is an old file
     };
     const Case cases[] = {
-        {"fsync", [] { fakes.fsyncFails = true; }, 0x0B00, 231},
-        {"rename", [] { fakes.renameFails = true; }, 0x2800, 240},
-        {"folder", [] { shell("rm /etc/crontab; mkdir /etc/crontab"); }, 0x0900, 179},
-        {"missing", [] { shell("rmdir /etc/crontab"); }, 0x1234, 7},
+        {[] { fakes.fsyncFails = true; }, 0x0B00, 231, true},
+        {[] { fakes.renameFails = true; }, 0x2800, 240, true},
+        // A full disk shows when the lines are flushed.
+        {[] {
+             shell("cp /etc/crontab /tmp; mount -n -t tmpfs -o size=16k small /etc; "
+                   "cp /tmp/crontab /etc; dd if=/dev/zero of=/etc/filler bs=4k 2>/dev/null");
+         },
+         0x0B00, 225, true},
+        {[] { shell("umount -n /etc; rm /etc/crontab; mkdir /etc/crontab"); }, 0x0900, 179, false},
+        {[] { shell("rmdir /etc/crontab"); }, 0x1234, 7, false},
     };
     storedTask();
     storedTask();
-    const std::string crontab = readFile("/etc/crontab");
+    const std::string crontab = readFile(kCrontab);
     logs();
     for (const Case &c : cases) {
-        SCOPED_TRACE(c.name);
+        SCOPED_TRACE(c.line);
         c.arrange();
         PLATCErrSetEx(0x1234, "before.cpp", 7);
         EXPECT_EQ(SchedBackends[0].sync(), 2);
         fakes = {};
         EXPECT_EQ(PLATCErrGet(), c.code);
         EXPECT_EQ(PLATCErrorGetLine(), c.line);
-        EXPECT_THAT(logs(true),
-                    ElementsAre(HasSubstr("tavischedule.cpp:280 sync task list failed. [0x")));
+        EXPECT_THAT(logs(true), ElementsAre(HasSubstr("cpp:280 sync task list failed. [0x")));
         EXPECT_EQ(shell("ls /etc/crontab.*"), 2);
-        if (c.code == 0x0B00 || c.code == 0x2800) {
-            EXPECT_EQ(readFile("/etc/crontab"), crontab);
-        }
+        EXPECT_TRUE(!c.keeps || readFile(kCrontab) == crontab);
     }
-    // A full disk shows when the lines are flushed.
-    writeFile("/etc/crontab", kForeignCrontab);
-    ASSERT_EQ(shell("cp /etc/crontab /tmp && mount -n -t tmpfs -o size=16k small /etc && "
-                    "cp /tmp/crontab /etc && dd if=/dev/zero of=/etc/filler bs=4k 2>/dev/null"),
-              1);
-    EXPECT_EQ(SchedBackends[0].sync(), 2);
-    EXPECT_EQ(PLATCErrGet(), 0x0B00U);
-    EXPECT_EQ(PLATCErrorGetLine(), 225);
-    EXPECT_EQ(readFile("/etc/crontab"), kForeignCrontab);
-    shell("umount -n /etc");
+}
+
+TEST_F(Cron, RunsADueTaskAsItsOwner) {
+    if (access("/usr/sbin/cron", X_OK) != 0 || seteuid(1) != 0 || seteuid(0) != 0) {
+        GTEST_SKIP() << "needs root and cron";
+    }
+    ASSERT_EQ(symlink(RUNNER, "/tmp/tavischedtask"), 0);
+    chmod(kCrontab, 0644);
+    const pid_t cron = fork();
+    if (cron == 0) {
+        execl("/usr/sbin/cron", "cron", "-f", nullptr);
+        _exit(127);
+    }
+    while (access("/var/run/crond.pid", F_OK) != 0) {
+        shell("sleep 0.01");
+    }
+    // Due in the next minute, or the one after when that is about to begin.
+    const time_t due = time(nullptr) + 65;
+    Task task = newTask("id -un > /tmp/ran; exit 4");
+    task->owner = 1;
+    task->runHour = static_cast<uint32_t>(localtime(&due)->tm_hour);
+    task->runMin = static_cast<uint32_t>(localtime(&due)->tm_min);
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    const char *const finished = "SELECT status_code, comment FROM task_status WHERE status_code>2";
+    while (time(nullptr) < due + 60 && query(finished).empty()) {
+        shell("sleep 0.1");
+    }
+    kill(cron, SIGTERM);
+    waitForChildren();
+    EXPECT_EQ(query(finished), "7 4 ");
+    EXPECT_EQ(readFile("/tmp/ran"), "daemon\n");
 }
 
 } // namespace

@@ -11,12 +11,11 @@
 #include <filesystem>
 #include <fstream>
 #include <regex>
+#include <sqlite3.h>
 #include <sstream>
 #include <sys/mman.h>
 #include <sys/prctl.h>
-#include <sys/wait.h>
 #include <syslog.h>
-#include <unistd.h>
 
 namespace support {
 
@@ -28,7 +27,6 @@ namespace {
 struct Journal {
     std::atomic<size_t> logLength;
     std::atomic<size_t> pauseCount;
-    std::atomic<int> systemCalls;
     long pauses[4096];
     char log[4 << 20];
 };
@@ -62,13 +60,14 @@ std::vector<std::string> logs(bool stable) {
     return lines;
 }
 
+std::string lastLog(bool stable) {
+    const auto lines = logs(stable);
+    return lines.empty() ? "" : lines.back();
+}
+
 std::vector<long> pauses() {
     const size_t count = std::min<size_t>(journal().pauseCount.exchange(0), 4096);
     return {journal().pauses, journal().pauses + count};
-}
-
-int systemCalls() {
-    return journal().systemCalls.exchange(0);
 }
 
 std::string readFile(const std::string &path) {
@@ -80,8 +79,28 @@ void writeFile(const std::string &path, const std::string &content) {
     std::ofstream(path, std::ios::binary) << content;
 }
 
+struct stat statusOf(const char *path) {
+    struct stat status {};
+    lstat(path, &status);
+    return status;
+}
+
+std::string query(const std::string &sql) {
+    std::string result;
+    const auto append = [](void *text, int columns, char **values, char **) {
+        for (int i = 0; i < columns; ++i) {
+            *static_cast<std::string *>(text) += std::string(values[i] ? values[i] : "-") + " ";
+        }
+        return 0;
+    };
+    sqlite3 *const db = TAVISchedDBInit();
+    EXPECT_EQ(sqlite3_exec(db, sql.c_str(), append, &result, nullptr), SQLITE_OK) << sql;
+    sqlite3_close(db);
+    return result;
+}
+
 int shell(const std::string &command) {
-    const int status = next<int (*)(const char *)>("system")(command.c_str());
+    const int status = std::system(command.c_str());
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
@@ -90,13 +109,9 @@ void waitForChildren() {
     }
 }
 
-time_t localTime(int year, int month, int day, int hour, int minute) {
+time_t at(const char *moment) {
     tm broken{};
-    broken.tm_year = year - 1900;
-    broken.tm_mon = month - 1;
-    broken.tm_mday = day;
-    broken.tm_hour = hour;
-    broken.tm_min = minute;
+    strptime(moment, "%F %R", &broken);
     broken.tm_isdst = -1;
     return mktime(&broken);
 }
@@ -125,14 +140,35 @@ std::vector<int> listedIds() {
     return ids;
 }
 
+std::string resultOf(unsigned int backend, const Task &task, size_t room) {
+    int code = 0;
+    char comment[1024] = "";
+    const int result = SchedBackends[backend].run(task.get(), &code, comment, room);
+    return result == 0 ? std::to_string(code) + ":" + comment : "failed";
+}
+
+Task taskOf(const When &row) {
+    fakes.now = at(row.now);
+    Task task = newTask();
+    task->type = row.type;
+    task->startYear = row.start[0];
+    task->startMonth = row.start[1];
+    task->startDay = row.start[2];
+    task->runHour = row.run[0];
+    task->runMin = row.run[1];
+    task->repeatHour = row.every;
+    task->lastWorkHour = row.last;
+    TAVISchedCTaskSetWeek(task.get(), row.week);
+    return task;
+}
+
 void SchedTest::SetUp() {
     // Never across a mount point: a checkout below /tmp is there, as it is on the machine.
     shell("find /tmp /usr/tavi/etc /run -xdev -mindepth 1 -delete 2>/dev/null");
-    writeFile("/etc/crontab", kForeignCrontab);
-    fakes = {};
+    writeFile(kCrontab, kForeignCrontab);
+    setenv("TZ", "UTC", 1);
     logs();
     pauses();
-    systemCalls();
 }
 
 } // namespace support
@@ -145,10 +181,7 @@ time_t time(time_t *result) noexcept {
     timespec clock{};
     clock_gettime(CLOCK_REALTIME, &clock);
     const time_t now = fakes.now.value_or(clock.tv_sec);
-    if (result) {
-        *result = now;
-    }
-    return now;
+    return result ? *result = now : now;
 }
 
 tm *localtime(const time_t *time) noexcept {
@@ -159,21 +192,17 @@ tm *localtime(const time_t *time) noexcept {
 }
 
 void syslog(int priority, const char *format, ...) {
-    const int savedErrno = errno;
-    char line[16384];
-    va_list arguments;
-    va_start(arguments, format);
-    errno = savedErrno; // for %m
-    int length = vsnprintf(line, sizeof line, format, arguments);
-    va_end(arguments);
-    length = std::min<int>(length, sizeof line - 1);
-    if (priority != LOG_ERR) {
-        std::strcpy(line, "wrong priority");
-        length = static_cast<int>(std::strlen(line));
+    const int savedErrno = errno; // also for %m
+    char line[16384] = "wrong priority";
+    if (priority == LOG_ERR) {
+        va_list arguments;
+        va_start(arguments, format);
+        vsnprintf(line, sizeof line, format, arguments);
+        va_end(arguments);
     }
     auto &journal = support::journal();
-    std::memcpy(journal.log + journal.logLength.fetch_add(static_cast<size_t>(length) + 1), line,
-                static_cast<size_t>(length) + 1);
+    const size_t size = std::strlen(line) + 1;
+    std::memcpy(journal.log + journal.logLength.fetch_add(size), line, size);
     errno = savedErrno;
 }
 
@@ -188,12 +217,11 @@ int usleep(useconds_t microseconds) {
 }
 
 #ifdef __SANITIZE_ADDRESS__
-void *__interceptor_calloc(size_t count, size_t size);
 #define REAL_CALLOC __interceptor_calloc
 #else
-void *__libc_calloc(size_t count, size_t size);
 #define REAL_CALLOC __libc_calloc
 #endif
+void *REAL_CALLOC(size_t count, size_t size);
 
 void *calloc(size_t count, size_t size) noexcept {
     if (fakes.callocFails > 0 && count * size >= fakes.callocFails) {
@@ -204,27 +232,14 @@ void *calloc(size_t count, size_t size) noexcept {
 }
 
 int rename(const char *from, const char *to) noexcept {
-    if (fakes.renameFails) {
-        errno = EXDEV;
-        return -1;
-    }
-    return support::next<int (*)(const char *, const char *)>("rename")(from, to);
+    auto *const real = support::next<int (*)(const char *, const char *)>("rename");
+    errno = EXDEV;
+    return fakes.renameFails ? -1 : real(from, to);
 }
 
 int fsync(int fd) {
-    if (fakes.fsyncFails) {
-        errno = EIO;
-        return -1;
-    }
-    return support::next<int (*)(int)>("fsync")(fd);
-}
-
-int system(const char *command) {
-    if (fakes.systemIsCounted) {
-        ++support::journal().systemCalls;
-        return fakes.systemResult;
-    }
-    return support::next<int (*)(const char *)>("system")(command);
+    errno = EIO;
+    return fakes.fsyncFails ? -1 : support::next<int (*)(int)>("fsync")(fd);
 }
 
 } // extern "C"
@@ -235,11 +250,11 @@ int main(int argc, char **argv) {
         return std::strncmp(argument, "--gtest_list_tests", 18) == 0;
     });
     if (!onlyList && (!sandbox || std::strcmp(sandbox, "inside") != 0)) {
-        std::vector<char *> arguments{const_cast<char *>(SANDBOX)};
         const std::string self = std::filesystem::canonical("/proc/self/exe");
-        arguments.push_back(const_cast<char *>(self.c_str()));
-        arguments.insert(arguments.end(), argv + 1, argv + argc + 1);
-        execv(SANDBOX, arguments.data());
+        std::vector<const char *> arguments(argv, argv + argc + 1);
+        arguments[0] = self.c_str();
+        arguments.insert(arguments.begin(), SANDBOX);
+        execv(SANDBOX, const_cast<char *const *>(arguments.data()));
         perror(SANDBOX);
         return 1;
     }

@@ -12,13 +12,24 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
 #include <vector>
 
 namespace support {
 
+using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+
+constexpr const char *kWorking = "/tmp/scheduled_tasks";
+constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+constexpr const char *kCrontab = "/etc/crontab";
+constexpr const char *kForeignCrontab = "SHELL=/bin/sh\n17 *\t* * *\troot\ttrue\n";
+// The line of a task with id 1 that has the default schedule.
+constexpr const char *kOwnLine = "0\t0\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n";
 
 // What the functions that this program defines do; copied into forked children.
 struct Fakes {
@@ -27,8 +38,6 @@ struct Fakes {
     size_t callocFails = 0; // a calloc of at least that many bytes fails; 0 = none
     bool renameFails = false;
     bool fsyncFails = false;
-    bool systemIsCounted = false; // system() runs nothing and is counted
-    int systemResult = 0;
     long pauseMicroseconds = 0; // how long sleep() and usleep() really last
 };
 extern Fakes fakes;
@@ -36,31 +45,55 @@ extern Fakes fakes;
 // Log lines since the last call, of this process and its children. A line's number stands only
 // where it is a stable one: `stable` keeps the numbers, else they are shown as "*".
 std::vector<std::string> logs(bool stable = false);
+// The last of them, or "".
+std::string lastLog(bool stable = false);
 // The arguments of all calls of sleep() and usleep() since the last call, in microseconds.
 std::vector<long> pauses();
-int systemCalls();
 
+// The error code of a call that failed; 0 for one that did not.
+inline unsigned int failure(int result) {
+    return result == -1 ? PLATCErrGet() : 0;
+}
 std::string readFile(const std::string &path);
 void writeFile(const std::string &path, const std::string &content);
+struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Executes on the status database; all values, each followed by a blank.
+std::string query(const std::string &sql);
 // Waits until all detached children of this process have ended.
 void waitForChildren();
-time_t localTime(int year, int month, int day, int hour, int minute);
+// "2024-05-08 09:00" in local time.
+time_t at(const char *moment);
 
+using Texts = std::vector<std::pair<const char *, const char *>>;
 using Task = std::unique_ptr<TAVI_SCHED_TASK, int (*)(TAVI_SCHED_TASK *)>;
 // A new task with defaults and a command.
 Task newTask(const char *command = "true");
 // The same, stored; the id is in the task.
 Task storedTask(const char *command = "true");
 std::vector<int> listedIds();
+// Runs the task's command in a backend's way, with so much room: "code:comment", or "failed".
+std::string resultOf(unsigned int backend, const Task &task, size_t room = 1024);
+
+constexpr uint32_t kLargest = 4294967295;
+enum { Once, Daily, Weekly, Monthly, Yearly };
+
+// A row of a table of dates: a moment, a task's start date, run hour and minute, repeat hour, last
+// work hour and week, and what comes of them.
+struct When {
+    const char *now;
+    int type;
+    uint32_t start[3], run[2], every, last;
+    const char *week, *expected;
+};
+// The row's task, new; the row's moment becomes the present.
+Task taskOf(const When &row);
 
 class SchedTest : public testing::Test {
   protected:
     void SetUp() override;
     void TearDown() override { fakes = {}; }
 };
-
-constexpr const char *kForeignCrontab = "SHELL=/bin/sh\n17 *\t* * *\troot\ttrue\n";
 
 } // namespace support

@@ -23,28 +23,39 @@ bool isOurs(const struct stat &status, mode_t kind) {
            (kind == S_IFDIR || status.st_nlink == 1);
 }
 
-// Moves what is there into a folder of our own, where nobody can change it any more, and removes
-// it. It may meanwhile be a proper file that another process has made: that one goes back.
-int moveAwayAndRemove(const std::string &path) {
-    std::string folder = path + ".XXXXXX";
+int makeEmpty(const char *path) {
+    const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    return fd == -1 ? -1 : close(fd);
+}
+
+int exchange(const std::string &ours, const char *path) {
+    return renameat2(AT_FDCWD, ours.c_str(), AT_FDCWD, path, RENAME_EXCHANGE);
+}
+
+// Puts an empty file of our own in the place of what is there, in one step: were the name free for
+// a moment, a user who waits for that would take it again. What was there lands in a folder that
+// nobody else can enter and is removed; when another process has meanwhile made it a proper file,
+// it goes back.
+int putOursInPlace(const char *path) {
+    std::string folder = std::string(path) + ".XXXXXX";
     if (!mkdtemp(folder.data())) {
         return -1;
     }
-    const std::string moved = folder + "/moved";
-    const int result = rename(path.c_str(), moved.c_str()) == 0 || errno == ENOENT ? 0 : -1;
-    const int renameErrno = errno;
-    if (sched::checkSharedFile(moved.c_str()) == 1) {
-        (void)!link(moved.c_str(), path.c_str());
+    const std::string ours = folder + "/file";
+    const bool exchanged = makeEmpty(ours.c_str()) == 0 && exchange(ours, path) == 0;
+    const int exchangeErrno = errno;
+    if (exchanged && sched::checkSharedFile(ours.c_str()) == 1) {
+        exchange(ours, path);
     }
     std::error_code ignored;
     std::filesystem::remove_all(folder, ignored);
-    errno = renameErrno;
-    return result;
+    errno = exchangeErrno;
+    return exchanged || exchangeErrno == ENOENT ? 0 : -1;
 }
 
-int removeStrange(const char *path) {
+int replaceStrange(const char *path) {
     try {
-        return moveAwayAndRemove(path);
+        return putOursInPlace(path);
     } catch (const std::bad_alloc &) {
         errno = ENOMEM;
         return -1;
@@ -68,14 +79,7 @@ int sched::claimSharedFile(const char *path) {
         if (found == 1) {
             return 0;
         }
-        if (found < 0 && removeStrange(path) != 0) {
-            return -1;
-        }
-        const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-        if (fd != -1) {
-            return close(fd);
-        }
-        if (errno != EEXIST) {
+        if (found < 0 ? replaceStrange(path) != 0 : makeEmpty(path) != 0 && errno != EEXIST) {
             return -1;
         }
     }

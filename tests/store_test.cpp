@@ -148,6 +148,9 @@ TEST_F(Store, StrangeWorkingCopiesAreRefused) {
         EXPECT_EQ(readFile(kPersistent), "");
         EXPECT_EQ(readFile(kCrontab), kForeignCrontab);
     };
+    chmod(kWorking, 0666);
+    expectRefused();
+    chmod(kWorking, 0600);
     if (chown(kWorking, 4242, 4242) == 0) {
         expectRefused();
     }

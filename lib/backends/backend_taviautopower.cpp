@@ -2,6 +2,7 @@
 // nothing of its own: the auto-power configuration is the only store, and a task's id is computed
 // from the entry that it stands for, so that an edit changes the id.
 #include "platc.h"
+#include "sched_calendar.h"
 #include "sched_command.h"
 #include "sched_error.h"
 #include "sched_field.h"
@@ -99,7 +100,7 @@ std::optional<Entry> toEntry(const Task &task) {
     Entry entry{};
     entry.enabled = task.state == TAVI_SCHED_STATE_ENABLED ? 1 : 0;
     for (unsigned int day = 0; day < TAVI_SCHED_WEEK_DAYS; ++day) {
-        entry.weekBits |= task.week[day] != '0' ? 1U << day : 0U;
+        entry.weekBits |= sched::runsOnWeekDay(task, day) ? 1U << day : 0U;
     }
     entry.hour = static_cast<uint8_t>(task.runHour);
     entry.minute = static_cast<uint8_t>(task.runMin);

@@ -346,7 +346,8 @@ int SetTaskSection(int32_t id, const TAVI_SCHED_TASK *task) {
     const SectionName section = sectionName(id);
     if (sched::checkSharedFile(kWorkingCopy) < 0) {
         SCHED_SET_ERROR(sched::kOpenFailed);
-        SCHED_LOG("[%s] is refused: it is no file of root's or of this user's", kWorkingCopy);
+        SCHED_LOG("[%s] is refused: another user may have put it there or may write it",
+                  kWorkingCopy);
         return -1;
     }
     const bool exists = PLATCFileExist(kWorkingCopy) == 1;

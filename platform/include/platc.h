@@ -75,8 +75,9 @@ PLATC_API int PLATCFileSetLine(const char *szPath, const char *szMatch, const ch
  * the first "=", blanks included, and may hold any byte but a line feed; a key holds neither "="
  * nor a line feed and does not begin with "["; a name holds neither "]" nor a line feed. Other
  * lines are ignored and kept. Writers replace the file atomically, keeping owner and mode. In a
- * folder with the sticky bit, a file that is a link or belongs neither to root nor to the effective
- * user is refused with error 0x0900 and a log line: anybody may have put it there.
+ * folder with the sticky bit, a file is refused with error 0x0900 and a log line when it is a link,
+ * belongs neither to root nor to the effective user, or may be written by everybody: anybody may
+ * have put there what it says.
  */
 
 /* Empties the list, then lists the names of all sections in file order. Returns their number. */

@@ -71,6 +71,9 @@ int checkOpened(const std::string &path, bool shared, const struct stat &status)
     if (shared && status.st_uid != 0 && status.st_uid != geteuid()) {
         return refuse(path, "it lies in a shared folder and belongs to another user");
     }
+    if (shared && (status.st_mode & S_IWOTH) != 0) {
+        return refuse(path, "it lies in a shared folder and everybody may write it");
+    }
     return 0;
 }
 
@@ -87,8 +90,11 @@ bool copyOwnerAndMode(int fd, const struct stat &old) {
 
 bool makeLater(int fd, const struct stat &old) {
     struct stat status {};
-    if (fstat(fd, &status) != 0 || status.st_mtim.tv_sec > old.st_mtim.tv_sec) {
-        return true; // later already; a file without status fails elsewhere
+    if (fstat(fd, &status) != 0) {
+        return false;
+    }
+    if (status.st_mtim.tv_sec > old.st_mtim.tv_sec) {
+        return true;
     }
     const timespec times[] = {{.tv_sec = 0, .tv_nsec = UTIME_OMIT},
                               {.tv_sec = old.st_mtim.tv_sec + 1, .tv_nsec = 0}};

@@ -29,8 +29,9 @@ struct FileContent {
     struct stat status {}; // taken before the text was read
 };
 
-// Reads a regular file. In a folder with the sticky bit it must be no link and belong to root or to
-// the effective user. Nothing with the error state set, and a log line when the file was refused.
+// Reads a regular file. In a folder with the sticky bit it must be no link, belong to root or to
+// the effective user, and not be writable by everybody. Nothing with the error state set, and a log
+// line when the file was refused.
 std::optional<FileContent> readFile(const std::string &path);
 
 // Replaces the file through a temporary file in its folder, keeping owner and mode; a new file gets

@@ -183,10 +183,9 @@ std::string dayField(unsigned int weekBits) {
     return days;
 }
 
-// cron would ignore the whole file for one bad line; a command that is longer makes a line bad,
-// too.
+// cron would ignore the whole file for one bad line.
 bool cronTakes(const TAVISCHEDULE &schedule) {
-    constexpr size_t kMaxCommand = 998;
+    constexpr size_t kMaxCommand = 998; // cron refuses a longer one
     const size_t length = strnlen(schedule.szCommand, sizeof schedule.szCommand);
     return schedule.weekBits <= kEveryDay && schedule.hour >= 0 && schedule.hour <= 23 &&
            schedule.minute >= 0 && schedule.minute <= 59 && length > 0 && length <= kMaxCommand &&

@@ -79,7 +79,9 @@ int sched::claimSharedFile(const char *path) {
         if (found == 1) {
             return 0;
         }
-        if (found < 0 ? replaceStrange(path) != 0 : makeEmpty(path) != 0 && errno != EEXIST) {
+        const bool failed =
+            found < 0 ? replaceStrange(path) != 0 : makeEmpty(path) != 0 && errno != EEXIST;
+        if (failed) {
             return -1;
         }
     }

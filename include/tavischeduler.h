@@ -243,6 +243,10 @@ TAVI_SCHED_API void TAVISchedTaskListFree(TAVI_SCHED_TASK **pTaskList);
 /* Brings every backend's outside state (crontab) in line with its tasks. Backends that fail are
  * only logged. */
 TAVI_SCHED_API int TAVISchedTaskSync(void);
+/* Writes the line, without line feed, that stands for an enabled task of the schedule backend in
+ * /etc/crontab. The fields are the task's as they are, also when cron would reject them. 256 bytes
+ * hold every line; 0x0D00 for a smaller buffer that does not. */
+TAVI_SCHED_API int TAVISchedCrontabLine(const TAVI_SCHED_TASK *pTask, char *szBuf, size_t cbBuf);
 
 /* Sorts a list by a row of the field table, 0 to 30 (not checked). Direction 1 is ascending, any
  * other the exact reverse. Text fields order by their bytes. Number fields order by where the tasks

@@ -79,6 +79,7 @@ class CrontabLine {
         add("root\t%s --run id=%ld", kRunner, static_cast<long>(task.id));
     }
     const char *c_str() const { return text_.data(); }
+    size_t size() const { return length_; }
 
   private:
     [[gnu::format(printf, 2, 3)]] void add(const char *format, ...) {
@@ -266,5 +267,14 @@ int sched::rewriteCrontab(const TAVI_SCHED_TASK *tasks) {
         return -1;
     }
     signalCron();
+    return 0;
+}
+
+int TAVISchedCrontabLine(const TAVI_SCHED_TASK *pTask, char *szBuf, size_t cbBuf) {
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
+    SCHED_REQUIRE(szBuf, "((void *)0) != szBuf", -1);
+    const CrontabLine line(*pTask);
+    SCHED_REQUIRE(cbBuf > line.size(), "length < cbBuf", -1);
+    std::memcpy(szBuf, line.c_str(), line.size() + 1);
     return 0;
 }

@@ -1,0 +1,41 @@
+// The two ways in which a command ends without success. main() prints the text and exits with the
+// status.
+#pragma once
+
+#include "platc.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <stdexcept>
+#include <string>
+
+namespace tavisched {
+
+// The input is not accepted, and nothing was changed.
+struct Refusal : std::runtime_error {
+    using runtime_error::runtime_error;
+    static constexpr int kExitStatus = 2;
+};
+
+// The machine did not go along.
+struct Failure : std::runtime_error {
+    using runtime_error::runtime_error;
+    static constexpr int kExitStatus = 1;
+};
+
+// What the library's error state tells, for the end of a message.
+inline std::string libraryError() {
+    std::array<char, 64> code{};
+    std::snprintf(code.data(), code.size(), "error 0x%04X (", PLATCErrGet());
+    return code.data() + std::string(PLATCErrorGetFile()) + ":" +
+           std::to_string(PLATCErrorGetLine()) + "); --verbose tells more";
+}
+
+// What errno tells of the system call that failed.
+inline std::string systemReason() {
+    return std::strerror(errno);
+}
+
+} // namespace tavisched

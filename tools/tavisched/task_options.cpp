@@ -1,0 +1,340 @@
+// What "add" and "edit" can say about a task. Every refusal names the option, what is wrong with it
+// and what is accepted.
+#include "task_options.h"
+#include "failure.h"
+#include "store.h"
+#include "task_rules.h"
+#include "text.h"
+#include "words.h"
+
+#include <algorithm>
+#include <array>
+#include <cctype>
+#include <charconv>
+#include <cstdio>
+#include <cstring>
+#include <ctime>
+#include <pwd.h>
+#include <string_view>
+#include <strings.h>
+
+namespace tavisched {
+
+namespace {
+
+// A year in which every day of the year is there.
+constexpr uint32_t kAnyYear = 2012;
+constexpr uint32_t kLastHour = 23;
+
+[[noreturn]] void refuse(const char *option, const std::string &what) {
+    throw Refusal(std::string(option) + ": " + what);
+}
+
+[[noreturn]] void refuseText(const char *option, std::string_view text, const char *accepted) {
+    refuse(option, "\"" + printable(text) + "\" is not accepted; accepted: " + accepted);
+}
+
+// Digits alone, at most so many.
+std::optional<uint32_t> parseNumber(std::string_view text, size_t digits) {
+    uint32_t number = 0;
+    const char *const end = text.data() + text.size();
+    const auto parsed = std::from_chars(text.data(), end, number);
+    const bool isNumber = parsed.ec == std::errc() && parsed.ptr == end && text.size() <= digits;
+    return isNumber ? std::optional(number) : std::nullopt;
+}
+
+uint32_t numberOption(const char *option, const std::string &text, uint32_t low, uint32_t high,
+                      const char *accepted) {
+    const auto number = parseNumber(text, 2);
+    if (!number || *number < low || *number > high) {
+        refuseText(option, text, accepted);
+    }
+    return *number;
+}
+
+// Numbers of at most four digits, as many as asked for, with one separator between them.
+template <size_t count>
+std::optional<std::array<uint32_t, count>> parseNumbers(std::string_view text, char separator) {
+    const auto parts = split(text, separator);
+    std::array<uint32_t, count> numbers{};
+    if (parts.size() != count) {
+        return std::nullopt;
+    }
+    for (size_t i = 0; i < count; ++i) {
+        const auto number = parseNumber(parts[i], 4);
+        if (!number) {
+            return std::nullopt;
+        }
+        numbers[i] = *number;
+    }
+    return numbers;
+}
+
+// ---- When ----
+
+void applyTime(const std::string &text, TAVI_SCHED_TASK &task) {
+    const auto time = parseNumbers<2>(text, ':');
+    const size_t colon = text.find(':');
+    if (!time || colon > 2 || text.size() - colon != 3 || (*time)[0] > kLastHour ||
+        (*time)[1] > 59) {
+        refuseText("--at", text, "HH:MM from 00:00 to 23:59");
+    }
+    task.runHour = (*time)[0];
+    task.runMin = (*time)[1];
+}
+
+void applyDaily(TAVI_SCHED_TASK &task) {
+    TAVISchedCTaskSetDaily(&task);
+    TAVISchedCTaskSetWeek(&task, "1111111");
+}
+
+void applyWeekDays(const std::string &text, TAVI_SCHED_TASK &task) {
+    for (const std::string &day : split(text, ',')) {
+        const bool isDay =
+            std::any_of(std::begin(TAVISchedWeekDayNames), std::end(TAVISchedWeekDayNames),
+                        [&](const char *name) { return strcasecmp(name, day.c_str()) == 0; });
+        if (!isDay) {
+            refuse("--weekly", "\"" + printable(day) +
+                                   "\" is no day of the week; accepted: a list such as Mon,Fri of "
+                                   "Sun, Mon, Tue, Wed, Thu, Fri, Sat");
+        }
+    }
+    TAVISchedCTaskSetWeekly(&task);
+    TAVISchedCTaskSetWeek(&task, TAVISchedMultiSelectFromText(text.c_str(), TAVISchedWeekDayNames,
+                                                              TAVI_SCHED_WEEK_DAYS));
+}
+
+void setStart(TAVI_SCHED_TASK &task, uint32_t year, uint32_t month, uint32_t day) {
+    task.startYear = year;
+    task.startMonth = month;
+    task.startDay = day;
+}
+
+void applyMonthDay(const std::string &text, TAVI_SCHED_TASK &task) {
+    setStart(task, kAnyYear, 1, numberOption("--monthly", text, 1, 31, "a day from 1 to 31"));
+    TAVISchedCTaskSetMonthly(&task);
+}
+
+bool isDay(uint32_t month, uint32_t day, std::optional<uint32_t> year = std::nullopt) {
+    return month >= 1 && month <= 12 && day >= 1 && day <= daysInMonth(month, year);
+}
+
+void applyYearDay(const std::string &text, TAVI_SCHED_TASK &task) {
+    const auto date = parseNumbers<2>(text, '-');
+    if (!date || !isDay((*date)[0], (*date)[1])) {
+        refuseText("--yearly", text, "MM-DD, a month and one of its days");
+    }
+    setStart(task, kAnyYear, (*date)[0], (*date)[1]);
+    TAVISchedCTaskSetYearly(&task);
+}
+
+void applyDate(const std::string &text, TAVI_SCHED_TASK &task) {
+    const auto date = parseNumbers<3>(text, '-');
+    if (!date || (*date)[0] < 1970 || !isDay((*date)[1], (*date)[2], (*date)[0])) {
+        refuseText("--once", text, "YYYY-MM-DD, a date of the calendar");
+    }
+    setStart(task, (*date)[0], (*date)[1], (*date)[2]);
+    TAVISchedCTaskSetOnce(&task);
+}
+
+// The interval in a day. An interval without an end goes on to the end of the day.
+void applyInterval(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    const bool repeated = task.repeatHour > 0;
+    if (options.every) {
+        task.repeatHour =
+            numberOption("--every", *options.every, 0, kLastHour, "hours from 1 to 23, or 0");
+    }
+    if (options.until) {
+        task.lastWorkHour =
+            numberOption("--until", *options.until, 0, kLastHour, "an hour from 00 to 23");
+        if (task.repeatHour == 0) {
+            refuse("--until", "it needs an interval, such as --every 4");
+        }
+    } else if (options.every && task.repeatHour > 0 && !repeated) {
+        task.lastWorkHour = kLastHour;
+    }
+    if (task.repeatHour > 0 && task.lastWorkHour < task.runHour &&
+        (options.every || options.until || options.at)) {
+        refuse("--until", "hour " + std::to_string(task.lastWorkHour) +
+                              " is before the first run of the day at hour " +
+                              std::to_string(task.runHour));
+    }
+}
+
+void applySchedule(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    if (options.at) {
+        applyTime(*options.at, task);
+    }
+    if (options.daily) {
+        applyDaily(task);
+    }
+    const struct {
+        const std::optional<std::string> &text;
+        void (*apply)(const std::string &, TAVI_SCHED_TASK &);
+    } kDays[] = {{options.weekly, applyWeekDays},
+                 {options.monthly, applyMonthDay},
+                 {options.yearly, applyYearDay},
+                 {options.once, applyDate}};
+    for (const auto &[text, apply] : kDays) {
+        if (text) {
+            apply(*text, task);
+        }
+    }
+    applyInterval(options, task);
+}
+
+// ---- What and who ----
+
+void applyOwner(const std::string &owner, TAVI_SCHED_TASK &task) {
+    const passwd *user = getpwnam(owner.c_str());
+    const auto uid = parseNumber(owner, 10);
+    if (!user && uid) {
+        user = getpwuid(*uid);
+    }
+    if (!user) {
+        refuse("--owner",
+               "there is no user \"" + printable(owner) + "\"; accepted: a user's name or number");
+    }
+    TAVISchedCTaskSetOwner(&task, static_cast<int>(user->pw_uid));
+}
+
+void requireText(const char *option, const std::string &text, size_t fieldSize) {
+    if (const auto fault = faultOfText(text, fieldSize)) {
+        refuse(option, *fault);
+    }
+}
+
+void applyTexts(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    if (options.name) {
+        if (options.name->empty()) {
+            refuse("--name", "it is empty; accepted: one line of text");
+        }
+        requireText("--name", *options.name, sizeof task.name);
+        TAVISchedCTaskSetName(&task, options.name->c_str());
+    }
+    if (options.app) {
+        requireText("--app", *options.app, sizeof task.app);
+        TAVISchedCTaskSetApp(&task, options.app->c_str());
+    }
+    if (options.command) {
+        if (options.command->find_first_not_of(" \t\n") == std::string::npos) {
+            refuse("--command", "it is empty; accepted: a command for the shell");
+        }
+        if (const auto fault = faultOfCommand(*options.command)) {
+            refuse("--command", *fault);
+        }
+        TAVISchedCTaskSetCommand(&task, options.command->c_str());
+    }
+    if (options.owner) {
+        applyOwner(*options.owner, task);
+    }
+}
+
+// A power schedule has days, a time and a state, and nothing else.
+void refuseWhatPowerLacks(const TaskOptions &options) {
+    const struct {
+        const char *option;
+        bool given;
+    } kOthers[] = {
+        {"--name", options.name.has_value()},       {"--command", options.command.has_value()},
+        {"--monthly", options.monthly.has_value()}, {"--yearly", options.yearly.has_value()},
+        {"--once", options.once.has_value()},       {"--every", options.every.has_value()},
+        {"--until", options.until.has_value()},     {"--owner", options.owner.has_value()},
+        {"--app", options.app.has_value()},         {"--allow-overlap", options.allowOverlap},
+        {"--no-overlap", options.noOverlap}};
+    for (const auto &[option, given] : kOthers) {
+        if (given) {
+            refuse(option, "a power schedule has none; accepted: --at, --daily, --weekly, "
+                           "--enabled, --disabled");
+        }
+    }
+}
+
+void applyPower(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    refuseWhatPowerLacks(options);
+    if (!options.power) {
+        return;
+    }
+    if (*options.power != "on" && *options.power != "off") {
+        refuseText("--power", *options.power, "on or off");
+    }
+    const std::string arguments = "power" + *options.power;
+    if (task.id != -1 && arguments != task.appArgs) {
+        refuse("--power", "a stored schedule keeps its kind; remove it and add another one");
+    }
+    TAVISchedCTaskSetAppArgs(&task, arguments.c_str());
+}
+
+void refuseConflicts(const TaskOptions &options) {
+    const int days = static_cast<int>(options.daily) + options.weekly.has_value() +
+                     options.monthly.has_value() + options.yearly.has_value() +
+                     options.once.has_value();
+    if (days > 1) {
+        throw Refusal("only one of --daily, --weekly, --monthly, --yearly and --once is accepted");
+    }
+    if (options.enabled && options.disabled) {
+        throw Refusal("only one of --enabled and --disabled is accepted");
+    }
+    if (options.allowOverlap && options.noOverlap) {
+        throw Refusal("only one of --allow-overlap and --no-overlap is accepted");
+    }
+}
+
+// A schedule that was just given and has no run ahead is a slip.
+void refusePast(TAVI_SCHED_TASK &task) {
+    if (TAVISchedNextTriggerTime(&task) != 0) {
+        throw Failure("the next run cannot be computed: " + libraryError());
+    }
+    if (std::string_view(task.nextTriggerTime) == "N/A") {
+        refuse("--once", scheduleInWords(task).substr(std::strlen("once on ")) +
+                             " has passed; accepted: a time in the future");
+    }
+}
+
+} // namespace
+
+bool TaskOptions::schedule() const {
+    return at || daily || weekly || monthly || yearly || once || every || until;
+}
+
+bool TaskOptions::any() const {
+    return schedule() || name || command || owner || app || power || enabled || disabled ||
+           allowOverlap || noOverlap;
+}
+
+void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    refuseConflicts(options);
+    if (isPower(task)) {
+        applyPower(options, task);
+    } else if (options.power) {
+        refuse("--power", "this is no power schedule");
+    }
+    applySchedule(options, task);
+    applyTexts(options, task);
+    if (options.enabled || options.disabled) {
+        TAVISchedCTaskSetState(&task, options.enabled ? 1 : 0);
+    }
+    if (options.allowOverlap || options.noOverlap) {
+        TAVISchedCTaskSetCanRunTaskSameTime(&task, options.allowOverlap ? 1 : 0);
+    }
+    if (const auto fault = findFault(task)) {
+        throw Refusal("the task's \"" + std::string(fault->key) + "\": " + fault->what);
+    }
+    if (options.schedule() || options.enabled) {
+        refusePast(task);
+    }
+}
+
+std::string remarkOn(const TAVI_SCHED_TASK &task) {
+    const bool missesMonths = task.type == TAVI_SCHED_TYPE_MONTHLY && task.startDay > 28;
+    const bool missesYears =
+        task.type == TAVI_SCHED_TYPE_YEARLY && task.startMonth == 2 && task.startDay == 29;
+    if (!missesMonths && !missesYears) {
+        return "";
+    }
+    return std::string(missesMonths ? "months" : "years") +
+           " without that day are passed over; the next run may be shown as the day after the end "
+           "of such a month";
+}
+
+} // namespace tavisched

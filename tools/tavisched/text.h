@@ -1,0 +1,24 @@
+// UTF-8 on a terminal: what may be printed, how wide it is, and where it can be cut.
+#pragma once
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace tavisched {
+
+bool isUtf8(std::string_view text);
+// Holds a control character or a line break of any kind. The text is UTF-8.
+bool holdsControls(std::string_view text);
+// The text as it may go to a terminal: what is no UTF-8, and control characters, become U+FFFD.
+std::string printable(std::string_view text);
+// The columns that a printable text takes.
+size_t widthOf(std::string_view text);
+// A printable text in at most so many columns (1 or more), cut between characters as people see
+// them.
+std::string cutTo(std::string_view text, size_t width);
+// Split at every separator; empty parts are kept.
+std::vector<std::string> split(std::string_view text, char separator);
+std::string join(const std::vector<std::string> &parts, std::string_view separator);
+
+} // namespace tavisched

@@ -106,7 +106,9 @@ bool isTrustedWorkingCopy(const struct stat &status) {
     return S_ISREG(status.st_mode) && status.st_uid == 0 && (status.st_mode & S_IWOTH) == 0;
 }
 
-void inspectTaskFiles(Findings &findings) {
+// Answers whether tasks can be read at all; else everything that follows from them would look
+// wrong.
+bool inspectTaskFiles(Findings &findings) {
     const auto working = statusOf(kWorkingCopy);
     const auto restore = [] { copyOver(kPersistent, kWorkingCopy); };
     if (working && !isTrustedWorkingCopy(*working)) {
@@ -115,22 +117,22 @@ void inspectTaskFiles(Findings &findings) {
                                 "that no task is read from it",
                             std::string("remove it, or replace it by ") + kPersistent,
                             isEmptyOrMissing(kPersistent) ? std::function<void()>() : restore});
-        return;
+        return false;
     }
     switch (compareCopies()) {
     case Copies::Same:
-        return;
+        break;
     case Copies::WorkingMissing:
         findings.push_back({std::string(kWorkingCopy) + ", from which tasks are read, is missing "
                                                         "or empty",
                             std::string("make it from ") + kPersistent, restore});
-        return;
+        return false;
     case Copies::PersistentMissing:
         findings.push_back({std::string(kPersistent) + " is missing, so that all tasks are lost "
                                                        "when the machine restarts",
                             std::string("make it from ") + kWorkingCopy,
                             [] { copyOver(kWorkingCopy, kPersistent); }});
-        return;
+        break;
     case Copies::Different:
         findings.push_back({std::string(kWorkingCopy) + ", which is in use, and " + kPersistent +
                                 ", which outlives a restart, differ",
@@ -140,6 +142,7 @@ void inspectTaskFiles(Findings &findings) {
                                 kWorkingCopy + "; then tavisched sync",
                             {}});
     }
+    return true;
 }
 
 void inspectPutAside(Findings &findings) {
@@ -413,13 +416,18 @@ void inspectWithTasks(Findings &findings) {
         const Tasks tasks = Tasks::read();
         inspectTasks(tasks, findings);
         inspectOwnLines(tasks, findings);
-        inspectPowerOffLines(tasks, *crontab, findings);
-        inspectWakeAlarm(tasks, findings);
+        if (tasks.lacksPower()) {
+            findings.push_back(
+                {"the power schedules cannot be read: " + libraryError(),
+                 "mend or remove the damaged entry in " + std::string(kPowerSchedules),
+                 {}});
+        } else {
+            inspectPowerOffLines(tasks, *crontab, findings);
+            inspectWakeAlarm(tasks, findings);
+        }
     } catch (const Failure &failure) {
-        findings.push_back({failure.what(),
-                            "tavisched --verbose check shows the library's log "
-                            "lines; look at /usr/tavi/etc/auto_power as well",
-                            {}});
+        findings.push_back(
+            {failure.what(), "tavisched --verbose check shows the library's log lines", {}});
     }
 }
 
@@ -428,12 +436,11 @@ void inspectWithTasks(Findings &findings) {
 std::vector<Finding> inspectMachine() {
     Findings findings;
     inspectFolders(findings);
-    inspectTaskFiles(findings);
+    const bool readable = inspectTaskFiles(findings);
     inspectPutAside(findings);
     inspectRunner(findings);
     inspectCron(findings);
-    // Without the right working copy everything else would look wrong.
-    if (compareCopies() != Copies::WorkingMissing) {
+    if (readable) {
         inspectSections(findings);
         inspectWithTasks(findings);
     }

@@ -246,6 +246,7 @@ int history(std::optional<int32_t> id, size_t limit, bool json) {
         std::cout << "There were no runs since the machine was started.\n";
     } else {
         std::vector<Row> rows;
+        rows.reserve(runs.size());
         for (const Run &run : runs) {
             rows.push_back({{std::to_string(run.taskId)},
                             {localTime(run.start)},
@@ -260,6 +261,10 @@ int history(std::optional<int32_t> id, size_t limit, bool json) {
 
 int exportTasks(const Ids &ids) {
     const Tasks tasks = Tasks::read();
+    if (tasks.lacksPower() && ids.empty()) {
+        throw Failure("nothing was exported, as power schedules would be missing; name the ids of "
+                      "other tasks to export those");
+    }
     Json::Value values(Json::arrayValue);
     for (const TAVI_SCHED_TASK *const task : tasks.select(ids)) {
         values.append(exportedTask(*task));

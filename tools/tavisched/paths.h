@@ -6,6 +6,7 @@ namespace tavisched {
 constexpr const char *kFolder = "/usr/tavi/etc";
 constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
 constexpr const char *kPutAside = "/usr/tavi/etc/scheduled_tasks.bak";
+constexpr const char *kPowerSchedules = "/usr/tavi/etc/auto_power";
 constexpr const char *kWorkingCopy = "/tmp/scheduled_tasks";
 constexpr const char *kCrontab = "/etc/crontab";
 constexpr const char *kCronPid = "/var/run/crond.pid";

@@ -82,7 +82,14 @@ sigset_t endingSignals() {
     throw Failure(called(task) + " could not be " + what + ": " + libraryError());
 }
 
+void requireBackends() {
+    if (TAVISchedBackendInit() != 0) {
+        throw Failure("the library cannot be used: " + libraryError());
+    }
+}
+
 const TAVI_SCHED_BACKEND_RECORD &scheduleBackend() {
+    requireBackends();
     const std::span backends(SchedBackends, cBackend);
     return *std::find_if(backends.begin(), backends.end(), [](const auto &backend) {
         return backend.id == TAVI_SCHED_BACKEND_SCHEDULE;
@@ -121,15 +128,27 @@ bool isSameSchedule(const TAVI_SCHED_TASK &one, const TAVI_SCHED_TASK &other) {
            one.runHour == other.runHour && one.runMin == other.runMin;
 }
 
+// The library's own list only logs when a backend cannot list its tasks, so each is asked itself.
 Tasks Tasks::read() {
     requireReadable();
+    requireBackends();
     Tasks tasks;
     TAVI_SCHED_TASK *head = nullptr;
-    if (TAVISchedTaskListGet(&head, nullptr) < 0) {
-        throw Failure("the tasks could not be read: " + libraryError() +
-                      "; \"tavisched check\" looks for the cause");
+    bool lacksSchedule = false;
+    for (const TAVI_SCHED_BACKEND_RECORD &backend : std::span(SchedBackends, cBackend)) {
+        const bool failed = backend.list_get(&head, nullptr) < 0;
+        lacksSchedule |= failed && backend.id == TAVI_SCHED_BACKEND_SCHEDULE;
+        tasks.lacksPower_ |= failed && backend.id == TAVI_SCHED_BACKEND_AUTOPOWER;
     }
     tasks.list_.reset(head);
+    if (lacksSchedule) {
+        throw Failure("the tasks cannot be read: " + libraryError() +
+                      "; \"tavisched check\" looks for the cause");
+    }
+    if (tasks.lacksPower_) {
+        std::cerr << "tavisched: warning: power schedules cannot be read: " << libraryError()
+                  << "\n";
+    }
     for (TAVI_SCHED_TASK *task = head; task; task = TAVISchedTaskNext(task)) {
         tasks.ordered_.push_back(task);
     }
@@ -313,7 +332,7 @@ void create(TAVI_SCHED_TASK &task) {
 }
 
 void createWithId(TAVI_SCHED_TASK &task) {
-    if (TAVISchedBackendInit() != 0 || scheduleBackend().edit(&task) != 0) {
+    if (scheduleBackend().edit(&task) != 0) {
         fail(task, "stored");
     }
 }

@@ -29,8 +29,10 @@ bool isSameSchedule(const TAVI_SCHED_TASK &one, const TAVI_SCHED_TASK &other);
 // All stored tasks, in the order of their ids.
 class Tasks {
   public:
-    // Fails when they cannot be read, and says why.
+    // Fails when they cannot be read, and says why. Power schedules that cannot be read are left
+    // out with a warning, as one damaged entry makes all of them unreadable.
     static Tasks read();
+    bool lacksPower() const { return lacksPower_; }
 
     const std::vector<TAVI_SCHED_TASK *> &all() const { return ordered_; }
     // The task of that id, or nullptr.
@@ -47,6 +49,7 @@ class Tasks {
     };
     std::unique_ptr<TAVI_SCHED_TASK, ListRelease> list_;
     std::vector<TAVI_SCHED_TASK *> ordered_;
+    bool lacksPower_ = false;
 };
 
 // "task 3" or "task 3 (Nightly backup)" for messages.

@@ -63,7 +63,8 @@ std::string Hash::value(const std::string &key) const {
 std::vector<std::string> Hash::keys() const {
     PLATCSZLIST *list = PLATCSzListAlloc(kHashCapacity);
     std::vector<std::string> keys;
-    const int count = list ? PLATCSzHashEnumKey(hash_, &list) : 0;
+    const int count = list ? std::max(PLATCSzHashEnumKey(hash_, &list), 0) : 0;
+    keys.reserve(static_cast<size_t>(count));
     for (int i = 0; i < count; ++i) {
         keys.emplace_back(PLATCSzListGet(list, i));
     }

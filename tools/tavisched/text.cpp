@@ -49,8 +49,10 @@ std::string printable(std::string_view text) {
     std::string result;
     forEachCharacter(text, [&](ucs4_t character) {
         uint8_t bytes[6];
-        const int length =
-            u8_uctomb(bytes, isControl(character) ? kReplacement : character, sizeof bytes);
+        const ucs4_t shown = character == '\t'      ? ' '
+                             : isControl(character) ? kReplacement
+                                                    : character;
+        const int length = u8_uctomb(bytes, shown, sizeof bytes);
         result.append(reinterpret_cast<const char *>(bytes), static_cast<size_t>(length));
     });
     return result;

@@ -1,0 +1,453 @@
+// The command line for people, from outside: what it accepts, refuses, stores, shows and mends.
+#include "support.h"
+
+#include <csignal>
+#include <sys/prctl.h>
+
+namespace {
+
+using namespace support;
+
+class CommandLine : public SchedTest {
+  protected:
+    // A machine in order: what an installation, a boot and cron leave behind.
+    void SetUp() override {
+        SchedTest::SetUp();
+        shell("mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins;"
+              "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
+              "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
+              "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
+        writeFile("/run/crond.pid", std::to_string(cron_) + "\n");
+    }
+    // Stands for a cron that is running and takes its signals.
+    static void SetUpTestSuite() {
+        cron_ = fork();
+        if (cron_ == 0) {
+            signal(SIGHUP, SIG_IGN);
+            prctl(PR_SET_PDEATHSIG, SIGKILL);
+            pause();
+        }
+    }
+    static void TearDownTestSuite() {
+        kill(cron_, SIGKILL);
+        waitForChildren();
+    }
+
+    // Runs "tavisched ARGUMENTS" through the shell; gives what it printed, and sets status_.
+    std::string run(const std::string &arguments, const char *prefix = "") {
+        status_ = shell("{ " + std::string(prefix) + "/usr/tavi/bin/tavisched " + arguments +
+                        "; } > /tmp/out 2>&1");
+        return readFile("/tmp/out");
+    }
+    // The same, for a command that must succeed.
+    std::string done(const std::string &arguments) {
+        const std::string output = run(arguments);
+        EXPECT_EQ(status_, 0) << arguments << "\n" << output;
+        return output;
+    }
+    // The state of everything that a refused command must leave alone.
+    static std::string machine() {
+        return readFile(kPersistent) + "|" + readFile(kWorking) + "|" + readFile(kCrontab) + "|" +
+               readFile("/usr/tavi/etc/auto_power");
+    }
+
+    static inline pid_t cron_ = 0;
+    int status_ = -1;
+};
+
+TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
+    done("add --command true --at 08:00 --every 4 --until 20");
+    done("add --power off --at 23:00 --weekly Mon");
+    const struct {
+        const char *arguments, *said;
+    } kCases[] = {
+        {"add", "needs --command"},
+        {"add --command ' '", "--command: it is empty"},
+        {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\"", "at most 12285"},
+        {"add --command x --at 99:00", "\"99:00\" is not accepted; accepted: HH:MM"},
+        {"add --command x --at 9:5", "accepted: HH:MM"},
+        {"add --command x --at 24:00", "accepted: HH:MM"},
+        {"add --command x --yearly 02-30", "--yearly: \"02-30\""},
+        {"add --command x --yearly 13-01", "--yearly"},
+        {"add --command x --monthly 32", "a day from 1 to 31"},
+        {"add --command x --monthly 0", "a day from 1 to 31"},
+        {"add --command x --weekly ''", "is no day of the week"},
+        {"add --command x --weekly Mon,,Fri", "is no day of the week"},
+        {"add --command x --once 2099-02-29", "a date of the calendar"},
+        {"add --command x --once 2020-01-01", "2020-01-01 at 00:00 has passed"},
+        {"add --command x --every 0 --until 20", "--until: it needs an interval"},
+        {"add --command x --until 20", "--until: it needs an interval"},
+        {"add --command x --every 24", "hours from 1 to 23"},
+        {"add --command x --every 2 --until 24", "an hour from 00 to 23"},
+        {"add --command x --at 12:00 --every 2 --until 11", "hour 11 is before the first run"},
+        {"add --command x --daily --monthly 1", "only one of --daily"},
+        {"add --command x --enabled --disabled", "only one of --enabled"},
+        {"add --command x --owner nosuchuser", "there is no user \"nosuchuser\""},
+        {"add --command x --owner 4000000000", "there is no user"},
+        {"add --command x --name \"$(printf 'a\\nb')\"", "--name: it holds a line break"},
+        {"add --command x --name \"$(printf 'a\\342\\200\\250b')\"", "--name: it holds a line"},
+        {"add --command x --name \"$(printf 'a\\377')\"", "--name: it is not valid UTF-8"},
+        {"add --command x --name \"$(head -c 4096 /dev/zero | tr '\\0' x)\"", "at most 4095"},
+        {"add --command x --app \"$(printf '\\033[2J')\"", "--app: it holds"},
+        {"add --power of", "accepted: on or off"},
+        {"add --power on --command x", "--command: a power schedule has none"},
+        {"add --power off --at 23:00 --weekly Mon", "there is such a schedule already"},
+        {"edit 1", "nothing is to be changed"},
+        {"edit 1 --at 21:00", "hour 20 is before the first run of the day at hour 21"},
+        {"edit 1 --power on", "this is no power schedule"},
+        {"edit 90022300 --power on", "keeps its kind"},
+        {"edit 9 --at 08:00", "there is no task 9"},
+        {"disable 1 9", "there is no task 9"},
+        {"remove 1 9 --yes", "there is no task 9"},
+        {"run 9", "there is no task 9"},
+        {"list --sort colour", "--sort: colour not in"},
+        {"frobnicate", "not expected: frobnicate"},
+        {"", "a command is needed"},
+    };
+    const std::string before = machine();
+    for (const auto &c : kCases) {
+        EXPECT_THAT(run(c.arguments), HasSubstr(c.said)) << c.arguments;
+        EXPECT_EQ(status_, 2) << c.arguments;
+        EXPECT_EQ(machine(), before) << c.arguments;
+    }
+}
+
+TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
+    const struct {
+        const char *options, *words, *fields;
+    } kCases[] = {
+        {"", "daily 00:00", "0\t0\t*\t*\t*"},
+        {"--weekly fri,MON --at 22:00", "Mon, Fri 22:00", "0\t22\t*\t*\t1,5"},
+        {"--weekly Sun,Mon,Tue,Thu --at 7:05", "Sun-Tue, Thu 07:05", "5\t7\t*\t*\t0,1,2,4"},
+        {"--daily --at 08:00 --every 4 --until 20", "daily 08:00 every 4 h until 20:00",
+         "0\t8,12,16,20\t*\t*\t*"},
+        {"--at 21:30 --every 1", "daily 21:30 every 1 h until 23:30", "30\t21,22,23\t*\t*\t*"},
+        {"--monthly 15 --at 08:10", "monthly on day 15 at 08:10", "10\t8\t15\t*\t*"},
+        {"--yearly 02-29 --at 00:01", "yearly on 02-29 at 00:01", "1\t0\t29\t2\t*"},
+        {"--once 2099-12-24 --at 18:00", "once on 2099-12-24 at 18:00", "0\t18\t24\t12\t*"},
+    };
+    int id = 0;
+    for (const auto &c : kCases) {
+        const std::string line =
+            std::string(c.fields) + "\troot\t/tmp/tavischedtask --run id=" + std::to_string(++id);
+        const std::string add = std::string("add --command x ") + c.options;
+        EXPECT_THAT(done(add + " --dry-run"), HasSubstr("Crontab line: " + line + "\nNext run: "));
+        EXPECT_EQ(done(add + " --quiet"), std::to_string(id) + "\n");
+        EXPECT_THAT(readFile(kCrontab), HasSubstr(line + "\n"));
+        EXPECT_THAT(done("list"), HasSubstr(std::string("enabled  ") + c.words + "  "));
+    }
+    EXPECT_THAT(done("check"), HasSubstr("All is well."));
+}
+
+TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
+    EXPECT_EQ(done("add --name Größe --command 'echo a\nb' --weekly Mon --at 22:00 --owner bin "
+                   "--app a.b --disabled --allow-overlap"),
+              "task 1 (Größe): Mon 22:00, disabled\n");
+    EXPECT_THAT(done("edit 1 --at 23:15 --enabled --owner 1"),
+                HasSubstr("task 1 (Größe): Mon 23:15, next run 2"));
+    TAVI_SCHED_TASK task{};
+    ASSERT_EQ(TAVISchedTaskGetByID(1, &task), 0);
+    EXPECT_STREQ(task.command, "echo a\nb");
+    EXPECT_STREQ(task.app, "a.b");
+    EXPECT_EQ(task.owner, 1U);
+    EXPECT_EQ(task.canRunTaskSameTime, 1);
+    done("edit 1 --no-overlap --monthly 3 --every 2");
+    EXPECT_THAT(done("show 1"),
+                AllOf(HasSubstr("monthly on day 3 at 23:15 every 2 h until 23:15"),
+                      HasSubstr("waits while an earlier run"), HasSubstr("daemon (1)"),
+                      HasSubstr("echo a\n               b\n")));
+    // A power schedule's id follows from what it says; one that cannot be armed is not kept.
+    done("add --power off --at 23:00 --weekly Mon");
+    EXPECT_THAT(done("edit 90022300 --at 23:30"), HasSubstr("task 90022330 "));
+    EXPECT_THAT(done("disable 90022330"), HasSubstr("task 80022330 "));
+    EXPECT_THAT(done("remove 80022330"), HasSubstr("removed"));
+    EXPECT_THAT(run("add --power on --at 06:00"), HasSubstr("could not be stored"));
+    EXPECT_EQ(status_, 1);
+    EXPECT_THAT(listedIds(), ElementsAre(1));
+}
+
+TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
+    Task bad = newTask();
+    TAVISchedCTaskSetRunHour(bad.get(), 99);
+    TAVISchedCTaskSetState(bad.get(), 0);
+    ASSERT_EQ(TAVISchedTaskCreate(bad.get()), 0);
+    done("add --command x");
+    EXPECT_THAT(run("enable 1"), HasSubstr("for the line of task 1 (Task 1): the hour \"99\""));
+    EXPECT_EQ(status_, 2);
+    // Enabled by hand in both files, so that the next rewrite would make the line.
+    shell("sed -i '0,/state=disabled/s//state=enabled/' /tmp/scheduled_tasks "
+          "/usr/tavi/etc/scheduled_tasks");
+    for (const char *const change : {"add --command y", "sync", "edit 2 --at 1:00", "remove 2"}) {
+        EXPECT_THAT(run(change), HasSubstr("first \"tavisched disable 1\"")) << change;
+        EXPECT_EQ(status_, 2);
+        EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
+    }
+    EXPECT_THAT(run("check --repair"), HasSubstr("for the line of task 1"));
+    done("edit 1 --at 9:00");
+    EXPECT_THAT(readFile(kCrontab),
+                HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n"));
+}
+
+TEST_F(CommandLine, FiftyAtOnceLoseNothing) {
+    EXPECT_EQ(shell("for i in $(seq 50); do /usr/tavi/bin/tavisched add --command x -q & done "
+                    "> /tmp/ids; wait; [ \"$(sort -un /tmp/ids | wc -l)\" = 50 ]"),
+              0);
+    EXPECT_EQ(listedIds().size(), 50U);
+    EXPECT_THAT(done("check"), HasSubstr("All is well."));
+}
+
+TEST_F(CommandLine, ExportAndImportGiveTheSameTasks) {
+    done("add --name 'Пример \"x\"' --command 'echo \"a\"\n# b' --weekly Sat --owner bin");
+    done("add --command x --disabled --yearly 12-24 --app '007'");
+    done("add --power off --at 23:00 --weekly Mon");
+    done("export > /tmp/all.json");
+    const std::string before = machine();
+    done("remove 1 2 90022300");
+    done("import /tmp/all.json");
+    EXPECT_EQ(machine(), before);
+    EXPECT_EQ(done("import - < /tmp/all.json"), "task 3 (Пример \"x\"), was 1\ntask 4 (Task 2), "
+                                                "was 2\ntask 90022300 (PowerOff task 0)\n");
+    // A section that cannot be read keeps its id.
+    shell("sed -i 's/^run hour=0/run hour=x/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks");
+    EXPECT_THAT(done("import /tmp/all.json"), HasSubstr(", was 1\n"));
+    EXPECT_THAT(readFile(kWorking), HasSubstr("run hour=x"));
+}
+
+TEST_F(CommandLine, ImportsAllOrNothing) {
+    done("add --command x");
+    done("add --command y");
+    done("export > /tmp/all.json");
+    const std::string before = machine();
+    const struct {
+        const char *edit, *said;
+    } kCases[] = {
+        {"s/run hour\": \"..0/run hour\": \"\\\\\"99/",
+         "element 1, member \"run hour\": 99; accepted: 0 to 23\n  element 2, member"},
+        {"s/\"cmd\": \"..eQ/\"cmd\": \"\\\\\"e/",
+         "element 2, member \"cmd\": \"e==\" is not the base64"},
+        {"s/\"week\": .*/\"week\": \"\\\\\"11\\\\\"\"/",
+         "element 1, member \"week\": \"11\"; accepted"},
+        {"s/\"state\": .*/\"state\": \"\\\\\"on\\\\\"\",/",
+         "member \"state\": \"on\" would be stored as \"enabled\""},
+        {"s/\"listable\": .*/\"listable\": \"1\",/",
+         "accepted: a string whose text is a JSON string"},
+        {"s/\"type\"/\"typ\"/", "member \"typ\": no task has it"},
+        {"/\"name\"/d", "element 1, member \"name\": it is missing"},
+        {"s/\"owner\": .*/\"owner\": \"\\\\\"54321\\\\\"\",/", "no user with the id 54321"},
+        {"s/\"id\": .*/\"id\": \"\\\\\"7x\\\\\"\",/", "\"7x\" would be stored as \"7\""},
+        {"$d", "is no JSON"},
+    };
+    for (const auto &c : kCases) {
+        shell(std::string("sed '") + c.edit + "' /tmp/all.json > /tmp/bad.json");
+        EXPECT_THAT(run("import /tmp/bad.json"), HasSubstr(c.said)) << c.edit;
+        EXPECT_EQ(status_, 2) << c.edit;
+        EXPECT_EQ(machine(), before) << c.edit;
+    }
+}
+
+TEST_F(CommandLine, RunsNowAndFollows) {
+    done("add --command 'echo $HOME > /tmp/ran'");
+    done("add --command 'exit 3'");
+    done("add --command 'kill -9 $$'");
+    done("add --command 'sleep 1000 &' --disabled"); // what it leaves behind is not waited for
+    EXPECT_EQ(run("run 1 2 3 4 --wait"),
+              "task 1 (Task 1): started\ntask 2 (Task 2): started\ntask 3 (Task 3): started\n"
+              "task 4 (Task 4): started\ntask 1 (Task 1): ok\ntask 2 (Task 2): exit 3\n"
+              "task 3 (Task 3): killed by signal 9\ntask 4 (Task 4): ok\n");
+    EXPECT_EQ(status_, 3);
+    run("run 3 --wait");
+    EXPECT_EQ(status_, 128 + 9);
+    EXPECT_EQ(done("run 1"), "task 1 (Task 1): started\n");
+    EXPECT_THAT(done("history 3"), HasSubstr("killed by signal 9"));
+    EXPECT_THAT(done("history --limit 1 --json"), HasSubstr("\"statusCode\""));
+    shell("pkill -x sleep");
+}
+
+TEST_F(CommandLine, TellsHowRunsEnded) {
+    const time_t now = time(nullptr);
+    const auto row = [&](int task, int age, int pid, int code, const char *comment) {
+        query(
+            "INSERT INTO task_status (pid, timestamp, task_id, app, status_code, comment) VALUES (" +
+            std::to_string(pid) + "," + std::to_string(now - age) + "," + std::to_string(task) +
+            ",''," + std::to_string(code) + ",'" + comment + "')");
+    };
+    for (int i = 0; i < 5; ++i) {
+        done("add --command x");
+    }
+    row(1, 7300, 1, 3, "");
+    row(2, 200, 1, 7, "2");
+    row(2, 99999, 1, 3, "");
+    row(3, 5, getpid(), 2, "");
+    row(4, 400, 999999, 2, "");
+    row(5, 50L * 3600, 1, 6, "9");
+    const std::string list = done("list");
+    for (const char *const words :
+         {" 1 .* ok 2 h ago\n", " 2 .* exit 2 3 min ago\n", " 3 .* running\n",
+          " 4 .* interrupted 6 min ago\n", " 5 .* killed by signal 9 [23] days ago\n"}) {
+        EXPECT_THAT(list, testing::ContainsRegex(words));
+    }
+    EXPECT_THAT(done("list --sort last"),
+                testing::ContainsRegex("running.*\n.*exit 2.*\n.*interr"));
+    EXPECT_THAT(done("history 2"), testing::ContainsRegex("exit 2 .*\n *2 .* ok "));
+}
+
+TEST_F(CommandLine, FitsTheTerminal) {
+    Task task = newTask();
+    TAVISchedCTaskSetName(task.get(), "\033[2J日本日本日本日本日本日本 é name");
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    Task hidden = newTask();
+    TAVISchedCTaskSetListable(hidden.get(), 0);
+    ASSERT_EQ(TAVISchedTaskCreate(hidden.get()), 0);
+    const std::string whole = done("list");
+    EXPECT_THAT(whole, AllOf(Not(HasSubstr("\033")),
+                             HasSubstr("\uFFFD[2J日本日本日本日本日本日本 é name  "),
+                             Not(HasSubstr("Task 2"))));
+    EXPECT_THAT(done("list --all"), HasSubstr("Task 2"));
+    const char *const kTerminal =
+        "script -qec 'stty cols 70; TERM=xterm %s/usr/tavi/bin/tavisched list' /dev/null > /tmp/out";
+    char command[256];
+    std::snprintf(command, sizeof command, kTerminal, "NO_COLOR=1 ");
+    EXPECT_EQ(shell(command), 0);
+    const std::string cut = readFile("/tmp/out");
+    // Sixteen columns before the third one, in the titles and behind wide characters alike.
+    EXPECT_THAT(cut, AllOf(Not(HasSubstr("\033")), HasSubstr("ID  NAME        STATE"),
+                           HasSubstr(" 1  \uFFFD[2J日本…   enabled")));
+    std::snprintf(command, sizeof command, kTerminal, "");
+    shell(command);
+    EXPECT_THAT(readFile("/tmp/out"), HasSubstr("\033[1mNAME"));
+}
+
+// Lines as Debian's cron was seen to take or reject them in /etc/crontab.
+TEST_F(CommandLine, KnowsWhatCronRejects) {
+    const struct {
+        const char *line;
+        bool taken;
+    } kLines[] = {
+        {"# any", true},
+        {"", true},
+        {"A=b", true},
+        {"A = b c", true},
+        {"\"A B\" = c", true},
+        {"A=\"\"", true},
+        {"A= ", false},
+        {"A B = c", false},
+        {"1 1 1 1 1 root x", true},
+        {"\t1 1\t1 1 1 root x", true},
+        {"5-3,1-5/2 */61 * jan-MAR fri-SUN root x", true},
+        {"1~5 *x 1-2-3 * * root x", true},
+        {"@daily root x", true},
+        {"@Daily root x", false},
+        {"@daily root", false},
+        {"5/10 * * * * root x", false},
+        {"*/0 * * * * root x", false},
+        {"60 * * * * root x", false},
+        {"* 24 * * * root x", false},
+        {"* * 0 * * root x", false},
+        {"* * * 13 * root x", false},
+        {"* * * january * root x", false},
+        {"* * * * 8 root x", false},
+        {"1,,2 * * * * root x", false},
+        {"1x * * * * root x", false},
+        {"-1 * * * * root x", false},
+        {"* * * * root x", false},
+        {"1 1 1 1 1 root", false},
+        {"1 1 1 1 1 root ", true},
+        {"1 1 1 1 1 nosuchuser x", false},
+    };
+    for (const auto &c : kLines) {
+        writeFile(kCrontab, std::string(c.line) + "\n");
+        const std::string said = run("check");
+        EXPECT_EQ(status_, c.taken ? 0 : 1) << c.line << "\n" << said;
+        EXPECT_TRUE(c.taken || said.find("for its line 1: ") != std::string::npos) << said;
+    }
+    for (const int length : {998, 999}) {
+        writeFile(kCrontab, "1 1 1 1 1 root " + std::string(length, 'x') + "\n");
+        run("check");
+        EXPECT_EQ(status_, length == 998 ? 0 : 1);
+    }
+}
+
+TEST_F(CommandLine, FindsAndMendsWhatIsWrong) {
+    const struct {
+        const char *harm, *found;
+        bool mended;
+    } kCases[] = {
+        {"rm /run/crond.pid", "cron is not running", false},
+        {"echo 999999 > /run/crond.pid", "cron is not running", false},
+        {"rm /tmp/tavischedtask", "tavischedtask is missing", true},
+        {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true},
+        {"chown -h bin /tmp/tavischedtask", "belongs to another user", true},
+        {"cp /bin/true /usr/tavi/run; chmod 777 /usr/tavi/run; ln -sf /usr/tavi/run "
+         "/tmp/tavischedtask",
+         "others than root can replace", true},
+        {"rmdir /tmp/lock", "/tmp/lock is missing", true},
+        {"chown bin /tmp/lock", "not a folder of root's", false},
+        {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
+        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
+        {"chmod 666 /tmp/scheduled_tasks", "so that no task is read from it", true},
+        {"rm /usr/tavi/etc/scheduled_tasks", "lost when the machine restarts", true},
+        {"sed -i s/daily/weekly/ /usr/tavi/etc/scheduled_tasks", "differ", false},
+        {"touch /usr/tavi/etc/scheduled_tasks.bak", "put aside", false},
+        {"sed -i /id=1/d /etc/crontab", "lacks a task's line", true},
+        {"echo '# /tmp/tavischedtask' >> /etc/crontab", "that no task asks for", true},
+        {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "not those of the power-off schedules", true},
+        {"printf x >> /etc/crontab", "has no line feed", false},
+        {"rm /etc/crontab", "cannot be read", false},
+        {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
+        {"sed -i 's/^run hour=.*/run hour=x/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "no task that can be read: \"run hour\": \"x\"", false},
+        {"sed -i '/^cmd=/d' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "\"cmd\" is missing", false},
+        {"sed -i 's/^owner=.*/owner=54321/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "no user with the id 54321", false},
+        {"sed -i 's/^\\[1]/[5]/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "section [5] of /tmp/scheduled_tasks says that its task has the id 1", false},
+        {"echo '000=bad' >> /usr/tavi/etc/auto_power", "power schedules cannot be read", false},
+        {"mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler; "
+         "echo '#!/bin/sh' > a; chmod 775 a",
+         "task_scheduler/a is skipped: it must be", false},
+        {"mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler; "
+         "echo '#!/bin/sh' > b; echo text > README",
+         "task_scheduler/b is skipped, as it is not executable", false},
+        {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler", "all plug-in handlers are skipped",
+         false},
+    };
+    for (const auto &c : kCases) {
+        SetUp();
+        done("add --command x");
+        done("add --power off --at 23:00");
+        ASSERT_THAT(done("check"), HasSubstr("All is well."));
+        shell(c.harm);
+        EXPECT_THAT(run("check"), AllOf(HasSubstr("problem: "), HasSubstr(c.found))) << c.harm;
+        EXPECT_EQ(status_, 1) << c.harm;
+        const std::string said = run("check --repair");
+        EXPECT_EQ(status_, c.mended ? 0 : 1) << c.harm << "\n" << said;
+        EXPECT_TRUE(!c.mended || said.find("mended: ") != std::string::npos) << c.harm;
+        // Nothing was lost by it.
+        EXPECT_TRUE(!c.mended || done("list").find("Task 1") != std::string::npos) << c.harm;
+    }
+}
+
+TEST_F(CommandLine, SaysWhatStandsInItsWay) {
+    done("add --command x");
+    shell("rm /tmp/scheduled_tasks");
+    EXPECT_THAT(run("add --command y"), HasSubstr("check --repair"));
+    EXPECT_EQ(status_, 1);
+    EXPECT_THAT(run("list"), HasSubstr("warning: /tmp/scheduled_tasks is missing"));
+    done("check --repair");
+    // The library stores although the crontab cannot be written; people are told.
+    shell("cp /etc/crontab /run/crontab; mount -n --bind /run/crontab /etc/crontab");
+    EXPECT_THAT(run("add --command y"), HasSubstr("stored, but /etc/crontab could not be written"));
+    EXPECT_EQ(status_, 1);
+    shell("umount -n /etc/crontab");
+    done("sync");
+    if (shell("setpriv --reuid=1 --clear-groups true") != 0) {
+        GTEST_SKIP() << "needs several users";
+    }
+    for (const char *const command : {"list", "add --command z", "check", "run 1", "export"}) {
+        EXPECT_THAT(run(command, "setpriv --reuid=1 --clear-groups "), HasSubstr("run by root"));
+        EXPECT_EQ(status_, 1) << command;
+    }
+}
+
+} // namespace

@@ -146,7 +146,7 @@ class ImportStore {
         const int32_t wanted = task.id;
         if (isPower(task)) {
             storePower(task);
-        } else if (wanted > 0 && isIdFree(wanted)) {
+        } else if (wanted > 0 && !present_.find(wanted) && isSectionFree(wanted)) {
             createWithId(task);
             stored_.push_back(&task);
         } else {

@@ -101,23 +101,16 @@ const TAVI_SCHED_BACKEND_RECORD &scheduleBackend() {
 // ---- Reading ----
 
 Task newTask(int32_t backend) {
-    Task task(TAVISchedTaskAlloc(), TAVISchedTaskFree);
-    if (!task) {
+    auto task = std::make_unique<TAVI_SCHED_TASK>();
+    task->backend = backend;
+    if (TAVISchedTaskGetDefault(task.get()) != 0) {
         throw Failure("a new task could not be made: " + libraryError());
-    }
-    if (backend != task->backend) {
-        *task = {};
-        task->backend = backend;
-        if (TAVISchedTaskGetDefault(task.get()) != 0) {
-            throw Failure("a new task could not be made: " + libraryError());
-        }
     }
     return task;
 }
 
 Task copyOf(const TAVI_SCHED_TASK &task) {
-    Task copy = newTask(task.backend);
-    *copy = task;
+    auto copy = std::make_unique<TAVI_SCHED_TASK>(task);
     copy->next = nullptr;
     return copy;
 }
@@ -311,13 +304,13 @@ void requireSyncedCrontab() {
     }
 }
 
-bool isIdFree(int32_t id) {
+bool isSectionFree(int32_t id) {
     PLATCSZHASH *pairs = PLATCSzHashAlloc(1);
     const int found = access(kWorkingCopy, F_OK) == 0
                           ? PLATCFileGetSection(kWorkingCopy, std::to_string(id).c_str(), &pairs)
                           : 0;
     PLATCSzHashFree(pairs);
-    return found == 0 && !Tasks::read().find(id);
+    return found == 0;
 }
 
 void create(TAVI_SCHED_TASK &task) {

@@ -12,7 +12,7 @@
 
 namespace tavisched {
 
-using Task = std::unique_ptr<TAVI_SCHED_TASK, int (*)(TAVI_SCHED_TASK *)>;
+using Task = std::unique_ptr<TAVI_SCHED_TASK>;
 
 // A new task with the defaults of a backend (TAVI_SCHED_BACKEND_*).
 Task newTask(int32_t backend);
@@ -108,7 +108,7 @@ void edit(const TAVI_SCHED_TASK &before, TAVI_SCHED_TASK &task);
 void remove(const TAVI_SCHED_TASK &task);
 // Stores a task of the schedule backend under its id, which must be free.
 void createWithId(TAVI_SCHED_TASK &task);
-// No task and no section, be it one that cannot be read, has the id.
-bool isIdFree(int32_t id);
+// No section, be it one that cannot be read, is named by the id.
+bool isSectionFree(int32_t id);
 
 } // namespace tavisched

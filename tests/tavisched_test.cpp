@@ -100,6 +100,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"disable 1 9", "there is no task 9"},
         {"remove 1 9 --yes", "there is no task 9"},
         {"run 9", "there is no task 9"},
+        {"history 9", "there is no task 9"},
         {"list --sort colour", "--sort: colour not in"},
         {"frobnicate", "not expected: frobnicate"},
         {"", "a command is needed"},
@@ -164,6 +165,14 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
     EXPECT_THAT(run("add --power on --at 06:00"), HasSubstr("could not be stored"));
     EXPECT_EQ(status_, 1);
     EXPECT_THAT(listedIds(), ElementsAre(1));
+    // Beside a damaged entry the library would store and then fail.
+    writeFile("/usr/tavi/etc/auto_power", "[power off]\n000=1 9 99 99\n");
+    for (const char *const change : {"add --power off", "sync", "export"}) {
+        EXPECT_THAT(run(change), HasSubstr("power schedules")) << change;
+        EXPECT_EQ(status_, 1) << change;
+    }
+    EXPECT_EQ(readFile("/usr/tavi/etc/auto_power"), "[power off]\n000=1 9 99 99\n");
+    done("edit 1 --at 01:00");
 }
 
 TEST_F(CommandLine, NeverMakesALineThatCronRejects) {

@@ -300,35 +300,18 @@ void inspectOwnLines(const Tasks &tasks, Findings &findings) {
 
 // ---- Power ----
 
-bool isEnabledPower(const TAVI_SCHED_TASK &task, const char *arguments) {
-    return isPower(task) && task.state == TAVI_SCHED_STATE_ENABLED &&
-           std::strcmp(task.appArgs, arguments) == 0;
+bool anyEnabledPower(const Tasks &tasks, std::string_view arguments) {
+    return std::any_of(tasks.all().begin(), tasks.all().end(),
+                       [&](const auto *task) { return isEnabledPower(*task, arguments); });
 }
 
-void inspectPowerOffLines(const Tasks &tasks, const Crontab &crontab, Findings &findings) {
-    std::vector<CronTimes> expected;
-    for (const TAVI_SCHED_TASK *const task : tasks.all()) {
-        const CrontabLine line = parseCrontabLine(crontabLine(*task));
-        if (isEnabledPower(*task, "poweroff") && line.kind == CrontabLine::Kind::Entry) {
-            expected.push_back(line.times);
-        }
-    }
-    const bool needsCheck = !expected.empty();
-    bool differs = false;
-    for (const std::string &line : crontab.lines) {
-        if (line.find(kPowerOffCheck) != std::string::npos) {
-            const auto found =
-                std::find(expected.begin(), expected.end(), parseCrontabLine(line).times);
-            differs = differs || found == expected.end();
-            expected.erase(found, found == expected.end() ? found : found + 1);
-        }
-    }
-    if (differs || !expected.empty()) {
+void inspectPowerOff(const Tasks &tasks, const Crontab &crontab, Findings &findings) {
+    if (!arePowerOffLinesRight(tasks, crontab)) {
         findings.push_back({"the power-off lines of " + std::string(kCrontab) +
                                 " are not those of the power-off schedules",
                             "tavisched sync", [] { TAVISchedTaskSync(); }});
     }
-    if (needsCheck && access(kPowerOffCheck, X_OK) != 0) {
+    if (anyEnabledPower(tasks, kPowerOff) && access(kPowerOffCheck, X_OK) != 0) {
         findings.push_back({std::string(kPowerOffCheck) +
                                 ", which power-off schedules run, is missing or no program",
                             "install one; a default one comes with the package",
@@ -337,10 +320,7 @@ void inspectPowerOffLines(const Tasks &tasks, const Crontab &crontab, Findings &
 }
 
 void inspectWakeAlarm(const Tasks &tasks, Findings &findings) {
-    const bool needed = std::any_of(tasks.all().begin(), tasks.all().end(), [](const auto *task) {
-        return isEnabledPower(*task, "poweron");
-    });
-    if (needed && access(kWakeAlarm, W_OK) != 0) {
+    if (anyEnabledPower(tasks, kPowerOn) && access(kWakeAlarm, W_OK) != 0) {
         findings.push_back({"there are power-on schedules, but this machine has no clock that can "
                             "wake it (" +
                                 std::string(kWakeAlarm) + ": " + systemReason() + ")",
@@ -422,7 +402,7 @@ void inspectWithTasks(Findings &findings) {
                  "mend or remove the damaged entry in " + std::string(kPowerSchedules),
                  {}});
         } else {
-            inspectPowerOffLines(tasks, *crontab, findings);
+            inspectPowerOff(tasks, *crontab, findings);
             inspectWakeAlarm(tasks, findings);
         }
     } catch (const Failure &failure) {

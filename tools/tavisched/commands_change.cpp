@@ -47,7 +47,7 @@ void refuseSameSchedule(const Tasks &tasks, const TAVI_SCHED_TASK &task,
 
 // Both kinds of power schedules must have room for what will be there.
 void requirePowerRoom(const TaskPointers &tasksAfterwards) {
-    for (const std::string_view kind : {"poweron", "poweroff"}) {
+    for (const std::string_view kind : {kPowerOn, kPowerOff}) {
         const auto count = std::count_if(
             tasksAfterwards.begin(), tasksAfterwards.end(),
             [&](const TAVI_SCHED_TASK *task) { return isPower(*task) && task->appArgs == kind; });
@@ -56,6 +56,14 @@ void requirePowerRoom(const TaskPointers &tasksAfterwards) {
                           " power schedules of this kind; accepted: at most " +
                           std::to_string(kMaxPowerSchedules));
         }
+    }
+}
+
+// The library would store a power schedule beside damaged ones and fail afterwards.
+void requireReadablePower(const Tasks &tasks, const TAVI_SCHED_TASK &changed) {
+    if (isPower(changed) && tasks.lacksPower()) {
+        throw Failure("power schedules cannot be changed while they cannot be read; \"tavisched "
+                      "check\" tells more");
     }
 }
 
@@ -200,10 +208,11 @@ int add(const TaskOptions &options, bool dryRun, bool quiet) {
     if (!options.power && !options.command) {
         throw Refusal("a task needs --command, or --power for a power schedule");
     }
+    const Tasks tasks = Tasks::read();
     const Task task =
         newTask(options.power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
     apply(options, *task);
-    const Tasks tasks = Tasks::read();
+    requireReadablePower(tasks, *task);
     refuseSameSchedule(tasks, *task, nullptr);
     requireStorable(afterwards(tasks, {task.get()}));
     if (dryRun) {
@@ -241,6 +250,9 @@ int setEnabled(const Ids &ids, bool enabled) {
     for (const TAVI_SCHED_TASK *const task : selected) {
         changed.push_back(copyOf(*task));
         TAVISchedCTaskSetState(changed.back().get(), enabled ? 1 : 0);
+        if (enabled) {
+            refusePast(*changed.back());
+        }
         refuseSameSchedule(tasks, *changed.back(), task);
         pointers.push_back(changed.back().get());
     }
@@ -289,6 +301,7 @@ int importTasks(const std::string &file) {
     const Tasks present = Tasks::read();
     TaskPointers pointers(present.all().begin(), present.all().end());
     for (const Task &task : imported) {
+        requireReadablePower(present, *task);
         if (!present.findSameSchedule(*task)) {
             pointers.push_back(task.get());
         }
@@ -314,6 +327,10 @@ int syncTasks() {
     requireGoodCrontab({tasks.all().begin(), tasks.all().end()});
     TAVISchedTaskSync(); // tells of no failure
     requireSyncedCrontab();
+    const auto crontab = readCrontab();
+    if (tasks.lacksPower() || !crontab || !arePowerOffLinesRight(tasks, *crontab)) {
+        throw Failure("the power schedules could not be set: " + libraryError());
+    }
     std::printf("/etc/crontab has the lines of all enabled tasks.\n");
     return 0;
 }

@@ -235,6 +235,9 @@ int show(int32_t id, bool json) {
 
 int history(std::optional<int32_t> id, size_t limit, bool json) {
     std::vector<Run> runs = readRuns(id);
+    if (id && runs.empty()) {
+        Tasks::read().select({*id}); // refused when there is no such task
+    }
     runs.resize(std::min(runs.size(), limit));
     if (json) {
         Json::Value values(Json::arrayValue);

@@ -10,6 +10,7 @@
 #include <cstring>
 #include <stdexcept>
 #include <string>
+#include <unistd.h>
 
 namespace tavisched {
 
@@ -27,15 +28,19 @@ struct Failure : std::runtime_error {
 
 // What the library's error state tells, for the end of a message.
 inline std::string libraryError() {
+    if (PLATCErrGet() == 0) {
+        return "the system log tells why, and so does --verbose";
+    }
     std::array<char, 64> code{};
     std::snprintf(code.data(), code.size(), "error 0x%04X (", PLATCErrGet());
     return code.data() + std::string(PLATCErrorGetFile()) + ":" +
            std::to_string(PLATCErrorGetLine()) + "); --verbose tells more";
 }
 
-// What errno tells of the system call that failed.
+// What errno tells of the system call that failed, and what a person can do about missing rights.
 inline std::string systemReason() {
-    return std::strerror(errno);
+    const bool lacksRights = (errno == EACCES || errno == EPERM) && geteuid() != 0;
+    return std::strerror(errno) + std::string(lacksRights ? "; tavisched must be run by root" : "");
 }
 
 } // namespace tavisched

@@ -127,7 +127,7 @@ class Import {
 
     void checkPower(const TAVI_SCHED_TASK &task) {
         const std::string_view arguments(task.appArgs);
-        if (arguments != "poweron" && arguments != "poweroff") {
+        if (arguments != kPowerOn && arguments != kPowerOff) {
             addFault("app args", "accepted for a power schedule: poweron, poweroff");
         }
         if (task.type != TAVI_SCHED_TYPE_DAILY && task.type != TAVI_SCHED_TYPE_WEEKLY) {

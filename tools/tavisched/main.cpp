@@ -22,6 +22,7 @@ using Command = std::function<int()>;
 CLI::App *subcommand(CLI::App &app, Command &command, const char *name, const char *what,
                      const char *example, Command work) {
     CLI::App *const sub = app.add_subcommand(name, what);
+    sub->fallthrough(); // --verbose may stand behind the command too
     sub->footer(std::string("Example:\n  ") + example);
     sub->final_callback([&command, work = std::move(work)] { command = work; });
     return sub;
@@ -68,7 +69,7 @@ struct Settings {
     TaskOptions task;
     Ids ids;
     int32_t id = 0;
-    size_t limit = std::numeric_limits<size_t>::max();
+    int limit = std::numeric_limits<int>::max();
     std::string file;
     bool json = false, dryRun = false, quiet = false, yes = false, wait = false, repair = false;
 };
@@ -93,10 +94,12 @@ void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
         app, command, "history", "show how runs ended, newest first",
         "tavisched history 3 --limit 10", [&] {
             return history(given.ids.empty() ? std::nullopt : std::optional(given.ids.front()),
-                           given.limit, given.json);
+                           static_cast<size_t>(given.limit), given.json);
         });
     past->add_option("ID", given.ids, "id of a task; without it, of all")->expected(0, 1);
-    past->add_option("--limit", given.limit, "at most so many");
+    past->add_option("--limit", given.limit, "at most so many")
+        ->type_name("NUMBER")
+        ->check(CLI::PositiveNumber);
     jsonOption(past, given.json, "as JSON for scripts");
 
     auto *const exporting =

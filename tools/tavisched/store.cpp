@@ -35,7 +35,7 @@ void requireReadable() {
     }
     if (errno != ENOENT) {
         throw Failure(std::string("cannot read the tasks: ") + kWorkingCopy + ": " +
-                      systemReason() + (geteuid() == 0 ? "" : "; tavisched must be run by root"));
+                      systemReason());
     }
     if (sizeOf(kPersistent) > 0) {
         std::cerr << "tavisched: warning: " << kWorkingCopy
@@ -48,8 +48,7 @@ void requireReadable() {
 void requireWritable() {
     for (const char *const folder : {kFolder, "/tmp", "/etc"}) {
         if (access(folder, W_OK) != 0) {
-            throw Failure(std::string("cannot change tasks: ") + folder + ": " + systemReason() +
-                          (geteuid() == 0 ? "" : "; tavisched must be run by root"));
+            throw Failure(std::string("cannot change tasks: ") + folder + ": " + systemReason());
         }
     }
 }
@@ -113,6 +112,10 @@ Task copyOf(const TAVI_SCHED_TASK &task) {
     auto copy = std::make_unique<TAVI_SCHED_TASK>(task);
     copy->next = nullptr;
     return copy;
+}
+
+bool isEnabledPower(const TAVI_SCHED_TASK &task, std::string_view arguments) {
+    return isPower(task) && task.state == TAVI_SCHED_STATE_ENABLED && task.appArgs == arguments;
 }
 
 bool isSameSchedule(const TAVI_SCHED_TASK &one, const TAVI_SCHED_TASK &other) {
@@ -297,6 +300,27 @@ CrontabDifference compareCrontab(const Tasks &tasks) {
     return difference;
 }
 
+bool arePowerOffLinesRight(const Tasks &tasks, const Crontab &crontab) {
+    std::vector<CronTimes> expected;
+    for (const TAVI_SCHED_TASK *const task : tasks.all()) {
+        const CrontabLine line = parseCrontabLine(crontabLine(*task));
+        if (isEnabledPower(*task, kPowerOff) && line.kind == CrontabLine::Kind::Entry) {
+            expected.push_back(line.times);
+        }
+    }
+    for (const std::string &line : crontab.lines) {
+        if (line.find(kPowerOffCheck) != std::string::npos) {
+            const auto found =
+                std::find(expected.begin(), expected.end(), parseCrontabLine(line).times);
+            if (found == expected.end()) {
+                return false;
+            }
+            expected.erase(found);
+        }
+    }
+    return expected.empty();
+}
+
 void requireSyncedCrontab() {
     if (compareCrontab(Tasks::read()).any()) {
         throw Failure(std::string("the tasks are stored, but ") + kCrontab +
@@ -335,7 +359,8 @@ void edit(const TAVI_SCHED_TASK &before, TAVI_SCHED_TASK &task) {
     const std::string error = libraryError();
     if (isPower(task)) {
         // Its id is made of what it says.
-        if (const TAVI_SCHED_TASK *const stored = Tasks::read().findSameSchedule(task)) {
+        const Tasks now = Tasks::read();
+        if (const TAVI_SCHED_TASK *const stored = now.findSameSchedule(task)) {
             task.id = stored->id;
         }
         if (result != 0) {

@@ -2,12 +2,14 @@
 // storing.
 #pragma once
 
+#include "crontab.h"
 #include "failure.h"
 #include "tavischeduler.h"
 
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace tavisched {
@@ -23,6 +25,10 @@ inline bool isPower(const TAVI_SCHED_TASK &task) {
     return task.backend == TAVI_SCHED_BACKEND_AUTOPOWER;
 }
 
+// What a power schedule's application arguments say.
+constexpr std::string_view kPowerOn = "poweron";
+constexpr std::string_view kPowerOff = "poweroff";
+bool isEnabledPower(const TAVI_SCHED_TASK &task, std::string_view arguments);
 // Two power schedules of the same kind, days, time and state: a machine could not tell them apart.
 bool isSameSchedule(const TAVI_SCHED_TASK &one, const TAVI_SCHED_TASK &other);
 
@@ -98,6 +104,8 @@ struct CrontabDifference {
     bool any() const { return !missing.empty() || !surplus.empty(); }
 };
 CrontabDifference compareCrontab(const Tasks &tasks);
+// Whether its power-off lines are those of the power-off schedules.
+bool arePowerOffLinesRight(const Tasks &tasks, const Crontab &crontab);
 // The library stores a change also when the crontab cannot be written; this fails then.
 void requireSyncedCrontab();
 

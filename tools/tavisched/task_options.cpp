@@ -280,17 +280,6 @@ void refuseConflicts(const TaskOptions &options) {
     }
 }
 
-// A schedule that was just given and has no run ahead is a slip.
-void refusePast(TAVI_SCHED_TASK &task) {
-    if (TAVISchedNextTriggerTime(&task) != 0) {
-        throw Failure("the next run cannot be computed: " + libraryError());
-    }
-    if (std::string_view(task.nextTriggerTime) == "N/A") {
-        refuse("--once", scheduleInWords(task).substr(std::strlen("once on ")) +
-                             " has passed; accepted: a time in the future");
-    }
-}
-
 } // namespace
 
 bool TaskOptions::schedule() const {
@@ -322,6 +311,16 @@ void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
     }
     if (options.schedule() || options.enabled) {
         refusePast(task);
+    }
+}
+
+void refusePast(TAVI_SCHED_TASK &task) {
+    if (TAVISchedNextTriggerTime(&task) != 0) {
+        throw Failure("the next run cannot be computed: " + libraryError());
+    }
+    if (std::string_view(task.nextTriggerTime) == "N/A") {
+        throw Refusal("--once: " + scheduleInWords(task).substr(std::strlen("once on ")) +
+                      " has passed; accepted: a time in the future");
     }
 }
 

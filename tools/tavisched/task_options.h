@@ -25,6 +25,9 @@ struct TaskOptions {
 // when an option cannot be accepted or the task as a whole would be wrong.
 void apply(const TaskOptions &options, TAVI_SCHED_TASK &task);
 
+// Refused when the task has no run ahead: a schedule that has passed is a slip.
+void refusePast(TAVI_SCHED_TASK &task);
+
 // What a person may want to know of the schedule, such as that some months have no 31st; may be
 // empty.
 std::string remarkOn(const TAVI_SCHED_TASK &task);

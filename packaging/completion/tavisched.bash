@@ -1,0 +1,62 @@
+# Completion of tavisched for bash.
+
+_tavisched() {
+    local cur=${COMP_WORDS[COMP_CWORD]} prev=${COMP_WORDS[COMP_CWORD - 1]} word head
+    local command='' options='' words=''
+    if [[ $cur == = ]]; then # bash makes a word of its own of it
+        cur=''
+    elif [[ $prev == = ]]; then
+        prev=${COMP_WORDS[COMP_CWORD - 2]}
+    fi
+    for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
+        if [[ $word != -* ]]; then
+            command=$word
+            break
+        fi
+    done
+    COMPREPLY=()
+
+    case $prev in
+    --sort) words='id name state schedule next owner last' ;;
+    --power) words='on off' ;;
+    --owner) words=$(compgen -u) ;;
+    --weekly)
+        compopt -o nospace 2>/dev/null # a comma and another day may follow
+        head=${cur%"${cur##*,}"}
+        mapfile -t COMPREPLY < <(compgen -P "$head" -W 'Sun Mon Tue Wed Thu Fri Sat' -- "${cur##*,}")
+        return
+        ;;
+    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit) return ;;
+    *)
+        case $command in
+        '')
+            options='--version --verbose'
+            words='list show history export add edit enable disable remove import run sync check'
+            ;;
+        list) options='--all --sort --reverse --json' ;;
+        show) options='--json' ;;
+        history) options='--limit --json' ;;
+        add | edit)
+            options='--name --command --at --daily --weekly --monthly --yearly --once --every --until
+                --owner --app --enabled --disabled --allow-overlap --no-overlap --power --quiet'
+            [[ $command == edit ]] || options+=' --dry-run'
+            ;;
+        remove) options='--yes' ;;
+        run) options='--wait' ;;
+        check) options='--repair' ;;
+        import) [[ $cur == -* ]] || compopt -o default 2>/dev/null ;; # names of files
+        esac
+        case $command in
+        show | history | export | edit | enable | disable | remove | run)
+            words=$(tavisched complete-ids 2>/dev/null | cut -f 1)
+            ;;
+        esac
+        if [[ $cur == -* ]]; then
+            words="$options --help"
+        fi
+        ;;
+    esac
+    mapfile -t COMPREPLY < <(compgen -W "$words" -- "$cur")
+}
+
+complete -F _tavisched tavisched

@@ -1,0 +1,143 @@
+#!/bin/bash
+# Makes the Debian packages, and installs, uses, upgrades, removes and purges them in the sandbox with all
+# of /usr and /var private as well. Needs root or sudo.
+#
+#   tests/package_test.sh BUILD_FOLDER     built, and configured with -DCMAKE_INSTALL_PREFIX=/usr
+set -euo pipefail
+source=$(cd "$(dirname "$0")/.." && pwd)
+debs=$(cd "$1" && pwd)/packages
+later=99.0.0
+crontab=/etc/crontab
+check=/usr/tavi/bin/tavi_poweroff_feasible_check
+tasks=/usr/tavi/etc/scheduled_tasks
+log=${2:-$debs}/log
+
+step() { printf 'package_test: %s\n' "$*"; }
+fail() { printf 'package_test: FAILED: %s\n' "$*" >&2; exit 1; }
+expect() { local what=$1; shift; "$@" || fail "$what"; }
+quietly() { "$@" >"$log" 2>&1 </dev/null || { cat "$log" >&2; fail "$*"; }; }
+manage() { quietly dpkg --force-confdef --force-confold "$@"; }
+files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T /mnt; }
+expect_same() { expect "$1 changed $2" cmp "$2" "/mnt/${2##*/}"; }
+expect_own_crontab() { # as it was before the installation
+    expect "after $1 $crontab is not the machine's own" cmp $crontab /mnt/crontab.own
+    expect "$1 changed mode or owner of $crontab" [ "$(stat -c %a:%U:%G $crontab)" = 640:root:adm ]
+}
+expect_only_cron_missing() {
+    local found; found=$(tavisched check | sed -n 's/^problem: //p') || true
+    expect "check complains: $found" [ "${found%%,*}, $(wc -l <<< "$found")" = "cron is not running, 1" ]
+}
+expect_files() {
+    local wrong package=$1; shift
+    for file in "$@"; do
+        expect "$package lacks $file" grep -qx "$file" <(dpkg -L "$package")
+        expect "$file is not there" [ -e "$file" ]
+    done
+    wrong=$(dpkg-deb -c "$debs/now/${package}"_* | grep -Ev '^(l.{9}|[-d]rwxr-xr-x|-rw-r--r--) root/root ') || true
+    expect "$package has files of a wrong owner or mode: $wrong" [ -z "$wrong" ]
+}
+
+if [ $# -eq 1 ]; then
+    expect "$1 is not configured with the prefix /usr" [ -f "$1/CPackConfig.cmake" ]
+    rm -rf "$debs"
+    mkdir "$debs"
+    cd "$1"
+    step "making the packages of this version and of version $later"
+    umask 027 # must not show in the packages
+    quietly cpack -G DEB -B packages/now
+    quietly cpack -G DEB -B packages/later -D CPACK_PACKAGE_VERSION=$later
+    umask 022
+    sudo=; [ "$(id -u)" -eq 0 ] || sudo=sudo
+    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" /mnt
+fi
+
+# What lies in /usr/local on the machine is not tested, and nothing of the environment counts.
+export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive
+unset LD_LIBRARY_PATH LIBRARY_PATH CPATH PKG_CONFIG_PATH CMAKE_PREFIX_PATH
+rm -rf /usr/tavi
+mount -t tmpfs layers /mnt
+for folder in /usr/*/ /var/; do
+    mkdir -p "/mnt$folder"{upper,work}
+    mount -t overlay overlay -o "lowerdir=$folder,upperdir=/mnt${folder}upper,workdir=/mnt${folder}work" "$folder"
+done
+mount -t tmpfs local /usr/local
+manage --purge tavischeduler-dev tavischeduler # where the machine has them
+rm -f /var/lib/man-db/auto-update              # saves time
+mkdir -p /usr/tavi/bin
+touch /usr/tavi/bin/of-the-machine
+printf '%s\n' 'SHELL=/bin/sh' '# tavischedtask' '0 5 * * * root /opt/tavischedtask' > $crontab
+chown root:adm $crontab
+chmod 640 $crontab
+cp $crontab /mnt/crontab.own
+files > /mnt/files
+
+step "installation"
+manage -i "$debs"/now/*.deb
+for package in 'cron | cron-daemon' procps libc6 libjsoncpp libsodium libsqlite3-0 libstdc++6 libunistring; do
+    expect "no dependency on $package" grep -qF "$package" <(dpkg -s tavischeduler | grep ^Depends:)
+done
+lib=/usr/lib/$(cc -print-multiarch)
+expect_files tavischeduler /usr/sbin/tavisched{,task} "$lib"/lib{tavischeduler.so.4,taviplatform.so.1} \
+    /usr/lib/tmpfiles.d/tavischeduler.conf /usr/share/man/man{1/tavisched.1,8/tavischedtask.8}.gz \
+    /usr/share/{bash-completion/completions/tavisched,zsh/vendor-completions/_tavisched} \
+    /usr/share/fish/vendor_completions.d/tavisched.fish /usr/tavi/etc/plugins/task_scheduler \
+    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,changelog.Debian.gz}
+expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavischedsetter}.h \
+    /usr/include/{platc,platplugin,tavisdk}.h "$lib"/lib{tavischeduler,taviplatform}.so \
+    "$lib"/{pkgconfig/tavischeduler.pc,cmake/tavischeduler/tavischeduler-config.cmake} \
+    /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/copyright
+expect "programs look for libraries elsewhere" \
+    [ -z "$(readelf -d /usr/sbin/tavisched{,task} "$lib"/libtavi*.so | grep -E 'R(UN)?PATH')" ]
+expect_only_cron_missing
+
+step "programs built over the installed package"
+# shellcheck disable=SC2046 # a list of words
+quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler sqlite3)
+quietly cmake -S "$source/examples" -B /mnt/example
+quietly cmake --build /mnt/example
+
+step "tasks"
+id=$(tavisched add -q --name Nightly --command 'id -un > /tmp/ran' --daily --at 03:00 --owner nobody)
+quietly tavisched add --power off --weekly Mon --at 04:00
+expect "the task is not listed" grep -q Nightly <(tavisched list)
+expect "a program built over the package does not find the task" grep -q Nightly <(/mnt/task show "$id")
+quietly tavisched run "$id" --wait
+expect "the task did not run as its owner" grep -qx nobody /tmp/ran
+rm /tmp/ran
+expect "$crontab lacks the task's line" grep -q "/tmp/tavischedtask --run id=$id$" $crontab
+expect "$crontab lacks the power-off line" grep -q "$check" $crontab
+
+step "power-off check at boot"
+rm $check
+quietly systemd-tmpfiles --create tavischeduler.conf
+expect "the power-off check is not made" cmp $check /usr/share/tavischeduler/${check##*/}
+echo '# changed on this machine' >> $check
+chmod 700 $check
+cp $check $tasks $crontab /mnt
+quietly systemd-tmpfiles --create tavischeduler.conf
+expect_same boot $check
+expect "boot changed the mode of $check" [ "$(stat -c %a $check)" = 700 ]
+
+step "upgrade"
+manage -i "$debs"/later/*.deb
+expect "a package was not upgraded" [ "$(dpkg -s tavischeduler{,-dev} | grep -c "^Version: $later")" -eq 2 ]
+expect "the versions can differ" grep -q "^Depends: tavischeduler (= $later" <(dpkg -s tavischeduler-dev)
+for file in $check $tasks $crontab; do expect_same upgrade "$file"; done
+
+step "removal"
+manage --remove tavischeduler-dev tavischeduler
+expect_own_crontab removal
+expect_same removal $tasks
+expect "removal left the runner's link" [ ! -L /tmp/tavischedtask ]
+
+step "re-installation"
+manage -i "$debs"/later/*.deb
+expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort /mnt/crontab)
+expect_same re-installation $check
+expect_only_cron_missing
+
+step "purge"
+manage --purge tavischeduler-dev tavischeduler
+expect_own_crontab purge
+expect "purge left or took files" diff /mnt/files <(files)
+step "passed"

@@ -13,10 +13,11 @@ class CommandLine : public SchedTest {
     // A machine in order: what an installation, a boot and cron leave behind.
     void SetUp() override {
         SchedTest::SetUp();
-        shell("mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins;"
-              "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
-              "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
-              "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
+        shell(
+            "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins; chmod 755 /usr/tavi/etc;"
+            "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
+            "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
+            "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
         writeFile("/run/crond.pid", std::to_string(cron_) + "\n");
     }
     // Stands for a cron that is running and takes its signals.
@@ -24,6 +25,7 @@ class CommandLine : public SchedTest {
         cron_ = fork();
         if (cron_ == 0) {
             signal(SIGHUP, SIG_IGN);
+            prctl(PR_SET_NAME, "cron");
             prctl(PR_SET_PDEATHSIG, SIGKILL);
             pause();
         }
@@ -74,7 +76,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"add --command x --weekly ''", "is no day of the week"},
         {"add --command x --weekly Mon,,Fri", "is no day of the week"},
         {"add --command x --once 2099-02-29", "a date of the calendar"},
-        {"add --command x --once 2020-01-01", "2020-01-01 at 00:00 has passed"},
+        {"add --command x --once 2020-01-01", "once on 2020-01-01 at 00:00, has passed"},
         {"add --command x --every 0 --until 20", "--until: it needs an interval"},
         {"add --command x --until 20", "--until: it needs an interval"},
         {"add --command x --every 24", "hours from 1 to 23"},
@@ -102,6 +104,8 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"run 9", "there is no task 9"},
         {"history 9", "there is no task 9"},
         {"list --sort colour", "--sort: colour not in"},
+        {"remove 01x --yes", "\"01x\" is no id; accepted"},
+        {"history --limit 0", "--limit: Value 0 not in range"},
         {"frobnicate", "not expected: frobnicate"},
         {"", "a command is needed"},
     };
@@ -162,8 +166,15 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
     EXPECT_THAT(done("edit 90022300 --at 23:30"), HasSubstr("task 90022330 "));
     EXPECT_THAT(done("disable 90022330"), HasSubstr("task 80022330 "));
     EXPECT_THAT(done("remove 80022330"), HasSubstr("removed"));
+    const std::string before = machine();
     EXPECT_THAT(run("add --power on --at 06:00"), HasSubstr("could not be stored"));
     EXPECT_EQ(status_, 1);
+    EXPECT_EQ(machine(), before);
+    // A first day that lies ahead would keep a task of every day from running.
+    done("add --command x --once 2099-01-01");
+    done("edit 2 --daily");
+    EXPECT_THAT(readFile(kWorking), Not(HasSubstr("2099")));
+    done("remove 2 --yes");
     EXPECT_THAT(listedIds(), ElementsAre(1));
     // Beside a damaged entry the library would store and then fail.
     writeFile("/usr/tavi/etc/auto_power", "[power off]\n000=1 9 99 99\n");
@@ -192,7 +203,13 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
         EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
     }
     EXPECT_THAT(run("check --repair"), HasSubstr("for the line of task 1"));
-    done("edit 1 --at 9:00");
+    EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
+    // Not even while several tasks are changed, as a plug-in handler sees.
+    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
+          "printf '#!/bin/sh\ncat /etc/crontab >> /tmp/seen\n' > see; chmod 755 see");
+    done("disable 2 1");
+    EXPECT_THAT(readFile("/tmp/seen"), AllOf(HasSubstr("SHELL"), Not(HasSubstr("99"))));
+    done("edit 1 --at 9:00 --enabled");
     EXPECT_THAT(readFile(kCrontab),
                 HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n"));
 }
@@ -202,6 +219,25 @@ TEST_F(CommandLine, FiftyAtOnceLoseNothing) {
                     "> /tmp/ids; wait; [ \"$(sort -un /tmp/ids | wc -l)\" = 50 ]"),
               0);
     EXPECT_EQ(listedIds().size(), 50U);
+    EXPECT_THAT(done("check"), HasSubstr("All is well."));
+}
+
+TEST_F(CommandLine, ChangesFollowOneAnother) {
+    done("add --command x");
+    done("add --command x");
+    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
+          "printf '#!/bin/sh\n/usr/tavi/bin/tavisched disable 2 >> /tmp/inner 2>&1\n"
+          "/usr/tavi/bin/tavisched list >> /tmp/inner\nsleep 0.3\n' > nest; chmod 755 nest");
+    // A handler may read; its own change is refused at once, and a signal waits for the end.
+    EXPECT_EQ(shell("/usr/tavi/bin/tavisched edit 1 --at 05:00 > /tmp/out & sleep 0.2; "
+                    "kill -TERM $!; wait $!"),
+              128 + SIGTERM);
+    EXPECT_THAT(readFile("/tmp/inner"),
+                AllOf(HasSubstr("a change is going on"), HasSubstr("daily 0")));
+    EXPECT_THAT(done("list"), HasSubstr("daily 05:00"));
+    // A reader that goes away ends nothing half done.
+    shell("rm -r /usr/tavi/etc/plugins; /usr/tavi/bin/tavisched disable 1 2 | true");
+    EXPECT_THAT(done("list"), Not(HasSubstr("enabled")));
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
 }
 
@@ -216,6 +252,13 @@ TEST_F(CommandLine, ExportAndImportGiveTheSameTasks) {
     EXPECT_EQ(machine(), before);
     EXPECT_EQ(done("import - < /tmp/all.json"), "task 3 (Пример \"x\"), was 1\ntask 4 (Task 2), "
                                                 "was 2\ntask 90022300 (PowerOff task 0)\n");
+    // No task of the file gets the number of a power schedule, and a text of the web back end,
+    // which names no backend, is known as one.
+    shell(
+        "sed 's/\"id\": .*1.*/\"id\": \"\\\\\"90022301\\\\\"\",/; /backend/d' /tmp/all.json > /tmp/web.json");
+    EXPECT_EQ(done("import /tmp/web.json"),
+              "task 5 (Пример \"x\"), was 90022301\ntask 6 (Task 2), was "
+              "2\ntask 90022300 (PowerOff task 0)\n");
     // A section that cannot be read keeps its id.
     shell("sed -i 's/^run hour=0/run hour=x/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks");
     EXPECT_THAT(done("import /tmp/all.json"), HasSubstr(", was 1\n"));
@@ -258,7 +301,9 @@ TEST_F(CommandLine, RunsNowAndFollows) {
     done("add --command 'echo $HOME > /tmp/ran'");
     done("add --command 'exit 3'");
     done("add --command 'kill -9 $$'");
-    done("add --command 'sleep 1000 &' --disabled"); // what it leaves behind is not waited for
+    // What it leaves behind is not waited for, nor taken for it.
+    done("add --command 'sleep 1000 & /usr/tavi/bin/tavisched run 5' --disabled");
+    done("add --command true");
     EXPECT_EQ(run("run 1 2 3 4 --wait"),
               "task 1 (Task 1): started\ntask 2 (Task 2): started\ntask 3 (Task 3): started\n"
               "task 4 (Task 4): started\ntask 1 (Task 1): ok\ntask 2 (Task 2): exit 3\n"
@@ -386,20 +431,27 @@ TEST_F(CommandLine, FindsAndMendsWhatIsWrong) {
         {"rm /tmp/tavischedtask", "tavischedtask is missing", true},
         {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true},
         {"chown -h bin /tmp/tavischedtask", "belongs to another user", true},
-        {"cp /bin/true /usr/tavi/run; chmod 777 /usr/tavi/run; ln -sf /usr/tavi/run "
-         "/tmp/tavischedtask",
+        {"mkdir -m 775 /usr/tavi/g; chgrp bin /usr/tavi/g; cp /usr/tavi/bin/tavischedtask "
+         "/usr/tavi/g; ln -sf /usr/tavi/g/tavischedtask /tmp",
          "others than root can replace", true},
         {"rmdir /tmp/lock", "/tmp/lock is missing", true},
-        {"chown bin /tmp/lock", "not a folder of root's", false},
+        {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", false},
+        {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},
+        {"chown bin /tmp/lock", "/tmp/lock must belong to root", false},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
         {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
-        {"chmod 666 /tmp/scheduled_tasks", "so that no task is read from it", true},
+        {"chmod 666 /tmp/scheduled_tasks", "its tasks run as anybody", true},
+        {"mkfifo /tmp/f; mv /tmp/f /tmp/scheduled_tasks", "its tasks run as anybody", true},
+        {"chown bin /usr/tavi/etc/scheduled_tasks", "scheduled_tasks must belong to root", false},
+        {"chmod 775 /usr/tavi/etc", "/usr/tavi/etc must belong to root", false},
+        {"echo bad > /tmp/sched_status.sqlite", "no task runs without its status database", true},
+        {"chmod 664 /etc/crontab", "cron ignores /etc/crontab, which must be", false},
         {"rm /usr/tavi/etc/scheduled_tasks", "lost when the machine restarts", true},
         {"sed -i s/daily/weekly/ /usr/tavi/etc/scheduled_tasks", "differ", false},
         {"touch /usr/tavi/etc/scheduled_tasks.bak", "put aside", false},
         {"sed -i /id=1/d /etc/crontab", "lacks a task's line", true},
         {"echo '# /tmp/tavischedtask' >> /etc/crontab", "that no task asks for", true},
-        {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "not those of the power-off schedules", true},
+        {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "has other power-off lines", true},
         {"printf x >> /etc/crontab", "has no line feed", false},
         {"rm /etc/crontab", "cannot be read", false},
         {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
@@ -411,6 +463,14 @@ TEST_F(CommandLine, FindsAndMendsWhatIsWrong) {
          "no user with the id 54321", false},
         {"sed -i 's/^\\[1]/[5]/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
          "section [5] of /tmp/scheduled_tasks says that its task has the id 1", false},
+        {"sed -i 's/^\\[1]/[1/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "has a damaged header: [1", false},
+        {"cat /tmp/scheduled_tasks >> /usr/tavi/etc/scheduled_tasks; "
+         "cp /usr/tavi/etc/scheduled_tasks /tmp",
+         "has the section [1] more than once", false},
+        {"sed -i 's/^type=daily/type=Daily/' /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks",
+         "is not read as it is written: \"type\"", false},
+        {"echo '001=1 127 23 0' >> /usr/tavi/etc/auto_power", "is there more than once", true},
         {"echo '000=bad' >> /usr/tavi/etc/auto_power", "power schedules cannot be read", false},
         {"mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler; "
          "echo '#!/bin/sh' > a; chmod 775 a",
@@ -432,7 +492,8 @@ TEST_F(CommandLine, FindsAndMendsWhatIsWrong) {
         const std::string said = run("check --repair");
         EXPECT_EQ(status_, c.mended ? 0 : 1) << c.harm << "\n" << said;
         EXPECT_TRUE(!c.mended || said.find("mended: ") != std::string::npos) << c.harm;
-        // Nothing was lost by it.
+        // Nothing was lost by it, and cron's file is as good as before.
+        EXPECT_THAT(said, Not(HasSubstr("the hour")));
         EXPECT_TRUE(!c.mended || done("list").find("Task 1") != std::string::npos) << c.harm;
     }
 }
@@ -444,12 +505,22 @@ TEST_F(CommandLine, SaysWhatStandsInItsWay) {
     EXPECT_EQ(status_, 1);
     EXPECT_THAT(run("list"), HasSubstr("warning: /tmp/scheduled_tasks is missing"));
     done("check --repair");
-    // The library stores although the crontab cannot be written; people are told.
+    // The library stores although the crontab cannot be written, and cuts files on a full disk;
+    // here everything is taken back.
+    const std::string before = machine();
     shell("cp /etc/crontab /run/crontab; mount -n --bind /run/crontab /etc/crontab");
-    EXPECT_THAT(run("add --command y"), HasSubstr("stored, but /etc/crontab could not be written"));
+    EXPECT_THAT(run("add --command y"), HasSubstr("/etc/crontab could not be written"));
     EXPECT_EQ(status_, 1);
+    EXPECT_THAT(run("remove 1"), HasSubstr("everything is as it was before"));
     shell("umount -n /etc/crontab");
-    done("sync");
+    EXPECT_EQ(machine(), before);
+    shell("cp -a /usr/tavi/etc /run; mount -n -t tmpfs -o size=12k,mode=755 small /usr/tavi/etc; "
+          "cp -a /run/etc/. /usr/tavi/etc");
+    EXPECT_THAT(run("add --command \"$(head -c 9000 /dev/zero | tr '\\0' x)\""),
+                HasSubstr("could not be stored"));
+    EXPECT_EQ(machine(), before);
+    EXPECT_THAT(run("check"), HasSubstr("All is well."));
+    shell("umount -n /usr/tavi/etc");
     if (shell("setpriv --reuid=1 --clear-groups true") != 0) {
         GTEST_SKIP() << "needs several users";
     }

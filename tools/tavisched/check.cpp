@@ -2,20 +2,20 @@
 // that others build on come first, so that mending in this order leads to a machine in order.
 #include "check.h"
 #include "crontab.h"
+#include "failure.h"
+#include "files.h"
 #include "paths.h"
-#include "store.h"
+#include "runs.h"
 #include "stored_form.h"
+#include "task_lines.h"
 #include "task_rules.h"
+#include "tasks.h"
 #include "text.h"
 
 #include <algorithm>
-#include <cerrno>
-#include <cstdlib>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <optional>
-#include <sys/stat.h>
+#include <set>
 #include <unistd.h>
 
 namespace tavisched {
@@ -24,122 +24,91 @@ namespace {
 
 namespace fs = std::filesystem;
 using Findings = std::vector<Finding>;
+using Mend = std::function<void()>;
 
-std::optional<struct stat> statusOf(const char *path) {
-    struct stat status {};
-    return lstat(path, &status) == 0 ? std::optional(status) : std::nullopt;
-}
+constexpr const char *kNobodyElse = " must belong to root, and nobody else may write it";
 
 bool isEmptyOrMissing(const char *path) {
     const auto status = statusOf(path);
     return !status || status->st_size == 0;
 }
 
-// ---- Mending ----
-
-// Makes a file anew from another one; it appears whole or not at all, and no link is followed.
-void copyOver(const char *from, const char *to) {
-    std::ifstream source(from, std::ios::binary);
-    const std::string text(std::istreambuf_iterator<char>(source), {});
-    std::string path = std::string(to) + ".XXXXXX";
-    const int fd = mkstemp(path.data()); // mode 0600
-    const bool written = fd != -1 &&
-                         write(fd, text.data(), text.size()) == static_cast<ssize_t>(text.size()) &&
-                         fsync(fd) == 0;
-    const int writeErrno = errno;
-    if (fd != -1) {
-        close(fd);
-    }
-    if (!source || !written || rename(path.c_str(), to) != 0) {
-        errno = written ? errno : writeErrno;
-        const std::string why = systemReason();
-        unlink(path.c_str());
-        throw Failure(std::string(to) + " could not be made from " + from + ": " + why);
-    }
-}
-
-void makeFolder(const char *path) {
-    std::error_code error;
-    fs::create_directories(path, error);
-    if (error || chmod(path, 0755) != 0) {
-        throw Failure(std::string(path) + " could not be made");
-    }
-}
-
-// The runner lies beside this program.
-fs::path ownRunner() {
-    return fs::canonical("/proc/self/exe").parent_path() / "tavischedtask";
-}
-
-void linkRunner() {
-    if (unlink(kRunner) != 0 && errno != ENOENT) {
-        throw Failure(std::string(kRunner) + " could not be removed: " + systemReason());
-    }
-    if (symlink(ownRunner().c_str(), kRunner) != 0) {
-        throw Failure(std::string(kRunner) + " could not be made: " + systemReason());
-    }
+std::string rootsAlone(const std::string &path) {
+    return "look who changed it; then chown root " + path + " and chmod go-w " + path;
 }
 
 // ---- Files ----
 
 void inspectFolders(Findings &findings) {
-    if (access(kFolder, F_OK) != 0) {
+    const auto folder = statusOf(kFolder);
+    if (!folder) {
         findings.push_back({std::string(kFolder) + ", where tasks are kept, is missing", "make it",
-                            [] { makeFolder(kFolder); }});
+                            [] { fs::create_directories(kFolder); }});
+    } else if (!S_ISDIR(folder->st_mode) || !isRootsAlone(*folder)) {
+        findings.push_back({kFolder + std::string(kNobodyElse), rootsAlone(kFolder), {}});
     }
     const auto lock = statusOf(kLockFolder);
     if (!lock) {
         findings.push_back({std::string(kLockFolder) +
                                 " is missing; the first user to make it could keep tasks from "
                                 "running",
-                            "make it as root, with mode 0755", [] { makeFolder(kLockFolder); }});
-    } else if (!S_ISDIR(lock->st_mode) || lock->st_uid != 0 || (lock->st_mode & S_IWOTH) != 0) {
-        findings.push_back({std::string(kLockFolder) +
-                                " is not a folder of root's that nobody else may write, so that no "
-                                "task runs",
+                            "make it as root, with mode 0755", [] {
+                                if (mkdir(kLockFolder, 0755) != 0) {
+                                    throw Failure(std::string(kLockFolder) +
+                                                  " could not be made: " + systemReason());
+                                }
+                            }});
+    } else if (!S_ISDIR(lock->st_mode) || !isRootsAlone(*lock)) {
+        findings.push_back({kLockFolder + std::string(kNobodyElse) + ", or no task runs",
                             std::string("remove it: rm -r ") + kLockFolder,
                             {}});
     }
 }
 
-bool isTrustedWorkingCopy(const struct stat &status) {
-    return S_ISREG(status.st_mode) && status.st_uid == 0 && (status.st_mode & S_IWOTH) == 0;
+void inspectStrangeFiles(Findings &findings) {
+    if (stateOf(kWorkingCopy) == FileState::Strange) {
+        const bool canRestore =
+            stateOf(kPersistent) == FileState::Trusted && !isEmptyOrMissing(kPersistent);
+        findings.push_back(
+            {kWorkingCopy + std::string(kNobodyElse) + ", and its tasks run as anybody",
+             canRestore ? std::string("replace it by ") + kPersistent : rootsAlone(kWorkingCopy),
+             canRestore ? [] { replaceFile(kWorkingCopy, contentOf(kPersistent)); } : Mend()});
+    }
+    for (const char *const path : {kPersistent, kPowerSchedules}) {
+        if (stateOf(path) == FileState::Strange) {
+            findings.push_back({path + std::string(kNobodyElse), rootsAlone(path), {}});
+        }
+    }
 }
 
 // Answers whether tasks can be read at all; else everything that follows from them would look
 // wrong.
 bool inspectTaskFiles(Findings &findings) {
-    const auto working = statusOf(kWorkingCopy);
-    const auto restore = [] { copyOver(kPersistent, kWorkingCopy); };
-    if (working && !isTrustedWorkingCopy(*working)) {
-        findings.push_back({std::string(kWorkingCopy) +
-                                " is not a file of root's that nobody else may write, so "
-                                "that no task is read from it",
-                            std::string("remove it, or replace it by ") + kPersistent,
-                            isEmptyOrMissing(kPersistent) ? std::function<void()>() : restore});
-        return false;
-    }
+    inspectStrangeFiles(findings);
     switch (compareCopies()) {
     case Copies::Same:
-        break;
+        return true;
+    case Copies::Strange:
+        return false;
     case Copies::WorkingMissing:
-        findings.push_back({std::string(kWorkingCopy) + ", from which tasks are read, is missing "
-                                                        "or empty",
-                            std::string("make it from ") + kPersistent, restore});
+        findings.push_back(
+            {std::string(kWorkingCopy) + ", from which tasks are read, is missing or empty",
+             std::string("make it from ") + kPersistent,
+             [] { replaceFile(kWorkingCopy, contentOf(kPersistent)); }});
         return false;
     case Copies::PersistentMissing:
-        findings.push_back({std::string(kPersistent) + " is missing, so that all tasks are lost "
-                                                       "when the machine restarts",
+        findings.push_back({std::string(kPersistent) +
+                                " is missing, so that all tasks are lost when the machine restarts",
                             std::string("make it from ") + kWorkingCopy,
-                            [] { copyOver(kWorkingCopy, kPersistent); }});
-        break;
+                            [] { replaceFile(kPersistent, contentOf(kWorkingCopy)); }});
+        return true;
     case Copies::Different:
         findings.push_back({std::string(kWorkingCopy) + ", which is in use, and " + kPersistent +
                                 ", which outlives a restart, differ",
                             std::string("compare them with diff; keep what is in use: cp ") +
                                 kWorkingCopy + " " + kPersistent +
-                                "; or go back to what is stored: cp " + kPersistent + " " +
-                                kWorkingCopy + "; then tavisched sync",
+                                "; or go back to what is stored, unless it is cut short: cp " +
+                                kPersistent + " " + kWorkingCopy + "; then tavisched sync",
                             {}});
     }
     return true;
@@ -159,16 +128,20 @@ void inspectPutAside(Findings &findings) {
 
 // Whether somebody other than root could put another program in the place of this one.
 bool isInForeignHands(const fs::path &program) {
-    struct stat status {};
     for (fs::path path = program; path != path.root_path(); path = path.parent_path()) {
-        const bool othersWrite = lstat(path.c_str(), &status) != 0 || status.st_uid != 0 ||
-                                 ((status.st_mode & S_IWOTH) != 0 &&
-                                  !(S_ISDIR(status.st_mode) && (status.st_mode & S_ISVTX) != 0));
-        if (othersWrite) {
+        const auto status = statusOf(path.c_str());
+        const bool isSticky = status && S_ISDIR(status->st_mode) && status->st_uid == 0 &&
+                              (status->st_mode & S_ISVTX) != 0;
+        if (!status || (!isRootsAlone(*status) && !isSticky)) {
             return true;
         }
     }
     return false;
+}
+
+// The runner lies beside this program.
+fs::path ownRunner() {
+    return fs::canonical("/proc/self/exe").parent_path() / "tavischedtask";
 }
 
 std::string whyNoRunner() {
@@ -181,8 +154,9 @@ std::string whyNoRunner() {
     if (link->st_uid != 0) {
         return "belongs to another user than root";
     }
-    if (!fs::is_regular_file(target, error) || access(kRunner, X_OK) != 0) {
-        return "is no program, so that no task runs";
+    if (!fs::is_regular_file(target, error) || access(kRunner, X_OK) != 0 ||
+        target.filename() != ownRunner().filename()) {
+        return "is not the program tavischedtask, so that no task runs";
     }
     return isInForeignHands(target)
                ? "leads to " + target.string() + ", which others than root can replace"
@@ -199,34 +173,74 @@ void inspectRunner(Findings &findings) {
     findings.push_back({std::string("the runner ") + kRunner + " " + why,
                         canMend ? "make it a link to " + own.string()
                                 : "make it a link to tavischedtask in a folder of root's",
-                        canMend ? linkRunner : std::function<void()>()});
+                        canMend ? [own] { replaceByLink(kRunner, own); } : Mend()});
 }
 
 // ---- Tasks ----
+
+// The headers of the working copy, as somebody who damaged it left them.
+void inspectHeaders(Findings &findings) {
+    std::set<std::string> names;
+    for (const std::string &line : split(contentOf(kWorkingCopy), '\n')) {
+        if (line.starts_with('[') && !names.insert(line).second) {
+            findings.push_back({std::string(kWorkingCopy) + " has the section " + printable(line) +
+                                    " more than once",
+                                "give it another number in both task files by hand",
+                                {}});
+        } else if (line.starts_with('[') && (line.size() < 3 || !line.ends_with(']'))) {
+            findings.push_back(
+                {std::string(kWorkingCopy) + " has a damaged header: " + printable(line),
+                 "mend it in both task files by hand",
+                 {}});
+        }
+    }
+}
+
+void inspectSection(const std::string &name, const StoredForm &rules, Findings &findings) {
+    const std::string section = "the section [" + printable(name) + "] of " + kWorkingCopy;
+    Hash form;
+    PLATCFileGetSection(kWorkingCopy, name.c_str(), form.address());
+    if (const auto faults = rules.faultsOf(form)) {
+        findings.push_back({section +
+                                (faults->readable ? " is not read as it is written: "
+                                                  : " is no task that can be read: ") +
+                                faults->what,
+                            "mend it in both task files by hand, or remove it there",
+                            {}});
+    } else if (form.value("id") != name) {
+        findings.push_back({section + " says that its task has the id " + form.value("id"),
+                            "give both the same number in both task files",
+                            {}});
+    } else if (name.starts_with('-') || name == "0") {
+        findings.push_back(
+            {section + " has a number below 1", "give it another one in both task files", {}});
+    }
+}
 
 void inspectSections(Findings &findings) {
     if (isEmptyOrMissing(kWorkingCopy)) {
         return;
     }
+    inspectHeaders(findings);
     const StoredForm rules;
     PLATCSZLIST *names = PLATCSzListAlloc(1);
     const int count = PLATCFileEnumSection(kWorkingCopy, &names);
     for (int i = 0; i < count; ++i) {
-        const std::string name = PLATCSzListGet(names, i);
-        const std::string section = "the section [" + printable(name) + "] of " + kWorkingCopy;
-        Hash form;
-        PLATCFileGetSection(kWorkingCopy, name.c_str(), form.address());
-        if (const auto why = rules.whyUnreadable(form)) {
-            findings.push_back({section + " is no task that can be read: " + *why,
-                                "mend it in both task files by hand, or remove it there",
-                                {}});
-        } else if (form.value("id") != name) {
-            findings.push_back({section + " says that its task has the id " + form.value("id"),
-                                "give both the same number in both task files",
-                                {}});
-        }
+        inspectSection(PLATCSzListGet(names, i), rules, findings);
     }
     PLATCSzListFree(names);
+}
+
+// Daily and weekly tasks run from their first day on, although their next run is shown before it.
+bool startsLater(const TAVI_SCHED_TASK &task) {
+    TAVI_SCHED_DATE now{};
+    TAVI_SCHED_DATE start{};
+    start.year = task.startYear;
+    start.month = task.startMonth;
+    start.day = task.startDay;
+    const bool isByDay = task.type == TAVI_SCHED_TYPE_DAILY || task.type == TAVI_SCHED_TYPE_WEEKLY;
+    return isByDay && task.state == TAVI_SCHED_STATE_ENABLED && TAVISchedDateGet(&now) == 0 &&
+           TAVISchedDateComp(&now, &start) < 0;
 }
 
 void inspectTasks(const Tasks &tasks, Findings &findings) {
@@ -239,9 +253,15 @@ void inspectTasks(const Tasks &tasks, Findings &findings) {
                  "mend its schedule with tavisched edit " + id + ", or tavisched disable " + id,
                  {}});
         } else if (const auto fault = findFault(*task)) {
-            findings.push_back({called(*task) + ": its \"" + std::string(fault->key) +
-                                    "\" is wrong: " + fault->what,
-                                "mend it with tavisched edit " + id,
+            findings.push_back(
+                {called(*task) + ": its \"" + std::string(fault->key) +
+                     "\" is wrong: " + fault->what,
+                 "mend it with tavisched edit " + id + ", or where the task was made",
+                 {}});
+        } else if (startsLater(*task)) {
+            findings.push_back({called(*task) + " does not run before its first day, whatever is "
+                                                "shown as its next run",
+                                "say its days anew: tavisched edit " + id + " --daily or --weekly",
                                 {}});
         }
     }
@@ -252,14 +272,26 @@ void inspectTasks(const Tasks &tasks, Findings &findings) {
 void inspectCron(Findings &findings) {
     std::ifstream file(kCronPid);
     pid_t pid = 0;
-    if (!(file >> pid) || PLATCProcAlive(pid) == 0) {
+    std::string name;
+    if (file >> pid && PLATCProcAlive(pid) == 1) {
+        std::getline(std::ifstream("/proc/" + std::to_string(pid) + "/comm") >> std::ws, name);
+    }
+    if (name.find("cron") == std::string::npos) {
         findings.push_back({"cron is not running, so that no task runs",
                             "start it: systemctl enable --now cron",
                             {}});
     }
 }
 
-void inspectForeignLines(const Crontab &crontab, Findings &findings) {
+void inspectCrontabFile(const Crontab &crontab, Findings &findings) {
+    const auto status = statusOf(kCrontab);
+    if (!status || !S_ISREG(status->st_mode) || !isRootsAlone(*status) || status->st_nlink != 1) {
+        findings.push_back({"cron ignores " + std::string(kCrontab) +
+                                ", which must be a file of root's with one name, and writable by "
+                                "nobody else",
+                            rootsAlone(kCrontab),
+                            {}});
+    }
     for (size_t i = 0; i < crontab.lines.size(); ++i) {
         const CrontabLine line = parseCrontabLine(crontab.lines[i]);
         if (line.kind == CrontabLine::Kind::Rejected &&
@@ -278,23 +310,23 @@ void inspectForeignLines(const Crontab &crontab, Findings &findings) {
     }
 }
 
-bool hasRejectedLine(const Tasks &tasks) {
-    return std::any_of(tasks.all().begin(), tasks.all().end(),
-                       [](const auto *task) { return whyCronRejects(*task).has_value(); });
-}
-
-void inspectOwnLines(const Tasks &tasks, Findings &findings) {
+// Lines of sections that cannot be read, or that cron would reject, are for a person to mend.
+void inspectLines(const Tasks &tasks, bool canMend, Findings &findings) {
     const CrontabDifference difference = compareCrontab(tasks);
-    const std::function<void()> sync =
-        hasRejectedLine(tasks) ? std::function<void()>() : [] { TAVISchedTaskSync(); };
+    const Mend sync = canMend && !anyRejected(tasks) ? syncCrontab : Mend();
+    std::vector<std::string> differences;
     for (const std::string &line : difference.missing) {
-        findings.push_back(
-            {std::string(kCrontab) + " lacks a task's line: " + line, "tavisched sync", sync});
+        differences.push_back("lacks a task's line: " + printable(line));
     }
     for (const std::string &line : difference.surplus) {
+        differences.push_back("has a line that no task asks for: " + printable(line));
+    }
+    if (!tasks.lacksPower() && !arePowerOffLinesRight(tasks)) {
+        differences.emplace_back("has other power-off lines than the power-off schedules ask for");
+    }
+    if (!differences.empty()) {
         findings.push_back(
-            {std::string(kCrontab) + " has a line that no task asks for: " + printable(line),
-             "tavisched sync", sync});
+            {std::string(kCrontab) + " " + join(differences, "\n  and "), "tavisched sync", sync});
     }
 }
 
@@ -305,21 +337,32 @@ bool anyEnabledPower(const Tasks &tasks, std::string_view arguments) {
                        [&](const auto *task) { return isEnabledPower(*task, arguments); });
 }
 
-void inspectPowerOff(const Tasks &tasks, const Crontab &crontab, Findings &findings) {
-    if (!arePowerOffLinesRight(tasks, crontab)) {
-        findings.push_back({"the power-off lines of " + std::string(kCrontab) +
-                                " are not those of the power-off schedules",
-                            "tavisched sync", [] { TAVISchedTaskSync(); }});
+void inspectTwins(const Tasks &tasks, Findings &findings) {
+    for (const TAVI_SCHED_TASK *const task : tasks.all()) {
+        if (isPower(*task) && tasks.findSameSchedule(*task) != task) {
+            findings.push_back({called(*task) + " is there more than once, and a change by its id "
+                                                "finds only one of them",
+                                "remove one of them",
+                                [id = task->id] { TAVISchedTaskRemove(id); }});
+        }
     }
+}
+
+void inspectPower(const Tasks &tasks, Findings &findings) {
+    if (tasks.lacksPower()) {
+        findings.push_back({"the power schedules cannot be read: " + libraryError(),
+                            "mend or remove the damaged entry in " + std::string(kPowerSchedules) +
+                                ", four numbers each: enabled, week bits, hour, minute",
+                            {}});
+        return;
+    }
+    inspectTwins(tasks, findings);
     if (anyEnabledPower(tasks, kPowerOff) && access(kPowerOffCheck, X_OK) != 0) {
         findings.push_back({std::string(kPowerOffCheck) +
                                 ", which power-off schedules run, is missing or no program",
                             "install one; a default one comes with the package",
                             {}});
     }
-}
-
-void inspectWakeAlarm(const Tasks &tasks, Findings &findings) {
     if (anyEnabledPower(tasks, kPowerOn) && access(kWakeAlarm, W_OK) != 0) {
         findings.push_back({"there are power-on schedules, but this machine has no clock that can "
                             "wake it (" +
@@ -329,10 +372,18 @@ void inspectWakeAlarm(const Tasks &tasks, Findings &findings) {
     }
 }
 
-// ---- Plug-ins ----
+// ---- Results and plug-ins ----
 
-bool isRootsAlone(const struct stat &status) {
-    return status.st_uid == 0 && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+void inspectStatusDatabase(Findings &findings) {
+    try {
+        readRuns();
+    } catch (const Failure &failure) {
+        findings.push_back(
+            {std::string("no task runs without its status database: ") + failure.what(),
+             std::string("remove ") + kStatusDatabase +
+                 ", which the next run makes anew; how earlier runs ended is lost",
+             [] { unlink(kStatusDatabase); }});
+    }
 }
 
 // A file that was meant as a handler begins as a script or a program does.
@@ -350,16 +401,15 @@ void inspectHandler(const fs::path &path, Findings &findings) {
         return;
     }
     if (!executable) {
-        findings.push_back({"the plug-in handler " + path.string() +
-                                " is skipped, as it is not "
-                                "executable",
-                            "chmod 755 it",
-                            {}});
-    } else if (!S_ISREG(status->st_mode) || !isRootsAlone(*status)) {
+        findings.push_back(
+            {"the plug-in handler " + path.string() + " is skipped, as it is not executable",
+             "chmod 755 it",
+             {}});
+    } else if (stateOf(path.c_str()) == FileState::Strange) {
         findings.push_back({"the plug-in handler " + path.string() +
                                 " is skipped: it must be a file of root's that nobody else may "
                                 "write",
-                            "chown root it and chmod 755 it",
+                            rootsAlone(path),
                             {}});
     }
 }
@@ -370,10 +420,10 @@ void inspectPlugins(Findings &findings) {
         return;
     }
     if (!S_ISDIR(folder->st_mode) || !isRootsAlone(*folder)) {
-        findings.push_back({std::string("all plug-in handlers are skipped: ") + kPlugins +
-                                " must be a folder of root's that nobody else may write",
-                            std::string("chown root ") + kPlugins + " and chmod 755 it",
-                            {}});
+        findings.push_back(
+            {std::string("all plug-in handlers are skipped: ") + kPlugins + kNobodyElse,
+             rootsAlone(kPlugins),
+             {}});
         return;
     }
     std::error_code error;
@@ -391,20 +441,15 @@ void inspectWithTasks(Findings &findings) {
                             {}});
         return;
     }
-    inspectForeignLines(*crontab, findings);
+    inspectCrontabFile(*crontab, findings);
+    const size_t before = findings.size();
+    inspectSections(findings);
+    const bool allSectionsGood = findings.size() == before;
     try {
         const Tasks tasks = Tasks::read();
         inspectTasks(tasks, findings);
-        inspectOwnLines(tasks, findings);
-        if (tasks.lacksPower()) {
-            findings.push_back(
-                {"the power schedules cannot be read: " + libraryError(),
-                 "mend or remove the damaged entry in " + std::string(kPowerSchedules),
-                 {}});
-        } else {
-            inspectPowerOff(tasks, *crontab, findings);
-            inspectWakeAlarm(tasks, findings);
-        }
+        inspectLines(tasks, allSectionsGood, findings);
+        inspectPower(tasks, findings);
     } catch (const Failure &failure) {
         findings.push_back(
             {failure.what(), "tavisched --verbose check shows the library's log lines", {}});
@@ -421,9 +466,9 @@ std::vector<Finding> inspectMachine() {
     inspectRunner(findings);
     inspectCron(findings);
     if (readable) {
-        inspectSections(findings);
         inspectWithTasks(findings);
     }
+    inspectStatusDatabase(findings);
     inspectPlugins(findings);
     return findings;
 }

@@ -1,14 +1,14 @@
-// The subcommands that change tasks. Each takes the lock first, checks everything, and only then
-// stores.
+// The subcommands that change tasks. Each checks everything under the lock before it stores
+// anything, and prints when the lock is released: a reader that goes away ends nothing half done.
+#include "change.h"
 #include "commands.h"
+#include "failure.h"
+#include "files.h"
 #include "json.h"
-#include "store.h"
 #include "words.h"
 
 #include <algorithm>
 #include <cstdio>
-#include <filesystem>
-#include <fstream>
 #include <iostream>
 #include <iterator>
 #include <string_view>
@@ -18,9 +18,18 @@ namespace tavisched {
 
 namespace {
 
-constexpr size_t kMaxPowerSchedules = 100; // of a kind; more are stored but not read
+constexpr size_t kMaxPowerSchedules = 100; // of a kind; the library reads no more
 
-using TaskPointers = std::vector<const TAVI_SCHED_TASK *>;
+using Lines = std::vector<std::string>;
+
+int print(const Lines &lines) {
+    for (const std::string &line : lines) {
+        std::printf("%s\n", line.c_str());
+    }
+    return 0;
+}
+
+// ---- What must hold ----
 
 // The tasks as they will be when those of the same id have been replaced by the changed ones, and
 // the new ones are there.
@@ -72,211 +81,92 @@ void requireStorable(const TaskPointers &tasksAfterwards) {
     requireGoodCrontab(tasksAfterwards);
 }
 
+// ---- What is told ----
+
 // The stored task with its next run, as the library has it now.
-void report(const TAVI_SCHED_TASK &stored) {
+void addReport(const TAVI_SCHED_TASK &stored, Lines &lines) {
     const Tasks tasks = Tasks::read();
     const TAVI_SCHED_TASK *const task = tasks.find(stored.id);
     if (!task) {
-        throw Failure(called(stored) + " was stored, but cannot be read");
+        throw Failure(called(stored) + " cannot be read back");
     }
     const std::string next = task->state == TAVI_SCHED_STATE_ENABLED
                                  ? "next run " + nextRun(*task).value_or("never")
                                  : "disabled";
-    std::printf("%s: %s, %s\n", called(*task).c_str(), scheduleInWords(*task).c_str(),
-                next.c_str());
+    lines.push_back(called(*task) + ": " + scheduleInWords(*task) + ", " + next);
     if (const std::string remark = remarkOn(*task); !remark.empty()) {
-        std::printf("Note: %s.\n", remark.c_str());
+        lines.push_back("Note: " + remark + ".");
     }
 }
 
-void reportChange(const TAVI_SCHED_TASK &stored, bool quiet) {
+Lines reportOf(const TAVI_SCHED_TASK &stored, bool quiet) {
+    Lines lines;
     if (quiet) {
-        std::printf("%ld\n", static_cast<long>(stored.id));
+        lines.push_back(std::to_string(stored.id));
     } else {
-        report(stored);
+        addReport(stored, lines);
+    }
+    return lines;
+}
+
+// A next run is not to be believed while cron ignores the file.
+void warnOfRejectedLines() {
+    const auto crontab = readCrontab();
+    for (size_t i = 0; crontab && i < crontab->lines.size(); ++i) {
+        const CrontabLine line = parseCrontabLine(crontab->lines[i]);
+        if (line.kind == CrontabLine::Kind::Rejected) {
+            std::cerr << "tavisched: warning: cron ignores all of /etc/crontab for its line "
+                      << i + 1 << "; \"tavisched check\" tells more\n";
+            return;
+        }
     }
 }
 
 int printDryRun(TAVI_SCHED_TASK &task) {
     if (!isPower(task)) {
         // A new task's default name tells the id that it will get.
-        const Task example = newTask(TAVI_SCHED_BACKEND_SCHEDULE);
-        std::sscanf(example->name, "Task %d", &task.id);
+        std::sscanf(newTask(TAVI_SCHED_BACKEND_SCHEDULE)->name, "Task %d", &task.id);
     }
     if (TAVISchedNextTriggerTime(&task) != 0) {
         throw Failure("the next run cannot be computed: " + libraryError());
     }
     const bool enabled = task.state == TAVI_SCHED_STATE_ENABLED;
-    std::printf("Crontab line: %s\n", isPower(task) ? "none of a task; the power schedule's own"
-                                      : enabled     ? crontabLine(task).c_str()
-                                                    : "none while disabled");
+    std::printf("Crontab line: %s\n", !enabled        ? "none while disabled"
+                                      : isPower(task) ? "that of a power schedule, if it needs one"
+                                                      : crontabLine(task).c_str());
     std::printf("Next run: %s\n", nextRun(task).value_or("never").c_str());
     return 0;
 }
 
-bool confirmed(const TaskPointers &tasks) {
-    if (isatty(STDIN_FILENO) == 0) {
-        return true;
+// ---- Removing ----
+
+// What a person was shown of a task; the task must still be that one when it is removed.
+std::string shownOf(const TAVI_SCHED_TASK &task) {
+    return called(task) + ": " + scheduleInWords(task);
+}
+
+Lines showToRemove(const Ids &ids) {
+    const Lock lock(Lock::Kind::Reading);
+    const Tasks tasks = Tasks::read();
+    Lines shown;
+    for (const TAVI_SCHED_TASK *const task : tasks.select(ids)) {
+        shown.push_back(shownOf(*task));
     }
-    for (const TAVI_SCHED_TASK *const task : tasks) {
-        std::printf("%s: %s\n", called(*task).c_str(), scheduleInWords(*task).c_str());
+    return shown;
+}
+
+bool isConfirmed(const Lines &shown) {
+    for (const std::string &line : shown) {
+        std::cerr << line << "\n";
     }
-    std::printf("Remove %s? [y/N] ", tasks.size() == 1 ? "it" : "them");
-    std::fflush(stdout);
+    std::cerr << "Remove " << (shown.size() == 1 ? "it" : "them") << "? [y/N] ";
     std::string answer;
     std::getline(std::cin, answer);
     return answer == "y" || answer == "Y" || answer == "yes";
 }
 
-// ---- Import ----
-
-std::string readWhole(const std::string &file) {
-    if (file == "-") {
-        return {std::istreambuf_iterator<char>(std::cin), {}};
-    }
-    if (std::error_code ignored; std::filesystem::is_directory(file, ignored)) {
-        throw Refusal(file + " is a folder; accepted: a file, or - for standard input");
-    }
-    std::ifstream stream(file, std::ios::binary);
-    std::string text(std::istreambuf_iterator<char>(stream), {});
-    if (!stream) {
-        throw Refusal(file + ": " + systemReason());
-    }
-    return text;
-}
-
-// Stores imported tasks; those that were stored go again when a later one fails.
-class ImportStore {
-  public:
-    explicit ImportStore(const Tasks &present) : present_(present) {}
-
-    void store(TAVI_SCHED_TASK &task) {
-        const int32_t wanted = task.id;
-        if (isPower(task)) {
-            storePower(task);
-        } else if (wanted > 0 && !present_.find(wanted) && isSectionFree(wanted)) {
-            createWithId(task);
-            stored_.push_back(&task);
-        } else {
-            create(task);
-            stored_.push_back(&task);
-        }
-        lines_.push_back(called(task) + (task.id == wanted || wanted == -1
-                                             ? ""
-                                             : ", was " + std::to_string(wanted)));
-    }
-
-    void takeBack() const {
-        for (const TAVI_SCHED_TASK *const task : stored_) {
-            TAVISchedTaskRemove(task->id);
-        }
-    }
-
-    void report() const {
-        for (const std::string &line : lines_) {
-            std::printf("%s\n", line.c_str());
-        }
-    }
-
-  private:
-    // A schedule that is there already, or was imported just now, is as good as stored.
-    void storePower(TAVI_SCHED_TASK &task) {
-        const TAVI_SCHED_TASK *same = present_.findSameSchedule(task);
-        for (const TAVI_SCHED_TASK *const stored : stored_) {
-            same = isSameSchedule(*stored, task) ? stored : same;
-        }
-        if (same) {
-            task.id = same->id;
-        } else {
-            create(task);
-            stored_.push_back(&task);
-        }
-    }
-
-    const Tasks &present_;
-    TaskPointers stored_;
-    std::vector<std::string> lines_;
-};
-
-} // namespace
-
-int add(const TaskOptions &options, bool dryRun, bool quiet) {
-    std::optional<ChangeLock> lock;
-    if (!dryRun) {
-        lock.emplace();
-    }
-    if (!options.power && !options.command) {
-        throw Refusal("a task needs --command, or --power for a power schedule");
-    }
-    const Tasks tasks = Tasks::read();
-    const Task task =
-        newTask(options.power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
-    apply(options, *task);
-    requireReadablePower(tasks, *task);
-    refuseSameSchedule(tasks, *task, nullptr);
-    requireStorable(afterwards(tasks, {task.get()}));
-    if (dryRun) {
-        return printDryRun(*task);
-    }
-    create(*task);
-    requireSyncedCrontab();
-    reportChange(*task, quiet);
-    return 0;
-}
-
-int edit(int32_t id, const TaskOptions &options, bool quiet) {
-    const ChangeLock lock;
-    if (!options.any()) {
-        throw Refusal("nothing is to be changed; \"tavisched edit --help\" shows what can be");
-    }
-    const Tasks tasks = Tasks::read();
-    const TAVI_SCHED_TASK &before = *tasks.select({id}).front();
-    const Task task = copyOf(before);
-    apply(options, *task);
-    refuseSameSchedule(tasks, *task, &before);
-    requireStorable(afterwards(tasks, {task.get()}));
-    edit(before, *task);
-    requireSyncedCrontab();
-    reportChange(*task, quiet);
-    return 0;
-}
-
-int setEnabled(const Ids &ids, bool enabled) {
-    const ChangeLock lock;
-    const Tasks tasks = Tasks::read();
-    const auto selected = tasks.select(ids);
-    std::vector<Task> changed;
-    TaskPointers pointers;
-    for (const TAVI_SCHED_TASK *const task : selected) {
-        changed.push_back(copyOf(*task));
-        TAVISchedCTaskSetState(changed.back().get(), enabled ? 1 : 0);
-        if (enabled) {
-            refusePast(*changed.back());
-        }
-        refuseSameSchedule(tasks, *changed.back(), task);
-        pointers.push_back(changed.back().get());
-    }
-    requireStorable(afterwards(tasks, pointers));
-    for (size_t i = 0; i < selected.size(); ++i) {
-        if (selected[i]->state != changed[i]->state) {
-            edit(*selected[i], *changed[i]);
-        }
-        report(*changed[i]);
-    }
-    requireSyncedCrontab();
-    return 0;
-}
-
-int removeTasks(const Ids &ids, bool yes) {
-    // The question is asked without the lock: people take their time.
-    if (const Tasks tasks = Tasks::read(); !yes) {
-        const auto selected = tasks.select(ids);
-        if (!confirmed({selected.begin(), selected.end()})) {
-            std::printf("Nothing was removed.\n");
-            return 1;
-        }
-    }
-    const ChangeLock lock;
+Lines removeShown(const Ids &ids, const Lines &shown) {
+    Change change;
     const Tasks tasks = Tasks::read();
     const auto selected = tasks.select(ids);
     TaskPointers rest;
@@ -285,20 +175,59 @@ int removeTasks(const Ids &ids, bool yes) {
             rest.push_back(task);
         }
     }
-    requireGoodCrontab(rest);
-    for (const TAVI_SCHED_TASK *const task : selected) {
-        remove(*task);
-        std::printf("%s: removed\n", called(*task).c_str());
+    for (size_t i = 0; i < selected.size(); ++i) {
+        if (shownOf(*selected[i]) != shown[i]) {
+            throw Refusal("it has changed meanwhile: " + shownOf(*selected[i]));
+        }
     }
-    requireSyncedCrontab();
-    return 0;
+    requireGoodCrontab(rest);
+    change.defuse({selected.begin(), selected.end()});
+    Lines lines;
+    for (const TAVI_SCHED_TASK *const task : selected) {
+        change.remove(*task);
+        lines.push_back(called(*task) + ": removed");
+    }
+    change.keep();
+    return lines;
 }
 
-int importTasks(const std::string &file) {
-    const std::string text = readWhole(file);
-    const ChangeLock lock;
-    const std::vector<Task> imported = parseImport(text);
-    const Tasks present = Tasks::read();
+// ---- Import ----
+
+std::string readWhole(const std::string &file) {
+    try {
+        return file == "-" ? std::string(std::istreambuf_iterator<char>(std::cin), {})
+                           : contentOf(file.c_str());
+    } catch (const Failure &failure) {
+        throw Refusal(std::string(failure.what()) + "; accepted: a file, or - for standard input");
+    }
+}
+
+// A schedule that is there already, or was imported just now, is as good as stored.
+void importPower(Change &change, const Tasks &present, const TaskPointers &stored,
+                 TAVI_SCHED_TASK &task) {
+    const TAVI_SCHED_TASK *same = present.findSameSchedule(task);
+    for (const TAVI_SCHED_TASK *const other : stored) {
+        same = isSameSchedule(*other, task) ? other : same;
+    }
+    if (same) {
+        task.id = same->id;
+    } else {
+        change.create(task);
+    }
+}
+
+void importTask(Change &change, const Tasks &present, const TaskPointers &stored,
+                TAVI_SCHED_TASK &task) {
+    if (isPower(task)) {
+        importPower(change, present, stored, task);
+    } else if (task.id > 0 && !present.find(task.id) && isFreeForSchedule(task.id)) {
+        change.createWithId(task);
+    } else {
+        change.create(task);
+    }
+}
+
+void requireImportable(const Tasks &present, const std::vector<Task> &imported) {
     TaskPointers pointers(present.all().begin(), present.all().end());
     for (const Task &task : imported) {
         requireReadablePower(present, *task);
@@ -307,29 +236,143 @@ int importTasks(const std::string &file) {
         }
     }
     requireStorable(pointers);
-    ImportStore store(present);
-    try {
-        for (const Task &task : imported) {
-            store.store(*task);
-        }
-        requireSyncedCrontab();
-    } catch (const Failure &failure) {
-        store.takeBack();
-        throw Failure(std::string(failure.what()) + "; what had been stored was taken back");
+}
+
+Lines importAll(const std::string &text) {
+    Change change;
+    const std::vector<Task> imported = parseImport(text);
+    const Tasks present = Tasks::read();
+    requireImportable(present, imported);
+    TaskPointers stored;
+    Lines lines;
+    for (const Task &task : imported) {
+        const int32_t wanted = task->id;
+        importTask(change, present, stored, *task);
+        stored.push_back(task.get());
+        const bool hasWanted = task->id == wanted || wanted == -1;
+        lines.push_back(called(*task) + (hasWanted ? "" : ", was " + std::to_string(wanted)));
     }
-    store.report();
+    change.keep();
+    return lines;
+}
+
+// ---- The others ----
+
+// The checked task of "add".
+Task taskToAdd(const TaskOptions &options, const Tasks &tasks) {
+    if (!options.power && !options.command) {
+        throw Refusal("a task needs --command, or --power for a power schedule");
+    }
+    Task task = newTask(options.power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
+    apply(options, *task);
+    requireReadablePower(tasks, *task);
+    refuseSameSchedule(tasks, *task, nullptr);
+    requireStorable(afterwards(tasks, {task.get()}));
+    return task;
+}
+
+Lines addTask(const TaskOptions &options, bool quiet) {
+    Change change;
+    const Task task = taskToAdd(options, Tasks::read());
+    change.create(*task);
+    change.keep();
+    return reportOf(*task, quiet);
+}
+
+Lines editTask(int32_t id, const TaskOptions &options, bool quiet) {
+    Change change;
+    const Tasks tasks = Tasks::read();
+    const TAVI_SCHED_TASK &before = *tasks.select({id}).front();
+    const Task task = copyOf(before);
+    apply(options, *task);
+    refuseSameSchedule(tasks, *task, &before);
+    requireStorable(afterwards(tasks, {task.get()}));
+    change.edit(*task);
+    change.keep();
+    return reportOf(*task, quiet);
+}
+
+// The tasks with the new state, checked.
+std::vector<Task> withState(const Tasks &tasks, const std::vector<TAVI_SCHED_TASK *> &selected,
+                            bool enabled) {
+    std::vector<Task> changed;
+    TaskPointers pointers;
+    for (const TAVI_SCHED_TASK *const task : selected) {
+        Task copy = copyOf(*task);
+        TAVISchedCTaskSetState(copy.get(), enabled ? 1 : 0);
+        if (enabled) {
+            refusePast(*copy);
+        }
+        refuseSameSchedule(tasks, *copy, task);
+        pointers.push_back(copy.get());
+        changed.push_back(std::move(copy));
+    }
+    requireStorable(afterwards(tasks, pointers));
+    return changed;
+}
+
+Lines changeStates(const Ids &ids, bool enabled) {
+    Change change;
+    const Tasks tasks = Tasks::read();
+    const auto selected = tasks.select(ids);
+    const std::vector<Task> changed = withState(tasks, selected, enabled);
+    change.defuse({selected.begin(), selected.end()});
+    Lines lines;
+    for (size_t i = 0; i < selected.size(); ++i) {
+        if (selected[i]->state != changed[i]->state) {
+            change.edit(*changed[i]);
+        }
+        addReport(*changed[i], lines);
+    }
+    change.keep();
+    return lines;
+}
+
+} // namespace
+
+int add(const TaskOptions &options, bool dryRun, bool quiet) {
+    if (dryRun) {
+        const Lock lock(Lock::Kind::Reading);
+        return printDryRun(*taskToAdd(options, Tasks::read()));
+    }
+    print(addTask(options, quiet));
+    warnOfRejectedLines();
     return 0;
 }
 
+int edit(int32_t id, const TaskOptions &options, bool quiet) {
+    if (!options.any()) {
+        throw Refusal("nothing is to be changed; \"tavisched edit --help\" shows what can be");
+    }
+    print(editTask(id, options, quiet));
+    warnOfRejectedLines();
+    return 0;
+}
+
+int setEnabled(const Ids &ids, bool enabled) {
+    print(changeStates(ids, enabled));
+    warnOfRejectedLines();
+    return 0;
+}
+
+// People take their time to answer: the question is asked without the lock.
+int removeTasks(const Ids &ids, bool yes) {
+    const Lines shown = showToRemove(ids);
+    if (!yes && isatty(STDIN_FILENO) == 1 && !isConfirmed(shown)) {
+        std::printf("Nothing was removed.\n");
+        return 1;
+    }
+    return print(removeShown(ids, shown));
+}
+
+int importTasks(const std::string &file) {
+    return print(importAll(readWhole(file)));
+}
+
 int syncTasks() {
-    const ChangeLock lock;
-    const Tasks tasks = Tasks::read();
-    requireGoodCrontab({tasks.all().begin(), tasks.all().end()});
-    TAVISchedTaskSync(); // tells of no failure
-    requireSyncedCrontab();
-    const auto crontab = readCrontab();
-    if (tasks.lacksPower() || !crontab || !arePowerOffLinesRight(tasks, *crontab)) {
-        throw Failure("the power schedules could not be set: " + libraryError());
+    {
+        const Change change; // there is nothing to take back
+        syncCrontab();
     }
     std::printf("/etc/crontab has the lines of all enabled tasks.\n");
     return 0;

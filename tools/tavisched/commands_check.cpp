@@ -2,17 +2,36 @@
 #include "check.h"
 #include "commands.h"
 #include "failure.h"
-#include "store.h"
+#include "lock.h"
 #include "table.h"
 
 #include <algorithm>
 #include <cstdio>
+#include <iostream>
 #include <set>
 #include <unistd.h>
 
 namespace tavisched {
 
 namespace {
+
+bool isFound(const std::vector<Finding> &findings, const std::string &what) {
+    return std::any_of(findings.begin(), findings.end(),
+                       [&](const Finding &finding) { return finding.what == what; });
+}
+
+// Tries one thing; it is mended when it is not found any more.
+void mend(const Finding &finding) {
+    try {
+        finding.mend();
+    } catch (const std::exception &failure) {
+        std::cerr << "tavisched: " << failure.what() << "\n";
+    }
+    if (!isFound(inspectMachine(), finding.what)) {
+        std::printf("%s %s\n  done: %s\n", styled("mended:", Style::Good).c_str(),
+                    finding.what.c_str(), finding.advice.c_str());
+    }
+}
 
 // One thing at a time, each time looking anew: mending one thing may mend or show others. Nothing
 // is tried twice.
@@ -28,10 +47,17 @@ void mendAll() {
             return;
         }
         tried.insert(next->what);
-        next->mend();
-        std::printf("%s %s\n  done: %s\n", styled("mended:", Style::Good).c_str(),
-                    next->what.c_str(), next->advice.c_str());
+        mend(*next);
     }
+}
+
+// With the lock, so that no change is met half done.
+std::vector<Finding> inspect(bool repair) {
+    const Lock lock(repair ? Lock::Kind::Changing : Lock::Kind::Reading);
+    if (repair) {
+        mendAll();
+    }
+    return inspectMachine();
 }
 
 } // namespace
@@ -40,11 +66,7 @@ int check(bool repair) {
     if (geteuid() != 0) {
         throw Failure("check looks at files that only root may read; it must be run by root");
     }
-    if (repair) {
-        const ChangeLock lock(ChangeLock::Expecting::Anything);
-        mendAll();
-    }
-    const std::vector<Finding> findings = inspectMachine();
+    const std::vector<Finding> findings = inspect(repair);
     for (const Finding &finding : findings) {
         std::printf("%s %s\n  to do: %s\n", styled("problem:", Style::Bad).c_str(),
                     finding.what.c_str(), finding.advice.c_str());

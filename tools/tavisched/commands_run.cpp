@@ -1,18 +1,22 @@
-// The subcommand "run". The library runs a task in a detached process; to follow it to its end this
-// program makes itself the one to whom the kernel gives orphans, so that it learns when the process
-// ends, also when that gives up before it records anything.
+// The subcommand "run". The library runs a task in a detached process. To follow it to its end,
+// each task is started by a helper process to whom the kernel gives orphans: it learns when the
+// detached process ends, also when that gives up before it records anything.
 #include "commands.h"
 #include "failure.h"
+#include "lock.h"
 #include "runs.h"
-#include "store.h"
+#include "tasks.h"
 #include "words.h"
 
-#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cstdio>
+#include <fcntl.h>
 #include <filesystem>
 #include <fstream>
-#include <set>
+#include <iostream>
+#include <sstream>
+#include <string>
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -23,65 +27,52 @@ namespace {
 
 constexpr int kGaveUp = 1;
 
-// The children of this process that run this program. What a task's command leaves behind becomes a
-// child too, but has a name of its own.
-std::set<pid_t> runnersBelow() {
-    const auto describe = [](const std::string &pid) {
-        std::ifstream file("/proc/" + pid + "/stat");
-        std::string line;
-        std::getline(file, line);
-        return line;
-    };
-    const auto nameIn = [](const std::string &line) {
-        const size_t begin = line.find('(');
-        const size_t end = line.rfind(')');
-        return end == std::string::npos ? "" : line.substr(begin, end - begin);
-    };
-    const std::string self = nameIn(describe("self"));
-    std::set<pid_t> found;
-    for (const auto &entry : std::filesystem::directory_iterator("/proc")) {
-        const std::string pid = entry.path().filename();
-        if (!std::all_of(pid.begin(), pid.end(), [](unsigned char c) { return std::isdigit(c); })) {
-            continue;
-        }
-        const std::string line = describe(pid);
-        int parent = 0;
-        const size_t end = line.rfind(')');
-        if (end != std::string::npos && nameIn(line) == self &&
-            std::sscanf(line.c_str() + end, ") %*c %d", &parent) == 1 && parent == getpid()) {
-            found.insert(std::stoi(pid));
-        }
-    }
-    return found;
-}
-
-void start(const TAVI_SCHED_TASK &task) {
-    if (TAVISchedTaskRun(task.id, 0, 0) != 0) {
-        throw Failure(called(task) + " could not be started: " + libraryError());
-    }
-    std::printf("%s: started\n", called(task).c_str());
-    std::fflush(stdout);
-}
-
-struct Started {
-    const TAVI_SCHED_TASK *task;
-    pid_t pid;
+// What /proc tells of a process.
+struct Process {
+    std::string name;
+    pid_t parent = 0;
+    unsigned long long startTime = 0;
 };
 
-std::vector<Started> startAll(const std::vector<TAVI_SCHED_TASK *> &tasks) {
-    std::vector<Started> started;
-    std::set<pid_t> known;
-    for (const TAVI_SCHED_TASK *const task : tasks) {
-        start(*task);
-        pid_t runner = -1;
-        for (const pid_t pid : runnersBelow()) {
-            if (known.insert(pid).second) {
-                runner = pid;
-            }
-        }
-        started.push_back({task, runner});
+Process describe(const std::string &pid) {
+    std::string line;
+    std::ifstream file("/proc/" + pid + "/stat");
+    std::getline(file, line);
+    const size_t begin = line.find('(');
+    const size_t end = line.rfind(')');
+    if (begin == std::string::npos || end == std::string::npos) {
+        return {};
     }
-    return started;
+    Process process{.name = line.substr(begin, end - begin)};
+    std::istringstream fields(line.substr(end + 1));
+    std::string skipped;
+    fields >> skipped >> process.parent;
+    for (int field = 5; field < 22; ++field) {
+        fields >> skipped;
+    }
+    fields >> process.startTime;
+    return process;
+}
+
+// The oldest child that runs this program. What a task's command leaves behind becomes a child too,
+// but it is younger.
+pid_t oldestRunner() {
+    const std::string self = describe("self").name;
+    pid_t oldest = -1;
+    unsigned long long oldestStart = 0;
+    for (const auto &entry : std::filesystem::directory_iterator("/proc")) {
+        const std::string name = entry.path().filename();
+        if (name.find_first_not_of("0123456789") != std::string::npos) {
+            continue;
+        }
+        const Process process = describe(name);
+        if (process.parent == getpid() && process.name == self &&
+            (oldest == -1 || process.startTime < oldestStart)) {
+            oldest = std::stoi(name);
+            oldestStart = process.startTime;
+        }
+    }
+    return oldest;
 }
 
 void waitFor(pid_t pid) {
@@ -89,10 +80,66 @@ void waitFor(pid_t pid) {
     }
 }
 
+void start(const TAVI_SCHED_TASK &task) {
+    if (TAVISchedTaskRun(task.id, 0, 0) != 0) {
+        throw Failure(called(task) + " could not be started: " + libraryError());
+    }
+}
+
+// A task that was started with a helper, which lives as long as the run.
+struct Started {
+    const TAVI_SCHED_TASK *task;
+    pid_t helper;
+    pid_t runner;
+};
+
+// In the helper: starts the task, tells the runner's process id, and waits for its end.
+[[noreturn]] void help(const TAVI_SCHED_TASK &task, int pipe) {
+    pid_t runner = -1;
+    try {
+        if (prctl(PR_SET_CHILD_SUBREAPER, 1) == 0) {
+            start(task);
+            runner = oldestRunner();
+        }
+    } catch (const std::exception &failure) {
+        std::cerr << "tavisched: " << failure.what() << "\n";
+    }
+    const bool told = write(pipe, &runner, sizeof runner) == sizeof runner;
+    if (told && runner != -1) {
+        waitFor(runner);
+    }
+    _exit(0);
+}
+
+Started startWithHelper(const TAVI_SCHED_TASK &task) {
+    std::array<int, 2> pipes{};
+    const pid_t helper = pipe2(pipes.data(), O_CLOEXEC) == 0 ? fork() : -1;
+    if (helper == -1) {
+        throw Failure(called(task) + " could not be started: " + systemReason());
+    }
+    if (helper == 0) {
+        help(task, pipes[1]);
+    }
+    Started started{.task = &task, .helper = helper, .runner = -1};
+    close(pipes[1]);
+    const bool told = read(pipes[0], &started.runner, sizeof started.runner) ==
+                      static_cast<ssize_t>(sizeof started.runner);
+    close(pipes[0]);
+    if (!told || started.runner == -1) {
+        throw Failure(called(task) + " could not be started");
+    }
+    return started;
+}
+
+void tellStarted(const TAVI_SCHED_TASK &task) {
+    std::printf("%s: started\n", called(task).c_str());
+    std::fflush(stdout);
+}
+
 // The run's exit status, when its process has ended.
 int reportEnd(const Started &started) {
     for (const Run &run : readRuns(started.task->id)) {
-        if (run.pid == started.pid) {
+        if (run.pid == started.runner) {
             std::printf("%s: %s\n", called(*started.task).c_str(), resultInWords(run).c_str());
             return exitStatusOf(run);
         }
@@ -101,23 +148,27 @@ int reportEnd(const Started &started) {
     return kGaveUp;
 }
 
+Tasks readTasks() {
+    const Lock lock(Lock::Kind::Reading);
+    return Tasks::read();
+}
+
 } // namespace
 
 int run(const Ids &ids, bool wait) {
-    const Tasks tasks = Tasks::read();
-    const auto selected = tasks.select(ids);
-    if (!wait) {
-        for (const TAVI_SCHED_TASK *const task : selected) {
+    const Tasks tasks = readTasks();
+    std::vector<Started> runs;
+    for (const TAVI_SCHED_TASK *const task : tasks.select(ids)) {
+        if (wait) {
+            runs.push_back(startWithHelper(*task));
+        } else {
             start(*task);
         }
-        return 0;
-    }
-    if (prctl(PR_SET_CHILD_SUBREAPER, 1) != 0) {
-        throw Failure("the runs cannot be followed; run them without --wait");
+        tellStarted(*task);
     }
     int status = 0;
-    for (const Started &started : startAll(selected)) {
-        waitFor(started.pid);
+    for (const Started &started : runs) {
+        waitFor(started.helper);
         const int result = reportEnd(started);
         status = status == 0 ? result : status;
     }

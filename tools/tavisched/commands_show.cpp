@@ -1,9 +1,12 @@
 // The subcommands that only read: list, show, history, export.
 #include "commands.h"
+#include "failure.h"
 #include "json.h"
+#include "lock.h"
 #include "runs.h"
-#include "store.h"
 #include "table.h"
+#include "task_lines.h"
+#include "tasks.h"
 #include "text.h"
 #include "words.h"
 
@@ -21,6 +24,24 @@ namespace tavisched {
 namespace {
 
 using LatestRuns = std::map<int32_t, Run>;
+
+// Both are held together by the lock only while they are read.
+struct Stored {
+    Tasks tasks;
+    LatestRuns runs;
+};
+
+// Tasks are shown also when nothing is known of their runs.
+Stored readAll() {
+    const Lock lock(Lock::Kind::Reading);
+    Stored stored{.tasks = Tasks::read(), .runs = {}};
+    try {
+        stored.runs = readLatestRuns();
+    } catch (const Failure &failure) {
+        std::cerr << "tavisched: warning: " << failure.what() << "\n";
+    }
+    return stored;
+}
 
 Style styleOf(const Run &run) {
     switch (run.code) {
@@ -48,7 +69,7 @@ std::string stateName(const TAVI_SCHED_TASK &task) {
 
 using Before = std::function<bool(const TAVI_SCHED_TASK &, const TAVI_SCHED_TASK &)>;
 
-// Tasks without a next or a last run come last.
+// In rising order, in which tasks without a next or a last run come last.
 std::map<std::string, Before> orders(const LatestRuns &runs) {
     const auto lastStart = [&runs](const TAVI_SCHED_TASK &task) {
         const auto run = runs.find(task.id);
@@ -79,6 +100,39 @@ Row listRow(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
             {printable(ownerName(task.owner))},
             run == runs.end() ? Cell{"-"}
                               : Cell{printable(resultWithTime(run->second)), styleOf(run->second)}};
+}
+
+// The tasks to list, in order.
+std::vector<const TAVI_SCHED_TASK *> chosen(const Stored &stored, const ListOptions &options) {
+    std::vector<const TAVI_SCHED_TASK *> shown;
+    for (const TAVI_SCHED_TASK *const task : stored.tasks.all()) {
+        if (options.all || task->listable == 1) {
+            shown.push_back(task);
+        }
+    }
+    const Before before = orders(stored.runs).at(options.sort);
+    std::stable_sort(shown.begin(), shown.end(),
+                     [&](const auto *one, const auto *other) { return before(*one, *other); });
+    if (options.reverse) {
+        std::reverse(shown.begin(), shown.end());
+    }
+    return shown;
+}
+
+void printList(const std::vector<const TAVI_SCHED_TASK *> &shown, const LatestRuns &runs) {
+    std::vector<Row> rows;
+    rows.reserve(shown.size());
+    for (const TAVI_SCHED_TASK *const task : shown) {
+        rows.push_back(listRow(*task, runs));
+    }
+    printTable({{"ID", true},
+                {"NAME", false, true},
+                {"STATE"},
+                {"SCHEDULE", false, true},
+                {"NEXT RUN"},
+                {"OWNER", false, true},
+                {"LAST RUN", false, true}},
+               std::move(rows));
 }
 
 // ---- show ----
@@ -126,13 +180,13 @@ std::string overlapInWords(const TAVI_SCHED_TASK &task) {
            " while another task of its application runs";
 }
 
-std::string lastRunInWords(int32_t id) {
-    const std::vector<Run> runs = readRuns(id);
-    if (runs.empty()) {
-        return "none since the machine was started";
+std::string lastRunInWords(const LatestRuns &runs, int32_t id) {
+    const auto run = runs.find(id);
+    if (run == runs.end()) {
+        return "none known since the machine was started";
     }
-    return resultInWords(runs.front()) + ", started " + localTime(runs.front().start) + " (" +
-           ago(runs.front().start, time(nullptr)) + ")";
+    return resultInWords(run->second) + ", started " + localTime(run->second.start) + " (" +
+           ago(run->second.start, time(nullptr)) + ")";
 }
 
 // Looked at by once, monthly and yearly schedules.
@@ -146,7 +200,7 @@ std::string firstDay(const TAVI_SCHED_TASK &task) {
     return text.data();
 }
 
-void printTask(const TAVI_SCHED_TASK &task) {
+void printTask(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
     const bool enabled = task.state == TAVI_SCHED_STATE_ENABLED;
     std::printf("%s\n", styled("Task " + std::to_string(task.id) + ": " + printable(task.name),
                                Style::Strong)
@@ -155,7 +209,7 @@ void printTask(const TAVI_SCHED_TASK &task) {
     printField("State", stateName(task));
     printField("Schedule", printable(scheduleInWords(task)));
     printField("Next run", nextRun(task).value_or(enabled ? "never" : "never while disabled"));
-    printField("Last run", printable(lastRunInWords(task.id)));
+    printField("Last run", printable(lastRunInWords(runs, task.id)));
     printField("Owner", printable(ownerName(task.owner)) + " (" + std::to_string(task.owner) + ")");
     printField("Command", commandInLines(task.command));
     printField("Action", orDash(task.action));
@@ -181,54 +235,30 @@ const std::vector<std::string> &sortFields() {
 }
 
 int list(const ListOptions &options) {
-    const Tasks tasks = Tasks::read();
-    const LatestRuns runs = readLatestRuns();
-    std::vector<const TAVI_SCHED_TASK *> shown;
-    for (const TAVI_SCHED_TASK *const task : tasks.all()) {
-        if (options.all || task->listable == 1) {
-            shown.push_back(task);
-        }
-    }
-    const Before before = orders(runs).at(options.sort);
-    std::stable_sort(shown.begin(), shown.end(),
-                     [&](const auto *one, const auto *other) { return before(*one, *other); });
-    if (options.reverse) {
-        std::reverse(shown.begin(), shown.end());
-    }
-    Json::Value values(Json::arrayValue);
-    std::vector<Row> rows;
-    for (const TAVI_SCHED_TASK *const task : shown) {
-        if (options.json) {
-            values.append(plainTask(*task, runs));
-        } else {
-            rows.push_back(listRow(*task, runs));
-        }
-    }
+    const Stored stored = readAll();
+    const auto shown = chosen(stored, options);
     if (options.json) {
+        Json::Value values(Json::arrayValue);
+        for (const TAVI_SCHED_TASK *const task : shown) {
+            values.append(plainTask(*task, stored.runs));
+        }
         printJson(values);
-    } else if (rows.empty()) {
-        std::cout << "There are no tasks"
-                  << (tasks.all().empty() ? "" : " to list; --all shows all") << ".\n";
+    } else if (shown.empty()) {
+        std::printf("There are no tasks%s.\n",
+                    stored.tasks.all().empty() ? "" : " to list; --all shows all");
     } else {
-        printTable({{"ID", true},
-                    {"NAME", false, true},
-                    {"STATE"},
-                    {"SCHEDULE", false, true},
-                    {"NEXT RUN"},
-                    {"OWNER", false, true},
-                    {"LAST RUN", false, true}},
-                   std::move(rows));
+        printList(shown, stored.runs);
     }
     return 0;
 }
 
 int show(int32_t id, bool json) {
-    const Tasks tasks = Tasks::read();
-    const TAVI_SCHED_TASK &task = *tasks.select({id}).front();
+    const Stored stored = readAll();
+    const TAVI_SCHED_TASK &task = *stored.tasks.select({id}).front();
     if (json) {
-        std::cout << webText(task) << "\n";
+        std::printf("%s\n", webText(task).c_str());
     } else {
-        printTask(task);
+        printTask(task, stored.runs);
     }
     return 0;
 }
@@ -246,7 +276,7 @@ int history(std::optional<int32_t> id, size_t limit, bool json) {
         }
         printJson(values);
     } else if (runs.empty()) {
-        std::cout << "There were no runs since the machine was started.\n";
+        std::printf("There were no runs since the machine was started.\n");
     } else {
         std::vector<Row> rows;
         rows.reserve(runs.size());
@@ -263,7 +293,7 @@ int history(std::optional<int32_t> id, size_t limit, bool json) {
 }
 
 int exportTasks(const Ids &ids) {
-    const Tasks tasks = Tasks::read();
+    const Tasks tasks = readAll().tasks;
     if (tasks.lacksPower() && ids.empty()) {
         throw Failure("nothing was exported, as power schedules would be missing; name the ids of "
                       "other tasks to export those");
@@ -280,7 +310,7 @@ int completeIds() {
     try {
         const Tasks tasks = Tasks::read();
         for (const TAVI_SCHED_TASK *const task : tasks.all()) {
-            std::cout << task->id << "\t" << printable(task->name) << "\n";
+            std::printf("%ld\t%s\n", static_cast<long>(task->id), printable(task->name).c_str());
         }
     } catch (const Failure &) {
         return 0; // a completion has nowhere to tell of it

@@ -1,12 +1,14 @@
 // Tasks and runs as JSON.
 #include "json.h"
+#include "failure.h"
 #include "stored_form.h"
 #include "task_rules.h"
 #include "text.h"
 #include "words.h"
 
 #include <algorithm>
-#include <iostream>
+#include <cstdio>
+#include <cstdlib>
 #include <json/reader.h>
 #include <json/writer.h>
 #include <memory>
@@ -105,11 +107,28 @@ class Import {
         }
     }
 
+    // The member "backend" tells; a text of the web back end has none, and there a power schedule
+    // shows by its id and arguments.
+    static bool isPowerSchedule(const std::map<std::string, std::string> &members) {
+        const auto value = [&](const char *key) {
+            const auto member = members.find(key);
+            return member == members.end() ? "" : member->second;
+        };
+        if (members.contains(kBackend)) {
+            return value(kBackend) == std::to_string(TAVI_SCHED_BACKEND_AUTOPOWER);
+        }
+        const int32_t id = std::atoi(value("id").c_str());
+        const auto backends = registeredBackends();
+        const bool isClaimed =
+            std::any_of(backends.begin(), backends.end(), [id](const auto &backend) {
+                return backend.owns_id && backend.owns_id(id) != 0;
+            });
+        return isClaimed && (value("app args") == kPowerOn || value("app args") == kPowerOff);
+    }
+
     // All members are good; the task as a whole may not be.
     void addTask(const std::map<std::string, std::string> &members) {
-        const auto backend = members.find(kBackend);
-        const bool power = backend != members.end() &&
-                           backend->second == std::to_string(TAVI_SCHED_BACKEND_AUTOPOWER);
+        const bool power = isPowerSchedule(members);
         Task task = newTask(power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
         Hash form;
         for (const auto &[key, value] : members) {
@@ -125,12 +144,14 @@ class Import {
         tasks_.push_back(std::move(task));
     }
 
-    void checkPower(const TAVI_SCHED_TASK &task) {
+    void checkPower(TAVI_SCHED_TASK &task) {
         const std::string_view arguments(task.appArgs);
         if (arguments != kPowerOn && arguments != kPowerOff) {
             addFault("app args", "accepted for a power schedule: poweron, poweroff");
         }
-        if (task.type != TAVI_SCHED_TYPE_DAILY && task.type != TAVI_SCHED_TYPE_WEEKLY) {
+        if (task.type == TAVI_SCHED_TYPE_DAILY) {
+            TAVISchedCTaskSetWeek(&task, "1111111"); // the backend looks at the days alone
+        } else if (task.type != TAVI_SCHED_TYPE_WEEKLY) {
             addFault("type", "accepted for a power schedule: daily, weekly");
         }
     }
@@ -158,7 +179,7 @@ Json::Value plainRun(const Run &run) {
     value["task"] = run.taskId;
     value["start"] = localTime(run.start);
     value["startTime"] = static_cast<Json::Int64>(run.start);
-    value["result"] = resultInWords(run);
+    value["result"] = printable(resultInWords(run));
     value["statusCode"] = run.code;
     value["comment"] = printable(run.comment);
     value["pid"] = run.pid;
@@ -188,7 +209,7 @@ Json::Value plainTask(const TAVI_SCHED_TASK &task, const std::map<int32_t, Run> 
 }
 
 void printJson(const Json::Value &value) {
-    std::cout << write(value, "  ") << "\n";
+    std::printf("%s\n", write(value, "  ").c_str());
 }
 
 // ---- For exchange ----

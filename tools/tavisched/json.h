@@ -3,7 +3,7 @@
 #pragma once
 
 #include "runs.h"
-#include "store.h"
+#include "tasks.h"
 
 #include <json/value.h>
 #include <map>

@@ -2,12 +2,17 @@
 // exit status.
 #include "commands.h"
 #include "failure.h"
+#include "text.h"
 
 #include <CLI/CLI.hpp>
+#include <algorithm>
+#include <charconv>
 #include <cstdio>
+#include <cstdlib>
 #include <functional>
 #include <limits>
 #include <string>
+#include <sys/stat.h>
 #include <syslog.h>
 
 namespace {
@@ -30,7 +35,24 @@ CLI::App *subcommand(CLI::App &app, Command &command, const char *name, const ch
 
 // ---- Options of several subcommands ----
 
-void idsOption(CLI::App *sub, Ids &ids, bool required) {
+// An id as it was typed; digits alone, as lists show it.
+int32_t parseId(const std::string &text) {
+    int32_t id = 0;
+    const auto parsed = std::from_chars(text.data(), text.data() + text.size(), id);
+    if (parsed.ec != std::errc() || parsed.ptr != text.data() + text.size()) {
+        throw Refusal("\"" + printable(text) + "\" is no id; accepted: a number as \"tavisched " +
+                      "list\" shows it");
+    }
+    return id;
+}
+
+Ids parseIds(const std::vector<std::string> &texts) {
+    Ids ids;
+    std::transform(texts.begin(), texts.end(), std::back_inserter(ids), parseId);
+    return ids;
+}
+
+void idsOption(CLI::App *sub, std::vector<std::string> &ids, bool required) {
     sub->add_option("ID", ids, "ids of tasks")->required(required);
 }
 
@@ -67,8 +89,8 @@ void taskOptions(CLI::App *sub, TaskOptions &options) {
 struct Settings {
     ListOptions list;
     TaskOptions task;
-    Ids ids;
-    int32_t id = 0;
+    std::vector<std::string> ids;
+    std::string id;
     int limit = std::numeric_limits<int>::max();
     std::string file;
     bool json = false, dryRun = false, quiet = false, yes = false, wait = false, repair = false;
@@ -86,25 +108,26 @@ void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
 
     auto *const showing =
         subcommand(app, command, "show", "show every field of a task", "tavisched show 3",
-                   [&] { return show(given.id, given.json); });
+                   [&] { return show(parseId(given.id), given.json); });
     showing->add_option("ID", given.id, "id of the task")->required();
     jsonOption(showing, given.json, "as the web back end exchanges it");
 
-    auto *const past = subcommand(
-        app, command, "history", "show how runs ended, newest first",
-        "tavisched history 3 --limit 10", [&] {
-            return history(given.ids.empty() ? std::nullopt : std::optional(given.ids.front()),
-                           static_cast<size_t>(given.limit), given.json);
-        });
+    auto *const past =
+        subcommand(app, command, "history", "show how runs ended, newest first",
+                   "tavisched history 3 --limit 10", [&] {
+                       return history(given.ids.empty() ? std::nullopt
+                                                        : std::optional(parseId(given.ids.front())),
+                                      static_cast<size_t>(given.limit), given.json);
+                   });
     past->add_option("ID", given.ids, "id of a task; without it, of all")->expected(0, 1);
     past->add_option("--limit", given.limit, "at most so many")
         ->type_name("NUMBER")
-        ->check(CLI::PositiveNumber);
+        ->check(CLI::Range(1, 1000000));
     jsonOption(past, given.json, "as JSON for scripts");
 
-    auto *const exporting =
-        subcommand(app, command, "export", "write tasks as a JSON array",
-                   "tavisched export > tasks.json", [&] { return exportTasks(given.ids); });
+    auto *const exporting = subcommand(app, command, "export", "write tasks as a JSON array",
+                                       "tavisched export > tasks.json",
+                                       [&] { return exportTasks(parseIds(given.ids)); });
     idsOption(exporting, given.ids, false);
 }
 
@@ -121,21 +144,23 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
     auto *const editing =
         subcommand(app, command, "edit", "change a task; what is left out keeps its value",
                    "tavisched edit 3 --at 23:30 --every 0",
-                   [&] { return edit(given.id, given.task, given.quiet); });
+                   [&] { return edit(parseId(given.id), given.task, given.quiet); });
     editing->add_option("ID", given.id, "id of the task")->required();
     taskOptions(editing, given.task);
     editing->add_flag("-q,--quiet", given.quiet, "print the id alone");
 
     idsOption(subcommand(app, command, "enable", "let tasks run when they are due",
-                         "tavisched enable 3 4", [&] { return setEnabled(given.ids, true); }),
+                         "tavisched enable 3 4",
+                         [&] { return setEnabled(parseIds(given.ids), true); }),
               given.ids, true);
     idsOption(subcommand(app, command, "disable", "keep tasks without running them",
-                         "tavisched disable 3", [&] { return setEnabled(given.ids, false); }),
+                         "tavisched disable 3",
+                         [&] { return setEnabled(parseIds(given.ids), false); }),
               given.ids, true);
 
     auto *const removing =
         subcommand(app, command, "remove", "remove tasks", "tavisched remove 3 4 --yes",
-                   [&] { return removeTasks(given.ids, given.yes); });
+                   [&] { return removeTasks(parseIds(given.ids), given.yes); });
     idsOption(removing, given.ids, true);
     removing->add_flag("-y,--yes", given.yes, "do not ask");
 
@@ -148,7 +173,7 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
 void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
     auto *const running =
         subcommand(app, command, "run", "run tasks now, in the background",
-                   "tavisched run 3 --wait", [&] { return run(given.ids, given.wait); });
+                   "tavisched run 3 --wait", [&] { return run(parseIds(given.ids), given.wait); });
     idsOption(running, given.ids, true);
     running->add_flag("--wait", given.wait, "wait for the end and exit with the command's result");
 
@@ -174,7 +199,7 @@ int execute(const Command &command) {
     try {
         const int status = command();
         if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
-            throw Failure("the output could not be written");
+            throw Failure("what was asked for was done, but the output could not be written");
         }
         return status;
     } catch (const Refusal &refusal) {
@@ -209,6 +234,8 @@ int tavischedMain(int argc, char **argv) {
         return fail(Refusal("a command is needed; \"tavisched --help\" lists them"),
                     Refusal::kExitStatus);
     }
+    unsetenv("TZ"); // times are the machine's, as cron takes them
+    umask(022);
     openlog("tavisched", LOG_PID | (verbose ? LOG_PERROR : 0), LOG_USER);
     return execute(command);
 }

@@ -1,5 +1,6 @@
 // The stored form of a task, as the library reads and writes it.
 #include "stored_form.h"
+#include "failure.h"
 #include "task_rules.h"
 #include "text.h"
 
@@ -112,23 +113,27 @@ std::optional<std::string> StoredForm::faultOf(const std::string &key,
                     : shown(value) + " is no number that can be stored";
 }
 
-std::optional<std::string> StoredForm::whyUnreadable(const Hash &form) const {
+std::optional<StoredForm::Faults> StoredForm::faultsOf(const Hash &form) const {
     const QuietLog quiet;
-    if (TAVISchedInitTaskFromHash(form.get(), copyOf(*example_).get()) == 0) {
-        return std::nullopt;
-    }
+    const Task scratch = copyOf(*example_);
+    const bool readable = TAVISchedInitTaskFromHash(form.get(), scratch.get()) == 0;
+    const std::optional<Hash> stored =
+        readable ? std::optional<Hash>(std::in_place, *scratch) : std::nullopt;
     std::vector<std::string> faults;
-    for (const std::string &key : required_) {
-        if (!form.has(key)) {
-            faults.push_back("\"" + key + "\" is missing");
-        }
-    }
     for (const std::string &key : keys_) {
-        if (const auto fault = form.has(key) ? faultOf(key, form.value(key)) : std::nullopt) {
-            faults.push_back("\"" + key + "\": " + *fault);
+        const bool isRequired =
+            std::find(required_.begin(), required_.end(), key) != required_.end();
+        if (!form.has(key)) {
+            if (isRequired) {
+                faults.push_back("\"" + key + "\" is missing");
+            }
+        } else if (!stored || stored->value(key) != form.value(key)) {
+            if (const auto fault = faultOf(key, form.value(key))) {
+                faults.push_back("\"" + key + "\": " + *fault);
+            }
         }
     }
-    return join(faults, "; ");
+    return faults.empty() ? std::nullopt : std::optional(Faults{readable, join(faults, "; ")});
 }
 
 } // namespace tavisched

@@ -1,9 +1,8 @@
 // The stored form of a task: the pairs of its section, which are also its members in JSON.
 #pragma once
 
-#include "failure.h"
 #include "platc.h"
-#include "store.h"
+#include "tasks.h"
 
 #include <optional>
 #include <string>
@@ -43,8 +42,13 @@ class StoredForm {
     const std::vector<std::string> &requiredKeys() const { return required_; }
     // What is wrong with a value of a key, or nothing.
     std::optional<std::string> faultOf(const std::string &key, const std::string &value) const;
-    // What keeps a whole form from being read, or nothing.
-    std::optional<std::string> whyUnreadable(const Hash &form) const;
+    // What is wrong with a whole form, or nothing; one that the library reads may still have values
+    // that it would not write so.
+    struct Faults {
+        bool readable;
+        std::string what;
+    };
+    std::optional<Faults> faultsOf(const Hash &form) const;
 
   private:
     Task example_;

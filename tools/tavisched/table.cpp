@@ -15,7 +15,6 @@ namespace tavisched {
 namespace {
 
 constexpr size_t kGap = 2;
-constexpr size_t kNarrowest = 8; // a column is not cut below this
 
 bool takesColours() {
     const char *const noColour = std::getenv("NO_COLOR");
@@ -43,25 +42,24 @@ std::vector<size_t> naturalWidths(const std::vector<Column> &columns,
     return widths;
 }
 
-// Takes columns from the widest that may give some, one at a time, until the table fits.
-void fit(const std::vector<Column> &columns, std::vector<size_t> &widths, size_t available) {
+// Takes columns from the widest that may give some, one at a time, until the table fits or none is
+// wider than the narrowest.
+void narrow(const std::vector<Column> &columns, std::vector<size_t> &widths, size_t narrowest,
+            size_t available) {
     size_t total = kGap * (widths.size() - 1);
     for (const size_t width : widths) {
         total += width;
     }
-    while (total > available) {
+    for (; total > available; --total) {
         size_t *widest = nullptr;
         for (size_t i = 0; i < widths.size(); ++i) {
-            if (columns[i].mayShrink && widths[i] > kNarrowest &&
-                (!widest || widths[i] > *widest)) {
-                widest = &widths[i];
-            }
+            const bool isWider = widths[i] > (widest ? *widest : narrowest);
+            widest = columns[i].mayShrink && isWider ? &widths[i] : widest;
         }
         if (!widest) {
             return;
         }
         --*widest;
-        --total;
     }
 }
 
@@ -95,7 +93,9 @@ void printTable(const std::vector<Column> &columns, std::vector<Row> rows) {
         titles.push_back({column.title, Style::Strong});
     }
     std::vector<size_t> widths = naturalWidths(columns, rows);
-    fit(columns, widths, terminalWidth());
+    for (const size_t narrowest : {8, 2}) {
+        narrow(columns, widths, narrowest, terminalWidth());
+    }
     rows.insert(rows.begin(), std::move(titles));
     for (const Row &row : rows) {
         printRow(columns, widths, row);

@@ -2,8 +2,8 @@
 // and what is accepted.
 #include "task_options.h"
 #include "failure.h"
-#include "store.h"
 #include "task_rules.h"
+#include "tasks.h"
 #include "text.h"
 #include "words.h"
 
@@ -12,7 +12,6 @@
 #include <cctype>
 #include <charconv>
 #include <cstdio>
-#include <cstring>
 #include <ctime>
 #include <pwd.h>
 #include <string_view>
@@ -22,8 +21,6 @@ namespace tavisched {
 
 namespace {
 
-// A year in which every day of the year is there.
-constexpr uint32_t kAnyYear = 2012;
 constexpr uint32_t kLastHour = 23;
 
 [[noreturn]] void refuse(const char *option, const std::string &what) {
@@ -83,9 +80,17 @@ void applyTime(const std::string &text, TAVI_SCHED_TASK &task) {
     task.runMin = (*time)[1];
 }
 
+void setStart(TAVI_SCHED_TASK &task, uint32_t year, uint32_t month, uint32_t day) {
+    task.startYear = year;
+    task.startMonth = month;
+    task.startDay = day;
+}
+
+// A first day that lies ahead would keep the task from running until then.
 void applyDaily(TAVI_SCHED_TASK &task) {
     TAVISchedCTaskSetDaily(&task);
     TAVISchedCTaskSetWeek(&task, "1111111");
+    setStart(task, 0, 0, 0);
 }
 
 void applyWeekDays(const std::string &text, TAVI_SCHED_TASK &task) {
@@ -100,14 +105,9 @@ void applyWeekDays(const std::string &text, TAVI_SCHED_TASK &task) {
         }
     }
     TAVISchedCTaskSetWeekly(&task);
+    setStart(task, 0, 0, 0);
     TAVISchedCTaskSetWeek(&task, TAVISchedMultiSelectFromText(text.c_str(), TAVISchedWeekDayNames,
                                                               TAVI_SCHED_WEEK_DAYS));
-}
-
-void setStart(TAVI_SCHED_TASK &task, uint32_t year, uint32_t month, uint32_t day) {
-    task.startYear = year;
-    task.startMonth = month;
-    task.startDay = day;
 }
 
 void applyMonthDay(const std::string &text, TAVI_SCHED_TASK &task) {
@@ -292,6 +292,7 @@ bool TaskOptions::any() const {
 }
 
 void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
+    const auto faultBefore = findFault(task);
     refuseConflicts(options);
     if (isPower(task)) {
         applyPower(options, task);
@@ -306,7 +307,9 @@ void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
     if (options.allowOverlap || options.noOverlap) {
         TAVISchedCTaskSetCanRunTaskSameTime(&task, options.allowOverlap ? 1 : 0);
     }
-    if (const auto fault = findFault(task)) {
+    // A fault that was there before cannot be helped here and must not stand in the way.
+    const auto fault = findFault(task);
+    if (fault && (!faultBefore || faultBefore->what != fault->what)) {
         throw Refusal("the task's \"" + std::string(fault->key) + "\": " + fault->what);
     }
     if (options.schedule() || options.enabled) {
@@ -319,8 +322,8 @@ void refusePast(TAVI_SCHED_TASK &task) {
         throw Failure("the next run cannot be computed: " + libraryError());
     }
     if (std::string_view(task.nextTriggerTime) == "N/A") {
-        throw Refusal("--once: " + scheduleInWords(task).substr(std::strlen("once on ")) +
-                      " has passed; accepted: a time in the future");
+        throw Refusal("the time of " + called(task) + ", " + scheduleInWords(task) +
+                      ", has passed; accepted: a time in the future");
     }
 }
 

@@ -96,17 +96,14 @@ std::optional<Fault> faultOfTexts(const TAVI_SCHED_TASK &task) {
     const struct {
         std::string_view key;
         const char *text;
-        size_t size;
-    } kTexts[] = {{"name", task.name, sizeof task.name},
-                  {"app", task.app, sizeof task.app},
-                  {"app name", task.appName, sizeof task.appName},
-                  {"app args", task.appArgs, sizeof task.appArgs},
-                  {"action", task.action, sizeof task.action},
-                  {"edit dialog", task.editDialog, sizeof task.editDialog},
-                  {"edit form", task.editForm, sizeof task.editForm}};
-    for (const auto &[key, text, size] : kTexts) {
-        if (auto fault = faultOfText(text, size)) {
-            return Fault{key, *fault};
+    } kTexts[] = {{"name", task.name},         {"app", task.app},
+                  {"app name", task.appName},  {"app args", task.appArgs},
+                  {"action", task.action},     {"edit dialog", task.editDialog},
+                  {"edit form", task.editForm}};
+    // What a web form may have put there is no fault, as long as it can be exchanged.
+    for (const auto &[key, text] : kTexts) {
+        if (!isUtf8(text)) {
+            return Fault{key, "it is not valid UTF-8; accepted: UTF-8"};
         }
     }
     auto fault = faultOfCommand(task.command);
@@ -130,9 +127,8 @@ std::optional<Fault> faultOfChoices(const TAVI_SCHED_TASK &task) {
 } // namespace
 
 uint32_t daysInMonth(uint32_t month, std::optional<uint32_t> year) {
-    constexpr int kLeapYear = 2012;
     const std::chrono::year_month_day_last last{
-        std::chrono::year(year ? static_cast<int>(*year) : kLeapYear),
+        std::chrono::year(static_cast<int>(year.value_or(kAnyYear))),
         std::chrono::month_day_last{std::chrono::month(month)}};
     return static_cast<unsigned int>(last.day());
 }

@@ -23,9 +23,12 @@ struct Fault {
 // The first fault, or nothing.
 std::optional<Fault> findFault(const TAVI_SCHED_TASK &task);
 
-// The same for a text that is about to become a field of so many bytes (with its end).
+// What is wrong with a text that a person gave for a field of so many bytes (with its end).
 std::optional<std::string> faultOfText(std::string_view text, size_t fieldSize);
 std::optional<std::string> faultOfCommand(std::string_view command);
+
+// A year in which every day of the year is there.
+constexpr uint32_t kAnyYear = 2012;
 
 // The days of a month; 29 for a February without a year.
 uint32_t daysInMonth(uint32_t month, std::optional<uint32_t> year = std::nullopt);

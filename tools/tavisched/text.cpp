@@ -23,6 +23,11 @@ bool isControl(ucs4_t character) {
     return uc_is_general_category_withtable(character, kControls);
 }
 
+// What could move a terminal's cursor, or make a text look like another one.
+bool isTreacherous(ucs4_t character) {
+    return isControl(character) || uc_is_property_bidi_control(character);
+}
+
 // Hands every character of the text to the function; bytes that are none come as U+FFFD.
 template <typename Function> void forEachCharacter(std::string_view text, Function &&function) {
     while (!text.empty()) {
@@ -49,9 +54,9 @@ std::string printable(std::string_view text) {
     std::string result;
     forEachCharacter(text, [&](ucs4_t character) {
         uint8_t bytes[6];
-        const ucs4_t shown = character == '\t'      ? ' '
-                             : isControl(character) ? kReplacement
-                                                    : character;
+        const ucs4_t shown = character == '\t'          ? ' '
+                             : isTreacherous(character) ? kReplacement
+                                                        : character;
         const int length = u8_uctomb(bytes, shown, sizeof bytes);
         result.append(reinterpret_cast<const char *>(bytes), static_cast<size_t>(length));
     });

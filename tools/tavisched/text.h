@@ -10,8 +10,8 @@ namespace tavisched {
 bool isUtf8(std::string_view text);
 // Holds a control character or a line break of any kind. The text is UTF-8.
 bool holdsControls(std::string_view text);
-// The text as it may go to a terminal: what is no UTF-8, and control characters, become U+FFFD, a
-// tab becomes a blank.
+// The text as it may go to a terminal: what is no UTF-8, and characters that control the
+// terminal or the direction of writing, become U+FFFD, a tab becomes a blank.
 std::string printable(std::string_view text);
 // The columns that a printable text takes.
 size_t widthOf(std::string_view text);

@@ -24,15 +24,16 @@ namespace {
     return text.data();
 }
 
-// "Mon, Fri"; three or more days in a row as "Mon-Fri".
+// "Mon, Fri"; three or more days in a row as "Mon-Fri". Everything but a '0' is a day on which the
+// task runs, for cron and here.
 std::string weekDays(const char *week) {
     std::vector<std::string> parts;
-    for (int day = 0; day < TAVI_SCHED_WEEK_DAYS && week[day] != '\0'; ++day) {
+    for (int day = 0; day < TAVI_SCHED_WEEK_DAYS; ++day) {
         if (week[day] == '0') {
             continue;
         }
         int last = day;
-        while (last + 1 < TAVI_SCHED_WEEK_DAYS && week[last + 1] != '0' && week[last + 1] != '\0') {
+        while (last + 1 < TAVI_SCHED_WEEK_DAYS && week[last + 1] != '0') {
             ++last;
         }
         if (last - day >= 2) {

@@ -14,7 +14,7 @@ class CommandLine : public SchedTest {
     void SetUp() override {
         SchedTest::SetUp();
         shell(
-            "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins; chmod 755 /usr/tavi/etc;"
+            "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins; chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
             "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
             "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
             "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");

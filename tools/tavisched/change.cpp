@@ -66,7 +66,8 @@ void writeBack(const char *path, const std::optional<std::string> &content) {
 }
 
 [[noreturn]] void fail(const TAVI_SCHED_TASK &task, const char *what) {
-    throw Failure(called(task) + " could not be " + what + ": " + libraryError());
+    throw Failure(called(task) + " could not be " + what + ": " + libraryError() +
+                  "; \"tavisched check\" looks for the cause");
 }
 
 } // namespace

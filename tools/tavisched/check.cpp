@@ -33,8 +33,11 @@ bool isEmptyOrMissing(const char *path) {
     return !status || status->st_size == 0;
 }
 
-std::string rootsAlone(const std::string &path) {
-    return "look who changed it; then chown root " + path + " and chmod go-w " + path;
+std::string adviseRootsAlone(const std::string &path) {
+    const auto status = statusOf(path.c_str());
+    return status && (S_ISREG(status->st_mode) || S_ISDIR(status->st_mode))
+               ? "look who changed it; then chown root " + path + " and chmod go-w " + path
+               : "remove it: rm " + path;
 }
 
 // ---- Files ----
@@ -45,7 +48,7 @@ void inspectFolders(Findings &findings) {
         findings.push_back({std::string(kFolder) + ", where tasks are kept, is missing", "make it",
                             [] { fs::create_directories(kFolder); }});
     } else if (!S_ISDIR(folder->st_mode) || !isRootsAlone(*folder)) {
-        findings.push_back({kFolder + std::string(kNobodyElse), rootsAlone(kFolder), {}});
+        findings.push_back({kFolder + std::string(kNobodyElse), adviseRootsAlone(kFolder), {}});
     }
     const auto lock = statusOf(kLockFolder);
     if (!lock) {
@@ -70,13 +73,14 @@ void inspectStrangeFiles(Findings &findings) {
         const bool canRestore =
             stateOf(kPersistent) == FileState::Trusted && !isEmptyOrMissing(kPersistent);
         findings.push_back(
-            {kWorkingCopy + std::string(kNobodyElse) + ", and its tasks run as anybody",
-             canRestore ? std::string("replace it by ") + kPersistent : rootsAlone(kWorkingCopy),
+            {kWorkingCopy + std::string(kNobodyElse) + ", as root runs what it says",
+             canRestore ? std::string("replace it by ") + kPersistent
+                        : adviseRootsAlone(kWorkingCopy),
              canRestore ? [] { replaceFile(kWorkingCopy, contentOf(kPersistent)); } : Mend()});
     }
     for (const char *const path : {kPersistent, kPowerSchedules}) {
         if (stateOf(path) == FileState::Strange) {
-            findings.push_back({path + std::string(kNobodyElse), rootsAlone(path), {}});
+            findings.push_back({path + std::string(kNobodyElse), adviseRootsAlone(path), {}});
         }
     }
 }
@@ -289,7 +293,7 @@ void inspectCrontabFile(const Crontab &crontab, Findings &findings) {
         findings.push_back({"cron ignores " + std::string(kCrontab) +
                                 ", which must be a file of root's with one name, and writable by "
                                 "nobody else",
-                            rootsAlone(kCrontab),
+                            adviseRootsAlone(kCrontab),
                             {}});
     }
     for (size_t i = 0; i < crontab.lines.size(); ++i) {
@@ -409,7 +413,7 @@ void inspectHandler(const fs::path &path, Findings &findings) {
         findings.push_back({"the plug-in handler " + path.string() +
                                 " is skipped: it must be a file of root's that nobody else may "
                                 "write",
-                            rootsAlone(path),
+                            adviseRootsAlone(path),
                             {}});
     }
 }
@@ -422,7 +426,7 @@ void inspectPlugins(Findings &findings) {
     if (!S_ISDIR(folder->st_mode) || !isRootsAlone(*folder)) {
         findings.push_back(
             {std::string("all plug-in handlers are skipped: ") + kPlugins + kNobodyElse,
-             rootsAlone(kPlugins),
+             adviseRootsAlone(kPlugins),
              {}});
         return;
     }

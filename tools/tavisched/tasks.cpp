@@ -132,7 +132,9 @@ std::vector<TAVI_SCHED_TASK *> Tasks::select(const std::vector<int32_t> &ids) co
 
 std::string called(const TAVI_SCHED_TASK &task) {
     const std::string number = task.id == -1 ? "the task" : "task " + std::to_string(task.id);
-    return task.name[0] == '\0' ? number : number + " (" + printable(task.name) + ")";
+    constexpr size_t kColumns = 60;
+    return task.name[0] == '\0' ? number
+                                : number + " (" + cutTo(printable(task.name), kColumns) + ")";
 }
 
 Copies compareCopies() {

@@ -14,7 +14,7 @@ class CommandLine : public SchedTest {
     void SetUp() override {
         SchedTest::SetUp();
         shell(
-            "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins; chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
+            "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins /run/tavisched.lock; chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
             "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
             "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
             "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
@@ -104,11 +104,15 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"run 9", "there is no task 9"},
         {"history 9", "there is no task 9"},
         {"list --sort colour", "--sort: colour not in"},
+        {"edit 4 --at 08:00", "task 4 (Task 4) is kept under another number"},
         {"remove 01x --yes", "\"01x\" is no id; accepted"},
         {"history --limit 0", "--limit: Value 0 not in range"},
         {"frobnicate", "not expected: frobnicate"},
         {"", "a command is needed"},
     };
+    shell("for file in /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks; do "
+          "sed 's/^.1]/[3]/; s/^id=1/id=4/; s/Task 1/Task 4/' $file >> $file.new; cat $file.new "
+          ">> $file; rm $file.new; done");
     const std::string before = machine();
     for (const auto &c : kCases) {
         EXPECT_THAT(run(c.arguments), HasSubstr(c.said)) << c.arguments;
@@ -208,6 +212,8 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
     shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
           "printf '#!/bin/sh\ncat /etc/crontab >> /tmp/seen\n' > see; chmod 755 see");
     done("disable 2 1");
+    run("enable 2 1");
+    EXPECT_EQ(status_, 2);
     EXPECT_THAT(readFile("/tmp/seen"), AllOf(HasSubstr("SHELL"), Not(HasSubstr("99"))));
     done("edit 1 --at 9:00 --enabled");
     EXPECT_THAT(readFile(kCrontab),
@@ -225,9 +231,11 @@ TEST_F(CommandLine, FiftyAtOnceLoseNothing) {
 TEST_F(CommandLine, ChangesFollowOneAnother) {
     done("add --command x");
     done("add --command x");
-    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
-          "printf '#!/bin/sh\n/usr/tavi/bin/tavisched disable 2 >> /tmp/inner 2>&1\n"
-          "/usr/tavi/bin/tavisched list >> /tmp/inner\nsleep 0.3\n' > nest; chmod 755 nest");
+    shell(
+        "mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
+        "printf '#!/bin/sh\n/usr/tavi/bin/tavisched disable 2 >> /tmp/inner 2>&1\n"
+        "/usr/tavi/bin/tavisched run 3 --wait >> /tmp/inner\nsleep 0.3\n' > nest; chmod 755 nest");
+    done("add --command '/usr/tavi/bin/tavisched list >> /tmp/inner'");
     // A handler may read; its own change is refused at once, and a signal waits for the end.
     EXPECT_EQ(shell("/usr/tavi/bin/tavisched edit 1 --at 05:00 > /tmp/out & sleep 0.2; "
                     "kill -TERM $!; wait $!"),
@@ -237,7 +245,7 @@ TEST_F(CommandLine, ChangesFollowOneAnother) {
     EXPECT_THAT(done("list"), HasSubstr("daily 05:00"));
     // A reader that goes away ends nothing half done.
     shell("rm -r /usr/tavi/etc/plugins; /usr/tavi/bin/tavisched disable 1 2 | true");
-    EXPECT_THAT(done("list"), Not(HasSubstr("enabled")));
+    EXPECT_THAT(done("list"), testing::ContainsRegex("Task 1  disabled.*\n.*Task 2  disabled"));
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
 }
 
@@ -248,7 +256,8 @@ TEST_F(CommandLine, ExportAndImportGiveTheSameTasks) {
     done("export > /tmp/all.json");
     const std::string before = machine();
     done("remove 1 2 90022300");
-    done("import /tmp/all.json");
+    shell("ln -s /tmp/all.json /tmp/link");
+    done("import /tmp/link");
     EXPECT_EQ(machine(), before);
     EXPECT_EQ(done("import - < /tmp/all.json"), "task 3 (Пример \"x\"), was 1\ntask 4 (Task 2), "
                                                 "was 2\ntask 90022300 (PowerOff task 0)\n");
@@ -435,7 +444,9 @@ TEST_F(CommandLine, FindsAndMendsWhatIsWrong) {
          "/usr/tavi/g; ln -sf /usr/tavi/g/tavischedtask /tmp",
          "others than root can replace", true},
         {"rmdir /tmp/lock", "/tmp/lock is missing", true},
-        {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", false},
+        {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},
+        {"rm /run/tavisched.lock; mkdir /run/tavisched.lock", "tavisched.lock is no file", false},
+        {"ln /tmp/scheduled_tasks /tmp/x", "as root runs what it says", true},
         {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},
         {"chown bin /tmp/lock", "/tmp/lock must belong to root", false},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},

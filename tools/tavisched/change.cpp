@@ -15,8 +15,8 @@ namespace tavisched {
 
 namespace {
 
-constexpr int kEndingSignals[] = {SIGINT, SIGTERM, SIGHUP};
-volatile sig_atomic_t lastSignal = 0;
+constexpr int kEndingSignals[] = {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGPIPE};
+volatile sig_atomic_t seenSignals[NSIG];
 
 void requireRights() {
     for (const char *const folder : {kFolder, "/tmp", "/etc"}) {
@@ -47,7 +47,9 @@ void requireSameCopies() {
 // In one step, or, when the file system has no room for that, in place.
 void writeBack(const char *path, const std::optional<std::string> &content) {
     if (!content) {
-        unlink(path);
+        if (unlink(path) != 0) {
+            throw Failure(std::string(path) + " could not be removed: " + systemReason());
+        }
         return;
     }
     try {
@@ -65,30 +67,30 @@ void writeBack(const char *path, const std::optional<std::string> &content) {
     }
 }
 
-[[noreturn]] void fail(const TAVI_SCHED_TASK &task, const char *what) {
-    throw Failure(called(task) + " could not be " + what + ": " + libraryError() +
-                  "; \"tavisched check\" looks for the cause");
-}
-
 } // namespace
 
 // ---- Signals ----
 
 DelayedSignals::DelayedSignals() {
     struct sigaction note {};
-    note.sa_handler = [](int signal) { lastSignal = signal; };
+    note.sa_handler = [](int signal) { seenSignals[signal] = 1; };
     note.sa_flags = SA_RESTART;
     for (const int signal : kEndingSignals) {
-        sigaction(signal, &note, &before_[signal]);
+        struct sigaction &before = before_[signal];
+        sigaction(signal, nullptr, &before);
+        if (before.sa_handler != SIG_IGN) {
+            sigaction(signal, &note, nullptr);
+        }
     }
 }
 
 DelayedSignals::~DelayedSignals() {
     for (const auto &[signal, action] : before_) {
         sigaction(signal, &action, nullptr);
-    }
-    if (lastSignal != 0) {
-        raise(lastSignal);
+        // A closed pipe shows once more when something is printed.
+        if (seenSignals[signal] != 0 && signal != SIGPIPE) {
+            raise(signal);
+        }
     }
 }
 
@@ -97,8 +99,24 @@ DelayedSignals::~DelayedSignals() {
 Change::Change() {
     requireRights();
     requireSameCopies();
+    before_ = readContents();
+    lastWritten_ = before_;
+}
+
+Change::Contents Change::readContents() {
+    Contents contents;
     for (const char *const path : {kPersistent, kWorkingCopy, kPowerSchedules}) {
-        before_[path] = contentIfThere(path);
+        contents[path] = contentIfThere(path);
+    }
+    return contents;
+}
+
+void Change::finishStep(bool succeeded, const TAVI_SCHED_TASK &task, const char *what) {
+    const std::string error = libraryError();
+    lastWritten_ = readContents();
+    if (!succeeded) {
+        throw Failure(called(task) + " could not be " + what + ": " + error +
+                      "; \"tavisched check\" looks for the cause");
     }
 }
 
@@ -115,25 +133,31 @@ Change::~Change() {
 }
 
 void Change::takeBack() {
-    bool changed = false;
+    const Contents now = readContents();
+    if (now == before_) {
+        return;
+    }
     for (const auto &[path, content] : before_) {
-        if (contentIfThere(path) != content) {
+        if (now.at(path) != content && now.at(path) == lastWritten_.at(path)) {
             writeBack(path, content);
-            changed = true;
         }
     }
-    if (changed) {
-        const Tasks tasks = Tasks::read();
-        requireGoodCrontab({tasks.all().begin(), tasks.all().end()});
-        TAVISchedTaskSync();
+    if (readContents() != before_) {
+        throw Failure(
+            "another program has changed tasks meanwhile; \"tavisched check\" tells more");
+    }
+    try {
+        syncCrontab();
         std::cerr << "tavisched: everything is as it was before\n";
+    } catch (const std::exception &) {
+        std::cerr
+            << "tavisched: the tasks are as they were before; \"tavisched sync\" writes their "
+               "lines of /etc/crontab\n";
     }
 }
 
 void Change::create(TAVI_SCHED_TASK &task) {
-    if (TAVISchedTaskCreate(&task) != 0) {
-        fail(task, "stored");
-    }
+    finishStep(TAVISchedTaskCreate(&task) == 0, task, "stored");
 }
 
 void Change::createWithId(TAVI_SCHED_TASK &task) {
@@ -141,15 +165,11 @@ void Change::createWithId(TAVI_SCHED_TASK &task) {
     const auto schedule = std::find_if(backends.begin(), backends.end(), [](const auto &backend) {
         return backend.id == TAVI_SCHED_BACKEND_SCHEDULE;
     });
-    if (schedule->edit(&task) != 0) {
-        fail(task, "stored");
-    }
+    finishStep(schedule->edit(&task) == 0, task, "stored");
 }
 
 void Change::edit(TAVI_SCHED_TASK &task) {
-    if (TAVISchedTaskEdit(&task) != 0) {
-        fail(task, "changed");
-    }
+    finishStep(TAVISchedTaskEdit(&task) == 0, task, "changed");
     if (isPower(task)) {
         const Tasks now = Tasks::read();
         if (const TAVI_SCHED_TASK *const stored = now.findSameSchedule(task)) {
@@ -159,9 +179,7 @@ void Change::edit(TAVI_SCHED_TASK &task) {
 }
 
 void Change::remove(const TAVI_SCHED_TASK &task) {
-    if (TAVISchedTaskRemove(task.id) != 0) {
-        fail(task, "removed");
-    }
+    finishStep(TAVISchedTaskRemove(task.id) == 0, task, "removed");
 }
 
 void Change::defuse(const TaskPointers &tasks) {
@@ -173,14 +191,19 @@ void Change::defuse(const TaskPointers &tasks) {
         harmless->state = TAVI_SCHED_STATE_DISABLED;
         const Hash form(*harmless);
         for (const char *const path : {kPersistent, kWorkingCopy}) {
-            if (PLATCFileSetSection(path, std::to_string(task->id).c_str(), form.get()) < 0) {
-                fail(*task, "changed");
-            }
+            const bool done =
+                stateOf(path) == FileState::Missing ||
+                PLATCFileSetSection(path, std::to_string(task->id).c_str(), form.get()) == 1;
+            finishStep(done, *task, "changed");
         }
     }
 }
 
 void Change::keep() {
+    // Another program may have written the file between our step and now.
+    if (compareCrontab(Tasks::read()).any()) {
+        TAVISchedTaskSync();
+    }
     requireSyncedCrontab();
     kept_ = true;
 }

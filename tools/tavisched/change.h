@@ -28,8 +28,9 @@ class DelayedSignals {
 };
 
 // Everything between its construction and keep() is stored as one: when keep() is not reached, the
-// files are as they were. Its construction fails without the rights to change tasks, and when the
-// two task files differ or must not be believed, as a change would then lose one of them.
+// files are as they were, unless another program has changed them since. Its construction fails
+// without the rights to change tasks, and when the two task files differ or must not be believed,
+// as a change would then lose one of them.
 class Change {
   public:
     Change();
@@ -52,11 +53,16 @@ class Change {
     void keep();
 
   private:
+    using Contents = std::map<const char *, std::optional<std::string>>;
+    static Contents readContents();
+    // To be called after every step: fails when it did.
+    void finishStep(bool succeeded, const TAVI_SCHED_TASK &task, const char *what);
     void takeBack();
 
-    DelayedSignals signals_;
     Lock lock_{Lock::Kind::Changing};
-    std::map<const char *, std::optional<std::string>> before_;
+    DelayedSignals signals_;
+    Contents before_;
+    Contents lastWritten_;
     bool kept_ = false;
 };
 

@@ -35,9 +35,9 @@ bool isEmptyOrMissing(const char *path) {
 
 std::string adviseRootsAlone(const std::string &path) {
     const auto status = statusOf(path.c_str());
-    return status && (S_ISREG(status->st_mode) || S_ISDIR(status->st_mode))
+    return status && (S_ISREG(status->st_mode) || path == kFolder || path == kPlugins)
                ? "look who changed it; then chown root " + path + " and chmod go-w " + path
-               : "remove it: rm " + path;
+               : "remove it: rm -r " + path;
 }
 
 // ---- Files ----
@@ -82,6 +82,15 @@ void inspectStrangeFiles(Findings &findings) {
         if (stateOf(path) == FileState::Strange) {
             findings.push_back({path + std::string(kNobodyElse), adviseRootsAlone(path), {}});
         }
+    }
+}
+
+void inspectChangeLock(Findings &findings) {
+    const auto lock = statusOf(kChangeLock);
+    if (lock && !S_ISREG(lock->st_mode)) {
+        findings.push_back({std::string(kChangeLock) + " is no file, so that no change is possible",
+                            std::string("remove it: rm -r ") + kChangeLock,
+                            {}});
     }
 }
 
@@ -465,6 +474,7 @@ void inspectWithTasks(Findings &findings) {
 std::vector<Finding> inspectMachine() {
     Findings findings;
     inspectFolders(findings);
+    inspectChangeLock(findings);
     const bool readable = inspectTaskFiles(findings);
     inspectPutAside(findings);
     inspectRunner(findings);

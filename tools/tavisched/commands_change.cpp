@@ -3,12 +3,13 @@
 #include "change.h"
 #include "commands.h"
 #include "failure.h"
-#include "files.h"
 #include "json.h"
 #include "words.h"
 
 #include <algorithm>
 #include <cstdio>
+#include <filesystem>
+#include <fstream>
 #include <iostream>
 #include <iterator>
 #include <string_view>
@@ -194,12 +195,15 @@ Lines removeShown(const Ids &ids, const Lines &shown) {
 // ---- Import ----
 
 std::string readWhole(const std::string &file) {
-    try {
-        return file == "-" ? std::string(std::istreambuf_iterator<char>(std::cin), {})
-                           : contentOf(file.c_str());
-    } catch (const Failure &failure) {
-        throw Refusal(std::string(failure.what()) + "; accepted: a file, or - for standard input");
+    if (file == "-") {
+        return {std::istreambuf_iterator<char>(std::cin), {}};
     }
+    std::error_code ignored;
+    std::ifstream stream(file, std::ios::binary);
+    if (!stream || std::filesystem::is_directory(file, ignored)) {
+        throw Refusal(file + " cannot be read; accepted: a file, or - for standard input");
+    }
+    return {std::istreambuf_iterator<char>(stream), {}};
 }
 
 // A schedule that is there already, or was imported just now, is as good as stored.
@@ -300,6 +304,10 @@ std::vector<Task> withState(const Tasks &tasks, const std::vector<TAVI_SCHED_TAS
     for (const TAVI_SCHED_TASK *const task : selected) {
         Task copy = copyOf(*task);
         TAVISchedCTaskSetState(copy.get(), enabled ? 1 : 0);
+        if (const auto why = enabled ? whyCronRejects(*copy) : std::nullopt) {
+            throw Refusal("cron would ignore all of /etc/crontab for the line of " + called(*copy) +
+                          ": " + *why + "; mend its schedule with \"tavisched edit\"");
+        }
         if (enabled) {
             refusePast(*copy);
         }
@@ -316,7 +324,9 @@ Lines changeStates(const Ids &ids, bool enabled) {
     const Tasks tasks = Tasks::read();
     const auto selected = tasks.select(ids);
     const std::vector<Task> changed = withState(tasks, selected, enabled);
-    change.defuse({selected.begin(), selected.end()});
+    if (!enabled) {
+        change.defuse({selected.begin(), selected.end()});
+    }
     Lines lines;
     for (size_t i = 0; i < selected.size(); ++i) {
         if (selected[i]->state != changed[i]->state) {

@@ -4,6 +4,7 @@
 #include "commands.h"
 #include "failure.h"
 #include "lock.h"
+#include "process.h"
 #include "runs.h"
 #include "tasks.h"
 #include "words.h"
@@ -13,9 +14,7 @@
 #include <cstdio>
 #include <fcntl.h>
 #include <filesystem>
-#include <fstream>
 #include <iostream>
-#include <sstream>
 #include <string>
 #include <sys/prctl.h>
 #include <sys/wait.h>
@@ -26,33 +25,6 @@ namespace tavisched {
 namespace {
 
 constexpr int kGaveUp = 1;
-
-// What /proc tells of a process.
-struct Process {
-    std::string name;
-    pid_t parent = 0;
-    unsigned long long startTime = 0;
-};
-
-Process describe(const std::string &pid) {
-    std::string line;
-    std::ifstream file("/proc/" + pid + "/stat");
-    std::getline(file, line);
-    const size_t begin = line.find('(');
-    const size_t end = line.rfind(')');
-    if (begin == std::string::npos || end == std::string::npos) {
-        return {};
-    }
-    Process process{.name = line.substr(begin, end - begin)};
-    std::istringstream fields(line.substr(end + 1));
-    std::string skipped;
-    fields >> skipped >> process.parent;
-    for (int field = 5; field < 22; ++field) {
-        fields >> skipped;
-    }
-    fields >> process.startTime;
-    return process;
-}
 
 // The oldest child that runs this program. What a task's command leaves behind becomes a child too,
 // but it is younger.
@@ -131,11 +103,6 @@ Started startWithHelper(const TAVI_SCHED_TASK &task) {
     return started;
 }
 
-void tellStarted(const TAVI_SCHED_TASK &task) {
-    std::printf("%s: started\n", called(task).c_str());
-    std::fflush(stdout);
-}
-
 // The run's exit status, when its process has ended.
 int reportEnd(const Started &started) {
     for (const Run &run : readRuns(started.task->id)) {
@@ -164,8 +131,12 @@ int run(const Ids &ids, bool wait) {
         } else {
             start(*task);
         }
-        tellStarted(*task);
     }
+    // A reader that goes away keeps none from being started.
+    for (const TAVI_SCHED_TASK *const task : tasks.select(ids)) {
+        std::printf("%s: started\n", called(*task).c_str());
+    }
+    std::fflush(stdout);
     int status = 0;
     for (const Started &started : runs) {
         waitFor(started.helper);

@@ -3,7 +3,10 @@
 #include "failure.h"
 
 #include <array>
+#include <cstdio>
+#include <cstdlib>
 #include <fcntl.h>
+#include <filesystem>
 #include <unistd.h>
 
 namespace tavisched {
@@ -26,8 +29,42 @@ class Descriptor {
     int number_;
 };
 
+// A file with a second name may be one of root's that somebody linked there.
+bool isTrusted(const struct stat &status) {
+    return S_ISREG(status.st_mode) && isRootsAlone(status) && status.st_nlink == 1;
+}
+
 [[noreturn]] void fail(const char *path, const char *what, const std::string &why) {
     throw Failure(std::string(path) + " could not be " + what + ": " + why);
+}
+
+// A folder that nobody else can enter, beside a file, with what is left in it.
+class PrivateFolder {
+  public:
+    explicit PrivateFolder(const char *besides) : path_(std::string(besides) + ".XXXXXX") {
+        if (!mkdtemp(path_.data())) {
+            fail(besides, "made", systemReason());
+        }
+    }
+    ~PrivateFolder() {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+    PrivateFolder(const PrivateFolder &) = delete;
+    PrivateFolder &operator=(const PrivateFolder &) = delete;
+    const std::string &path() const { return path_; }
+
+  private:
+    std::string path_;
+};
+
+// In one step, so that the name is never free for others; a folder in the way is exchanged.
+void putInPlace(const std::string &made, const char *path) {
+    if (rename(made.c_str(), path) != 0 &&
+        (errno != EISDIR ||
+         renameat2(AT_FDCWD, made.c_str(), AT_FDCWD, path, RENAME_EXCHANGE) != 0)) {
+        fail(path, "put in place", systemReason());
+    }
 }
 
 bool writeAll(int fd, const std::string &content) {
@@ -58,8 +95,7 @@ FileState stateOf(const char *path) {
     if (!status) {
         return FileState::Missing;
     }
-    return S_ISREG(status->st_mode) && isRootsAlone(*status) ? FileState::Trusted
-                                                             : FileState::Strange;
+    return isTrusted(*status) ? FileState::Trusted : FileState::Strange;
 }
 
 std::string contentOf(const char *path) {
@@ -68,8 +104,8 @@ std::string contentOf(const char *path) {
     if (file.number() == -1 || fstat(file.number(), &status) != 0) {
         fail(path, "read", systemReason());
     }
-    if (!S_ISREG(status.st_mode)) {
-        fail(path, "read", "it is no file");
+    if (!isTrusted(status)) {
+        fail(path, "read", "it is not a file of root's alone");
     }
     std::string content;
     std::array<char, 65536> part{};
@@ -88,32 +124,26 @@ std::optional<std::string> contentIfThere(const char *path) {
 }
 
 void replaceFile(const char *path, const std::string &content) {
-    std::string made = std::string(path) + ".XXXXXX";
-    const Descriptor file(mkostemp(made.data(), O_CLOEXEC));
-    if (file.number() == -1) {
+    const PrivateFolder folder(path);
+    const std::string made = folder.path() + "/file";
+    const Descriptor file(open(made.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
+    const auto before = statusOf(path);
+    const bool keepsMode = before && S_ISREG(before->st_mode) && isRootsAlone(*before);
+    if (file.number() == -1 || !writeAll(file.number(), content) ||
+        (keepsMode && (fchown(file.number(), before->st_uid, before->st_gid) != 0 ||
+                       fchmod(file.number(), before->st_mode & 0777) != 0))) {
         fail(path, "written", systemReason());
     }
-    if (!writeAll(file.number(), content) || rename(made.c_str(), path) != 0) {
-        const std::string why = systemReason();
-        unlink(made.c_str());
-        fail(path, "written", why);
-    }
+    putInPlace(made, path);
 }
 
 void replaceByLink(const char *path, const std::string &target) {
-    // Made in a folder that nobody else can enter, so that the name is never free for others.
-    std::string folder = std::string(path) + ".XXXXXX";
-    if (!mkdtemp(folder.data())) {
+    const PrivateFolder folder(path);
+    const std::string made = folder.path() + "/link";
+    if (symlink(target.c_str(), made.c_str()) != 0) {
         fail(path, "made", systemReason());
     }
-    const std::string made = folder + "/link";
-    const bool done = symlink(target.c_str(), made.c_str()) == 0 && rename(made.c_str(), path) == 0;
-    const std::string why = systemReason();
-    unlink(made.c_str());
-    rmdir(folder.c_str());
-    if (!done) {
-        fail(path, "made", why);
-    }
+    putInPlace(made, path);
 }
 
 } // namespace tavisched

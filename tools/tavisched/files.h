@@ -14,15 +14,16 @@ bool isRootsAlone(const struct stat &status);
 std::optional<struct stat> statusOf(const char *path);
 
 enum class FileState { Missing, Trusted, Strange };
-// Trusted is a regular file of root's alone.
+// Trusted is a regular file of root's alone, with one name.
 FileState stateOf(const char *path);
 
-// The content of a regular file. Fails, and does not wait, when it cannot be read as one.
+// The content of a trusted file. Fails, and does not wait, when it is none.
 std::string contentOf(const char *path);
 // The same; nothing for a missing file.
 std::optional<std::string> contentIfThere(const char *path);
 
-// Puts a file with mode 0600 and this content in the place of what is there, in one step.
+// Puts a file with this content in the place of what is there, in one step; it has the mode of a
+// trusted one that was there, else 0600.
 void replaceFile(const char *path, const std::string &content);
 // The same for a symbolic link.
 void replaceByLink(const char *path, const std::string &target);

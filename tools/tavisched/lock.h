@@ -5,8 +5,8 @@
 namespace tavisched {
 
 // Held from its construction to its destruction; waits as long as others hold it. A plug-in handler
-// is started while a change holds the lock: when it uses this program, reading goes on without the
-// lock, and a change fails at once, as it would wait for its own parent.
+// is started while a change holds the lock, and the change waits for it: when a process below the
+// one that holds the lock uses this program, reading goes on without the lock, and a change fails.
 class Lock {
   public:
     enum class Kind { Reading, Changing };
@@ -16,8 +16,10 @@ class Lock {
     Lock &operator=(const Lock &) = delete;
 
   private:
-    void acquire(Kind kind);
+    void acquire();
+    bool isBelowHolder() const;
 
+    Kind kind_;
     int fd_;
 };
 

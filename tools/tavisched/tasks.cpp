@@ -3,6 +3,7 @@
 #include "failure.h"
 #include "files.h"
 #include "paths.h"
+#include "stored_form.h"
 #include "text.h"
 
 #include <algorithm>
@@ -106,6 +107,18 @@ TAVI_SCHED_TASK *Tasks::findSameSchedule(const TAVI_SCHED_TASK &schedule) const 
     return found == ordered_.end() ? nullptr : *found;
 }
 
+namespace {
+
+// The library finds a task by the name of its section.
+bool isKeptUnderItsId(const TAVI_SCHED_TASK &task) {
+    const std::string id = std::to_string(task.id);
+    Hash pairs;
+    return isPower(task) || (PLATCFileGetSection(kWorkingCopy, id.c_str(), pairs.address()) == 1 &&
+                             pairs.value("id") == id);
+}
+
+} // namespace
+
 std::vector<TAVI_SCHED_TASK *> Tasks::select(const std::vector<int32_t> &ids) const {
     if (ids.empty()) {
         return ordered_;
@@ -119,6 +132,11 @@ std::vector<TAVI_SCHED_TASK *> Tasks::select(const std::vector<int32_t> &ids) co
         }
         const auto count = std::count_if(ordered_.begin(), ordered_.end(),
                                          [id](const auto *other) { return other->id == id; });
+        if (!isKeptUnderItsId(*task)) {
+            throw Refusal(called(*task) +
+                          " is kept under another number; \"tavisched check\" tells "
+                          "what to do");
+        }
         if (count > 1) {
             throw Refusal(std::to_string(count) + " tasks have the id " + std::to_string(id) +
                           "; \"tavisched check\" tells what to do");

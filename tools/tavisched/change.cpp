@@ -26,8 +26,20 @@ void requireRights() {
     }
 }
 
+// Another program that stores a change just now has written one of them and not yet the other.
+Copies settledCopies() {
+    constexpr int kTries = 25;
+    constexpr useconds_t kPause = 20000; // microseconds
+    Copies copies = compareCopies();
+    for (int tries = 0; copies == Copies::Different && tries < kTries; ++tries) {
+        usleep(kPause);
+        copies = compareCopies();
+    }
+    return copies;
+}
+
 void requireSameCopies() {
-    switch (compareCopies()) {
+    switch (settledCopies()) {
     case Copies::Same:
     case Copies::PersistentMissing:
         return;

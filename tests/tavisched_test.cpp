@@ -249,6 +249,46 @@ TEST_F(CommandLine, ChangesFollowOneAnother) {
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
 }
 
+// The crontab becomes unwritable behind the first of two tasks.
+TEST_F(CommandLine, TakesBackAChangeOfSeveralTasks) {
+    done("add --command x");
+    done("add --command y");
+    const std::string before = machine();
+    shell(
+        "mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
+        "printf '#!/bin/sh\n[ \"$2\" = pre ] || mount -n --bind /etc/crontab /etc/crontab\n' > spoil;"
+        "chmod 755 spoil");
+    EXPECT_THAT(run("disable 1 2"),
+                AllOf(HasSubstr("the tasks are as they were before; \"tavisched sync\""),
+                      HasSubstr("/etc/crontab could not be written")));
+    EXPECT_EQ(status_, 1);
+    EXPECT_THAT(run("check"), HasSubstr("lacks a task's line"));
+    shell("while umount -n /etc/crontab; do :; done 2>/dev/null; rm -r /usr/tavi/etc/plugins");
+    done("sync");
+    EXPECT_EQ(machine(), before);
+    EXPECT_THAT(done("check"), HasSubstr("All is well."));
+}
+
+TEST_F(CommandLine, ShowsTasksForScripts) {
+    done("add --name b --command 'echo \"1\"' --weekly Mon --at 05:00 --owner bin --disabled");
+    done("add --name A --command 'exit 3' --once 2099-12-24");
+    run("run 2 --wait");
+    const std::string json = done("list --json --sort name --reverse");
+    for (const char *const member :
+         {"\"id\": 1,", "\"command\": \"echo \\\"1\\\"\",", "\"lastRun\": null,",
+          "\"nextRun\": null,", "\"owner\": \"bin\",", "\"ownerId\": 2,",
+          "\"schedule\": \"Mon 05:00\",", "\"state\": \"disabled\",", "\"type\": \"weekly\"",
+          "\"nextRun\": \"2099-12-24 00:00\",", "\"result\": \"exit 3\",", "\"statusCode\": 7,",
+          "\"comment\": \"3\","}) {
+        EXPECT_THAT(json, HasSubstr(member));
+    }
+    EXPECT_LT(json.find("\"b\""), json.find("\"A\""));
+    EXPECT_THAT(done("history 2 --json"), HasSubstr("\"task\": 2"));
+    EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
+    // What the web back end exchanges can be saved as it is.
+    EXPECT_EQ(TAVISchedTaskSaveFromJson(done("show 2 --json").c_str(), 0), 2);
+}
+
 TEST_F(CommandLine, ExportAndImportGiveTheSameTasks) {
     done("add --name 'Пример \"x\"' --command 'echo \"a\"\n# b' --weekly Sat --owner bin");
     done("add --command x --disabled --yearly 12-24 --app '007'");

@@ -125,6 +125,7 @@ Change::Contents Change::readContents() {
 
 void Change::finishStep(bool succeeded, const TAVI_SCHED_TASK &task, const char *what) {
     const std::string error = libraryError();
+    touched_ = true;
     lastWritten_ = readContents();
     if (!succeeded) {
         throw Failure(called(task) + " could not be " + what + ": " + error +
@@ -133,7 +134,7 @@ void Change::finishStep(bool succeeded, const TAVI_SCHED_TASK &task, const char 
 }
 
 Change::~Change() {
-    if (kept_) {
+    if (kept_ || !touched_) {
         return;
     }
     try {

@@ -63,6 +63,7 @@ class Change {
     DelayedSignals signals_;
     Contents before_;
     Contents lastWritten_;
+    bool touched_ = false;
     bool kept_ = false;
 };
 

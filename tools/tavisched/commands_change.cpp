@@ -381,7 +381,7 @@ int importTasks(const std::string &file) {
 
 int syncTasks() {
     {
-        const Change change; // there is nothing to take back
+        const Change change; // changes no task, but none may change meanwhile
         syncCrontab();
     }
     std::printf("/etc/crontab has the lines of all enabled tasks.\n");

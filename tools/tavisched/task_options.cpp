@@ -9,10 +9,7 @@
 
 #include <algorithm>
 #include <array>
-#include <cctype>
 #include <charconv>
-#include <cstdio>
-#include <ctime>
 #include <pwd.h>
 #include <string_view>
 #include <strings.h>

@@ -2,7 +2,6 @@
 #include "task_rules.h"
 #include "text.h"
 
-#include <algorithm>
 #include <chrono>
 #include <pwd.h>
 

@@ -32,6 +32,14 @@ void requireReadable() {
     }
 }
 
+// The library finds a task by the name of its section.
+bool isKeptUnderItsId(const TAVI_SCHED_TASK &task) {
+    const std::string id = std::to_string(task.id);
+    Hash pairs;
+    return isPower(task) || (PLATCFileGetSection(kWorkingCopy, id.c_str(), pairs.address()) == 1 &&
+                             pairs.value("id") == id);
+}
+
 } // namespace
 
 std::span<const TAVI_SCHED_BACKEND_RECORD> registeredBackends() {
@@ -106,18 +114,6 @@ TAVI_SCHED_TASK *Tasks::findSameSchedule(const TAVI_SCHED_TASK &schedule) const 
     });
     return found == ordered_.end() ? nullptr : *found;
 }
-
-namespace {
-
-// The library finds a task by the name of its section.
-bool isKeptUnderItsId(const TAVI_SCHED_TASK &task) {
-    const std::string id = std::to_string(task.id);
-    Hash pairs;
-    return isPower(task) || (PLATCFileGetSection(kWorkingCopy, id.c_str(), pairs.address()) == 1 &&
-                             pairs.value("id") == id);
-}
-
-} // namespace
 
 std::vector<TAVI_SCHED_TASK *> Tasks::select(const std::vector<int32_t> &ids) const {
     if (ids.empty()) {

@@ -45,7 +45,7 @@ class Tasks {
     // The power schedule that is the same, or nullptr.
     TAVI_SCHED_TASK *findSameSchedule(const TAVI_SCHED_TASK &schedule) const;
     // The tasks of the ids, each once, or all tasks when there are no ids; refused when one is not
-    // there, or is the id of several.
+    // there, is the id of several, or is not the number of the task's section.
     std::vector<TAVI_SCHED_TASK *> select(const std::vector<int32_t> &ids) const;
 
   private:

@@ -1,4 +1,4 @@
-// Waiting for children in a process whose own handling of SIGCHLD is not ours to know.
+// Children, in a process whose own handling of SIGCHLD is not ours to know, and other processes.
 #pragma once
 
 #include <csignal>
@@ -24,5 +24,8 @@ class ChildSignals {
 
 // Waits for the child to end. Its wait status, or -1.
 int waitForChild(pid_t pid);
+
+// Whether the process exists and is no zombie.
+bool isAlive(pid_t pid);
 
 } // namespace base

@@ -1,10 +1,16 @@
 // Whole files.
 #include "file.h"
+#include "child.h"
 
+#include <algorithm>
+#include <cctype>
 #include <cerrno>
+#include <charconv>
 #include <cstdlib>
+#include <dirent.h>
 #include <fcntl.h>
 #include <filesystem>
+#include <new>
 
 namespace base {
 
@@ -13,6 +19,15 @@ namespace {
 std::string folderOf(const std::string &path) {
     const size_t slash = path.rfind('/');
     return slash == std::string::npos ? "." : path.substr(0, slash + 1);
+}
+
+Descriptor openFolder(const std::string &folder) {
+    return Descriptor(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+}
+
+// A file system that cannot flush a folder says EINVAL; it has nothing to flush then.
+bool syncFolder(const Descriptor &folder) {
+    return folder && (fsync(folder.get()) == 0 || errno == EINVAL);
 }
 
 bool makeLater(int fd, const struct stat &old) {
@@ -32,7 +47,7 @@ bool makeLater(int fd, const struct stat &old) {
 
 bool isInSharedFolder(const std::string &path) {
     struct stat status {};
-    return stat(folderOf(path).c_str(), &status) == 0 && (status.st_mode & S_ISVTX) != 0;
+    return stat(folderOf(path).c_str(), &status) != 0 || (status.st_mode & S_ISVTX) != 0;
 }
 
 std::optional<std::string> readAll(int fd) {
@@ -71,8 +86,7 @@ bool writeAll(int fd, std::string_view content) {
 }
 
 bool syncFolderOf(const std::string &path) {
-    const Descriptor folder(::open(folderOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    return folder && fsync(folder.get()) == 0;
+    return syncFolder(openFolder(folderOf(path)));
 }
 
 bool makeEmpty(const char *path) {
@@ -80,16 +94,64 @@ bool makeEmpty(const char *path) {
     return file && file.close();
 }
 
+// ---- Leftovers ----
+
+std::string processTemporary() {
+    return "." + std::to_string(getpid()) + std::string(kTemporary);
+}
+
+namespace {
+
+// The process whose temporary file an entry's name is, behind the file's name; 0 for other names.
+pid_t makerOf(std::string_view behind) {
+    const char *const end = behind.data() + behind.size();
+    pid_t pid = 0;
+    if (!behind.starts_with('.')) {
+        return 0;
+    }
+    const auto parsed = std::from_chars(behind.data() + 1, end, pid);
+    const std::string_view rest(parsed.ptr, static_cast<size_t>(end - parsed.ptr));
+    const bool isTemporary = parsed.ec == std::errc() && rest.size() == kTemporary.size() &&
+                             rest.front() == '.' &&
+                             std::all_of(rest.begin() + 1, rest.end(),
+                                         [](unsigned char letter) { return std::isalnum(letter); });
+    return isTemporary ? pid : 0;
+}
+
+} // namespace
+
+void removeLeftovers(const std::string &path) {
+    const std::string folder = folderOf(path);
+    const std::string_view name = std::string_view(path).substr(path.rfind('/') + 1);
+    const std::unique_ptr<DIR, int (*)(DIR *)> entries(opendir(folder.c_str()), closedir);
+    if (!entries) {
+        return;
+    }
+    while (const dirent *const entry = readdir(entries.get())) {
+        const std::string_view found(entry->d_name);
+        if (!found.starts_with(name)) {
+            continue;
+        }
+        const pid_t maker = makerOf(found.substr(name.size()));
+        if (maker > 0 && !isAlive(maker)) {
+            unlinkat(dirfd(entries.get()), entry->d_name, 0);
+        }
+    }
+}
+
 // ---- Replacement ----
 
-Replacement::Replacement(std::string path)
-    : path_(std::move(path)), stream_(nullptr, std::fclose) {}
+Replacement::Replacement(std::string path, std::string_view temporary)
+    : path_(std::move(path)), temporary_(path_ + std::string(temporary)),
+      stream_(nullptr, std::fclose) {}
 
 Replacement::~Replacement() {
+    const int savedErrno = errno;
     stream_.reset();
-    if (!temporary_.empty()) {
+    if (isMade_) {
         unlink(temporary_.c_str());
     }
+    errno = savedErrno;
 }
 
 bool Replacement::fail(Step step) {
@@ -98,12 +160,11 @@ bool Replacement::fail(Step step) {
 }
 
 bool Replacement::open() {
-    temporary_ = path_ + ".XXXXXX";
     Descriptor file(mkostemp(temporary_.data(), O_CLOEXEC));
     if (!file) {
-        temporary_.clear();
         return fail(Step::Create);
     }
+    isMade_ = true;
     stream_.reset(fdopen(file.get(), "w"));
     if (!stream_) {
         return fail(Step::Stream);
@@ -117,17 +178,25 @@ bool Replacement::write(std::string_view content) {
            fail(Step::Write);
 }
 
+bool Replacement::setAttributes(int fd, const Manner &manner) {
+    const struct stat *const like = manner.like;
+    return !like ||
+           (fchown(fd, like->st_uid, like->st_gid) == 0 &&
+            fchmod(fd, like->st_mode & ALLPERMS) == 0 && (!manner.later || makeLater(fd, *like)));
+}
+
 bool Replacement::commit(const Manner &manner) {
     if (std::fflush(stream_.get()) != 0 || std::ferror(stream_.get())) {
         return fail(Step::Flush);
     }
     const int fd = fileno(stream_.get());
-    const struct stat *const like = manner.like;
-    if ((manner.durable && fsync(fd) != 0) ||
-        (like &&
-         (fchown(fd, like->st_uid, like->st_gid) != 0 ||
-          fchmod(fd, like->st_mode & ALLPERMS) != 0 || (manner.later && !makeLater(fd, *like))))) {
+    if (!setAttributes(fd, manner) || (manner.durable && fsync(fd) != 0)) {
         return fail(Step::Attributes);
+    }
+    // Before the rename: what can fail before it leaves the old file in place.
+    const Descriptor folder = manner.durable ? openFolder(folderOf(path_)) : Descriptor();
+    if (manner.durable && !folder) {
+        return fail(Step::SyncFolder);
     }
     if (std::fclose(stream_.release()) != 0) {
         return fail(Step::Close);
@@ -135,8 +204,8 @@ bool Replacement::commit(const Manner &manner) {
     if (rename(temporary_.c_str(), path_.c_str()) != 0) {
         return fail(Step::Rename);
     }
-    temporary_.clear();
-    return !manner.durable || syncFolderOf(path_) || fail(Step::SyncFolder);
+    isMade_ = false;
+    return !manner.durable || syncFolder(folder) || fail(Step::SyncFolder);
 }
 
 // ---- Putting in place ----
@@ -154,9 +223,12 @@ PrivateFolder::PrivateFolder(const std::string &besides) : path_(besides + ".XXX
 
 PrivateFolder::~PrivateFolder() {
     const int savedErrno = errno;
-    if (!path_.empty()) {
+    try {
         std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
+        if (!path_.empty()) {
+            std::filesystem::remove_all(path_, ignored);
+        }
+    } catch (const std::bad_alloc &) { // what could not be removed stays
     }
     errno = savedErrno;
 }

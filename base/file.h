@@ -13,7 +13,8 @@
 
 namespace base {
 
-// Whether anybody may make files in the path's folder (it has the sticky bit).
+// Whether anybody may make files in the path's folder (it has the sticky bit). So it is taken to be
+// when that cannot be seen.
 bool isInSharedFolder(const std::string &path);
 
 // Everything from the descriptor's position on.
@@ -26,6 +27,14 @@ bool syncFolderOf(const std::string &path);
 // Makes an empty file of mode 0600 where nothing is, not even a link.
 bool makeEmpty(const char *path);
 
+// What a new file's own name is made of, behind the name of the file that it is to replace; the
+// capitals become letters and digits that no other file has.
+inline constexpr std::string_view kTemporary = ".XXXXXX";
+// The same with this process's id, so that what a dead one left can be told: ".123.XXXXXX".
+std::string processTemporary();
+// Removes the files beside the path that are named so by processes which are no longer there.
+void removeLeftovers(const std::string &path);
+
 // A new file that takes an old one's place by rename; until then it has a name of its own in the
 // same folder, and it goes when it is not committed.
 class Replacement {
@@ -33,7 +42,7 @@ class Replacement {
     // The steps, so that a caller can tell which one failed.
     enum class Step { None, Create, Stream, Write, Flush, Attributes, Close, Rename, SyncFolder };
 
-    explicit Replacement(std::string path);
+    explicit Replacement(std::string path, std::string_view temporary = kTemporary);
     ~Replacement();
     Replacement(const Replacement &) = delete;
     Replacement &operator=(const Replacement &) = delete;
@@ -46,17 +55,19 @@ class Replacement {
         bool durable = true;               // content before the rename, the folder after it
         bool later = false; // by a second at least than `like`: cron compares whole seconds
     };
-    // When flushing the folder fails, the new file is in place all the same.
+    // Once. When only the folder cannot be flushed, the new file is in place all the same.
     bool commit(const Manner &manner);
 
     Step failedStep() const { return failed_; }
 
   private:
     bool fail(Step step);
+    bool setAttributes(int fd, const Manner &manner);
 
     std::string path_;
-    std::string temporary_;
+    std::string temporary_; // the pattern until it is open
     std::unique_ptr<FILE, int (*)(FILE *)> stream_;
+    bool isMade_ = false;
     Step failed_ = Step::None;
 };
 

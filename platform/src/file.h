@@ -8,21 +8,9 @@
 
 namespace platform {
 
-// A descriptor closed at the end of its scope.
-class UniqueFd {
-  public:
-    explicit UniqueFd(int fd) : fd_(fd) {}
-    ~UniqueFd();
-    UniqueFd(const UniqueFd &) = delete;
-    UniqueFd &operator=(const UniqueFd &) = delete;
-
-    int get() const { return fd_; }
-    // Closes it now; false when the close failed.
-    bool close();
-
-  private:
-    int fd_;
-};
+// 1 when there is something at the path (links are followed), 0 when there is nothing, -1 with the
+// error state set when that cannot be seen.
+int isThere(const std::string &path);
 
 struct FileContent {
     std::string text;
@@ -35,7 +23,10 @@ struct FileContent {
 std::optional<FileContent> readFile(const std::string &path);
 
 // Replaces the file through a temporary file in its folder, keeping owner and mode; a new file gets
-// mode 0600. 0, or -1 with the error state set and the old file in place.
+// mode 0600. In a folder with the sticky bit, what is replaced must be as readFile wants it. In any
+// other the change is on the disk when this answers 0, and what dead processes left there goes. 0,
+// or -1 with the error state set and the old file in place, or, when only the folder could not be
+// flushed, the new one.
 int replaceFile(const std::string &path, std::string_view content);
 
 // The same for a file that a daemon watches: cron compares times by whole seconds, so the new

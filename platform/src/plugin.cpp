@@ -1,16 +1,16 @@
 // The plug-in mechanism: every handler of a plug-in is started once a phase, with the call's
 // arguments in its environment.
+#include "base/trust.h"
 #include "platform.h"
 #include "platplugin.h"
 #include "process.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
-#include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
 
@@ -24,22 +24,28 @@ namespace {
 
 constexpr const char *kPluginRoot = "/usr/tavi/etc/plugins";
 
-// What runs as root must be root's alone to change.
-bool isTrusted(const std::filesystem::path &path, mode_t kind) {
-    struct stat status {};
-    return lstat(path.c_str(), &status) == 0 && (status.st_mode & S_IFMT) == kind &&
-           status.st_uid == 0 && (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+void logSkipped(const char *what, const std::filesystem::path &path, const char *kind) {
+    syslog(LOG_ERR, "plug-in %s %s skipped: it must be a %s of root's that nobody else may write",
+           what, path.c_str(), kind);
+}
+
+int failToRead(const std::filesystem::path &path, const char *why) {
+    PLATFORM_LOG("plug-in folder %s cannot be read: %s", path.c_str(), why);
+    return PLATFORM_FAIL(platform::kOpenFailed);
+}
+
+// Any program in the folder is meant as a handler; others are notes, or what an editor left.
+bool isProgram(const std::filesystem::path &path) {
+    std::error_code error;
+    return access(path.c_str(), X_OK) == 0 && !std::filesystem::is_directory(path, error);
 }
 
 bool isHandler(const std::filesystem::path &path) {
-    std::error_code error;
-    if (access(path.c_str(), X_OK) != 0 || std::filesystem::is_directory(path, error)) {
+    if (!isProgram(path)) {
         return false;
     }
-    if (!isTrusted(path, S_IFREG)) {
-        syslog(LOG_ERR,
-               "plug-in handler %s skipped: it must be a file of root's that nobody else may write",
-               path.c_str());
+    if (base::look(path.c_str(), base::kRootsFile) != base::Found::Trusted) {
+        logSkipped("handler", path, "file");
         return false;
     }
     return true;
@@ -48,18 +54,18 @@ bool isHandler(const std::filesystem::path &path) {
 // Adds the handlers in name order. 0, or -1 when the folder cannot be read to its end.
 int findHandlers(const std::filesystem::path &folder,
                  std::vector<std::filesystem::path> &handlers) {
+    switch (base::look(folder.c_str(), base::kRootsFolder)) {
+    case base::Found::Nothing:
+        return 0;
+    case base::Found::Unreadable:
+        return failToRead(folder, std::strerror(errno));
+    case base::Found::Strange:
+        logSkipped("folder", folder, "folder");
+        return 0;
+    case base::Found::Trusted:
+        break;
+    }
     std::error_code error;
-    if (std::filesystem::symlink_status(folder, error).type() ==
-        std::filesystem::file_type::not_found) {
-        return 0;
-    }
-    if (!isTrusted(folder, S_IFDIR)) {
-        syslog(
-            LOG_ERR,
-            "plug-in folder %s skipped: it must be a folder of root's that nobody else may write",
-            folder.c_str());
-        return 0;
-    }
     std::filesystem::directory_iterator entry(folder, error);
     for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
         if (isHandler(entry->path())) {
@@ -67,12 +73,7 @@ int findHandlers(const std::filesystem::path &folder,
         }
     }
     std::sort(handlers.begin(), handlers.end());
-    if (error) {
-        PLATFORM_LOG("plug-in folder %s cannot be read: %s", folder.c_str(),
-                     error.message().c_str());
-        return PLATFORM_FAIL(platform::kOpenFailed);
-    }
-    return 0;
+    return error ? failToRead(folder, error.message().c_str()) : 0;
 }
 
 // The call's arguments and the caller's environment without what looks like arguments: a handler

@@ -1,5 +1,6 @@
 // Auto-power: the configuration is a section file with a section a kind, power-on is armed in the
 // real-time clock, and schedules become lines of /etc/crontab.
+#include "base/descriptor.h"
 #include "file.h"
 #include "platform.h"
 #include "tavisdk.h"
@@ -153,8 +154,8 @@ bool writeWakeAlarm(int fd, time_t time) {
 
 // The clock refuses a new alarm while one is set, so it is cleared first.
 int armClock(std::optional<time_t> wake) {
-    const platform::UniqueFd clock(open(kWakeAlarm, O_WRONLY | O_CLOEXEC));
-    if (clock.get() == -1) {
+    const base::Descriptor clock(open(kWakeAlarm, O_WRONLY | O_CLOEXEC));
+    if (!clock) {
         if (!wake && (errno == ENOENT || errno == EROFS || errno == ENODEV || errno == ENXIO)) {
             return 0; // there is no clock that could have been armed
         }

@@ -1,12 +1,9 @@
 // Programs started without a shell, detached forks and process checks.
 #include "process.h"
-#include "file.h"
+#include "base/child.h"
 #include "platform.h"
 
-#include <array>
 #include <cerrno>
-#include <climits>
-#include <cstdio>
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/wait.h>
@@ -15,45 +12,26 @@
 
 namespace platform {
 
-ChildSignals::ChildSignals() {
-    struct sigaction standard {};
-    standard.sa_handler = SIG_DFL;
-    sigset_t child;
-    sigemptyset(&child);
-    sigaddset(&child, SIGCHLD);
-    pthread_sigmask(SIG_BLOCK, &child, &callersMask_);
-    sigaction(SIGCHLD, &standard, &callersAction_);
-}
-
-ChildSignals::~ChildSignals() {
-    const int savedErrno = errno;
-    sigaction(SIGCHLD, &callersAction_, nullptr);
-    pthread_sigmask(SIG_SETMASK, &callersMask_, nullptr);
-    errno = savedErrno;
-}
-
-int waitForChild(pid_t pid) {
-    int status = 0;
-    while (waitpid(pid, &status, 0) == -1) {
-        if (errno != EINTR) {
-            return -1;
-        }
-    }
-    return status;
-}
-
+// What a program would read from the caller's standard input is not meant for it: a line that
+// somebody types, or what a web server sends to the process that it started.
 int runProgram(const char *path, const char *const *argv, const char *const *envp) {
-    const ChildSignals signals;
+    const base::ChildSignals signals;
     posix_spawnattr_t attributes;
+    posix_spawn_file_actions_t actions;
     posix_spawnattr_init(&attributes);
+    posix_spawn_file_actions_init(&actions);
     posix_spawnattr_setsigmask(&attributes, &signals.callersMask());
     posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK);
     pid_t pid = -1;
-    const int error = posix_spawn(&pid, path, nullptr, &attributes, const_cast<char *const *>(argv),
-                                  const_cast<char *const *>(envp));
+    int error = posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    if (error == 0) {
+        error = posix_spawn(&pid, path, &actions, &attributes, const_cast<char *const *>(argv),
+                            const_cast<char *const *>(envp));
+    }
+    posix_spawn_file_actions_destroy(&actions);
     posix_spawnattr_destroy(&attributes);
     errno = error;
-    return error == 0 ? waitForChild(pid) : -1;
+    return error == 0 ? base::waitForChild(pid) : -1;
 }
 
 } // namespace platform
@@ -79,29 +57,8 @@ int PLATCExec(const char *szProgram, const char *const *rgszArgs) {
         -1);
 }
 
-namespace {
-
-bool processExists(pid_t pid) {
-    return kill(pid, 0) == 0 || errno == EPERM;
-}
-
-} // namespace
-
 int PLATCProcAlive(pid_t pid) {
-    if (pid <= 0 || !processExists(pid)) {
-        return 0;
-    }
-    // The state stands behind the program's name, which is in parentheses and may hold any byte.
-    std::array<char, 64> path{};
-    std::array<char, 512> stat{};
-    std::snprintf(path.data(), path.size(), "/proc/%d/stat", static_cast<int>(pid));
-    const platform::UniqueFd fd(open(path.data(), O_RDONLY | O_CLOEXEC));
-    const ssize_t length = read(fd.get(), stat.data(), stat.size() - 1);
-    if (length <= 0) {
-        return processExists(pid); // it has ended since, or /proc does not show it
-    }
-    const char *nameEnd = std::strrchr(stat.data(), ')');
-    return !(nameEnd && nameEnd[1] == ' ' && std::strchr("ZX", nameEnd[2]));
+    return base::isAlive(pid) ? 1 : 0;
 }
 
 namespace {
@@ -120,7 +77,7 @@ bool detachStandardStreams() {
 } // namespace
 
 int PLATCProcForkChildNoWait() {
-    const platform::ChildSignals signals;
+    const base::ChildSignals signals;
     const pid_t middle = fork();
     if (middle == -1) {
         return PLATFORM_FAIL(platform::kSystemCallFailed);
@@ -135,5 +92,5 @@ int PLATCProcForkChildNoWait() {
         }
         _exit(child == -1 ? 1 : 0);
     }
-    return platform::waitForChild(middle) == 0 ? 1 : PLATFORM_FAIL(platform::kSystemCallFailed);
+    return base::waitForChild(middle) == 0 ? 1 : PLATFORM_FAIL(platform::kSystemCallFailed);
 }

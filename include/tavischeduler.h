@@ -248,6 +248,26 @@ TAVI_SCHED_API int TAVISchedTaskSync(void);
  * hold every line; 0x0D00 for a smaller buffer that does not. */
 TAVI_SCHED_API int TAVISchedCrontabLine(const TAVI_SCHED_TASK *pTask, char *szBuf, size_t cbBuf);
 
+/* The id that the schedule backend gives to its next task. */
+TAVI_SCHED_API int TAVISchedTaskNextId(int32_t *pId);
+
+/* ---- Several changes as one ---- */
+
+/* From TAVISchedChangeBegin on, this process's creates, edits, removes and JSON saves, of both
+ * backends, are kept where only this process sees them: its lists and look-ups show them, files,
+ * crontab and wake alarm stay as they are, and other processes' changes wait (readers do not). The
+ * PRE phase of plug-in handlers runs with each change; a handler that changes tasks itself is
+ * refused, as it would wait for the process that waits for it.
+ *
+ * TAVISchedChangeCommit stores everything, writes the crontab once and signals cron once; 0, or -1
+ * with everything as it was, also when the crontab cannot be written. TAVISchedChangeRollback drops
+ * everything. Both end the batch and then run the POST phases, with the result -1 for changes that
+ * were not stored. Begin within a batch and the others without one are 0x0D00; 0x0400 when another
+ * change has not ended within half a minute. */
+TAVI_SCHED_API int TAVISchedChangeBegin(void);
+TAVI_SCHED_API int TAVISchedChangeCommit(void);
+TAVI_SCHED_API int TAVISchedChangeRollback(void);
+
 /* Sorts a list by a row of the field table, 0 to 30 (not checked). Direction 1 is ascending, any
  * other the exact reverse. Text fields order by their bytes. Number fields order by where the tasks
  * lie in memory, whatever the field: the order of crontab lines is defined by it. 0x0100 out of

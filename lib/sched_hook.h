@@ -2,12 +2,13 @@
 // ends.
 #pragma once
 
+#include "platplugin.h"
 #include "sched_error.h"
+#include "sched_guard.h"
 #include "sched_handle.h"
-#include "sched_text.h"
 #include "tavischeduler.h"
 
-#include <array>
+#include <optional>
 
 namespace sched {
 
@@ -35,20 +36,27 @@ class ChangeHook {
         if (!context_) {
             return;
         }
-        const unsigned int code = PLATCErrGet();
-        const int line = PLATCErrorGetLine();
-        std::array<char, 256> file;
-        copyText(file.data(), file.size(), PLATCErrorGetFile());
-        tellHandlers(result);
+        std::optional<KeptError> error;
         if (result < 0) {
-            PLATCErrSetEx(code, file.data(), line);
+            error.emplace();
+        }
+        context_->result = result;
+        finish(TAVISchedTaskPlugin(TAVI_SCHED_PLUGIN_POST, context_.get()));
+    }
+
+    // The same when the tasks are gone: the handle has kept their fields since the PRE phase.
+    void afterwards(int result) {
+        if (context_) {
+            PLATPLUGIN *const handle = context_->handle;
+            finish(handle && PLATPluginSetArgByInt(handle, "RESULT", result) == 0
+                       ? PLATPluginAction(TAVI_SCHED_PLUGIN_POST, handle)
+                       : -1);
         }
     }
 
   private:
-    void tellHandlers(int result) {
-        context_->result = result;
-        if (TAVISchedTaskPlugin(TAVI_SCHED_PLUGIN_POST, context_.get()) < 0) {
+    void finish(int told) {
+        if (told < 0) {
             SCHED_LOG_FOR(site_, "Fail to execute task plugin (POST)");
         }
         TAVISchedTaskPluginExit(context_.get());

@@ -1,4 +1,5 @@
 // Replacing a stored task, between the plug-in hooks.
+#include "change/batch.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -26,6 +27,10 @@ int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
     }
     sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
     const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;
-    hook.after(result);
+    if (sched::isBatchOpen()) {
+        sched::deferHook(std::move(hook), result);
+    } else {
+        hook.after(result);
+    }
     return result;
 }

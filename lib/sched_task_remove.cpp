@@ -1,4 +1,5 @@
 // Removing a stored task, between the plug-in hooks.
+#include "change/batch.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -35,6 +36,10 @@ int TAVISchedTaskRemove(int32_t id) {
     }
     sched::ChangeHook hook(SCHED_SITE, "task_remove", &oldTask, nullptr);
     const int result = hook.initialised() ? removeBetweenHooks(hook, id, oldTask.backend) : -1;
-    hook.after(result);
+    if (sched::isBatchOpen()) {
+        sched::deferHook(std::move(hook), result);
+    } else {
+        hook.after(result);
+    }
     return result;
 }

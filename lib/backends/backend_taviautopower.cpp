@@ -1,11 +1,14 @@
 // The power backend: shows the machine's power-on and power-off schedules as tasks. It stores
 // nothing of its own: the auto-power configuration is the only store, and a task's id is computed
 // from the entry that it stands for, so that an edit changes the id.
+#include "change/batch.h"
+#include "change/change.h"
 #include "platc.h"
 #include "sched_calendar.h"
 #include "sched_command.h"
 #include "sched_error.h"
 #include "sched_field.h"
+#include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_text.h"
 #include "tavischeduler.h"
@@ -19,6 +22,7 @@
 #include <span>
 #include <string_view>
 #include <sys/wait.h>
+#include <vector>
 
 namespace {
 
@@ -62,12 +66,22 @@ std::optional<int32_t> idOf(int kind, const Entry &entry) {
 
 // ---- Entries and tasks ----
 
+// What a batch has changed, by kind, and whether it asks for the configuration to be applied.
+std::array<std::optional<std::vector<Entry>>, 2> staged;
+bool applicationIsStaged = false;
+
 // A kind's entries, with room for one more than are read.
 class Entries {
   public:
     // False when the configuration cannot be read.
     bool read(int kind) {
-        count_ = TAVIAutoPowerConfGet(kind, TAVI_AUTOPOWER_MAX_ENTRIES, entries_.data());
+        const auto &changed = staged[static_cast<size_t>(kind)];
+        if (changed) {
+            count_ = static_cast<int>(std::min(changed->size(), entries_.size()));
+            std::copy_n(changed->begin(), count_, entries_.begin());
+        } else {
+            count_ = TAVIAutoPowerConfGet(kind, TAVI_AUTOPOWER_MAX_ENTRIES, entries_.data());
+        }
         return count_ >= 0;
     }
     std::span<Entry> all() { return {entries_.data(), static_cast<size_t>(count_)}; }
@@ -272,6 +286,32 @@ std::optional<size_t> findEntry(int32_t id, std::span<const Entry> entries) {
     return std::nullopt;
 }
 
+int writeEntries(int kind, std::span<const Entry> entries) {
+    const int count = static_cast<int>(entries.size());
+    if (TAVIAutoPowerConfSet(kind, count, entries.data()) < 0) {
+        SCHED_LOG("TAVIAutoPowerConfSet failed. num:[%d] [0x%04X %s:%d]", count, SCHED_LAST_ERROR);
+        return -1;
+    }
+    return 0;
+}
+
+int describeKind(int kind, std::span<const Entry> entries, sched::Before &before) {
+    before.power[static_cast<size_t>(kind)].emplace(entries.begin(), entries.end());
+    return 0;
+}
+
+// Stores what a kind's entries have become: for the batch that goes on, or with a record of what
+// they were.
+int storeEntries(int kind, std::span<const Entry> before, std::span<const Entry> after) {
+    if (sched::isBatchOpen()) {
+        staged[static_cast<size_t>(kind)].emplace(after.begin(), after.end());
+        return 0;
+    }
+    sched::Before record;
+    describeKind(kind, before, record);
+    return sched::Change::record(record) != 0 ? -1 : writeEntries(kind, after);
+}
+
 // Replaces or appends the entry of the id, or removes it when there is no task: 1 changed, 0
 // nothing to change, -1. The kind stays that of the given id.
 int SetSchedule(int32_t id, const Task *task) {
@@ -283,6 +323,7 @@ int SetSchedule(int32_t id, const Task *task) {
     if (readEntries(kind, entries) != 0) {
         return -1;
     }
+    Entries before = entries;
     const auto index = findEntry(id, entries.all());
     if (task) {
         const auto entry = toEntry(*task);
@@ -300,12 +341,7 @@ int SetSchedule(int32_t id, const Task *task) {
     } else {
         return 0;
     }
-    const int count = static_cast<int>(entries.all().size());
-    if (TAVIAutoPowerConfSet(kind, count, entries.all().data()) < 0) {
-        SCHED_LOG("TAVIAutoPowerConfSet failed. num:[%d] [0x%04X %s:%d]", count, SCHED_LAST_ERROR);
-        return -1;
-    }
-    return 1;
+    return storeEntries(kind, before.all(), entries.all()) == 0 ? 1 : -1;
 }
 
 // ---- Applying the configuration to the machine ----
@@ -379,7 +415,7 @@ int setPowerOffLines(std::span<const Entry> entries) {
     return 0;
 }
 
-int Sync() {
+int applyConfiguration() {
     if (TAVIAutoPoweronSet() < 0) {
         SCHED_LOG("set auto poweron failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
         return -1;
@@ -398,6 +434,33 @@ int Sync() {
 
 // ---- Operations ----
 
+// Runs the body as a change; what it stored stays also when applying it failed.
+template <typename Body> int inChange(Body &&body) {
+    return sched::guarded(
+        SCHED_SITE,
+        [&] {
+            sched::Change change;
+            if (!change) {
+                return -1;
+            }
+            const int result = body();
+            return change.finish() == 0 ? result : -1;
+        },
+        -1);
+}
+
+int applyNow() {
+    if (sched::isBatchOpen()) {
+        applicationIsStaged = true;
+        return 0;
+    }
+    return applyConfiguration();
+}
+
+int Sync() {
+    return inChange(applyNow);
+}
+
 int setSchedule(int32_t id, const Task *task) {
     const int changed = SetSchedule(id, task);
     if (changed < 0) {
@@ -407,7 +470,7 @@ int setSchedule(int32_t id, const Task *task) {
 }
 
 int syncPowerHardware() {
-    if (Sync() < 0) {
+    if (applyNow() < 0) {
         SCHED_LOG("sync power hw failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
         return -1;
     }
@@ -425,6 +488,7 @@ std::optional<int> kindOfArguments(const Task &task) {
 }
 
 int Create(Task *pTask) {
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
     const auto entry = toEntry(*pTask);
     if (!entry) {
         SCHED_LOG("convert task from power schedule failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
@@ -439,27 +503,71 @@ int Create(Task *pTask) {
     if (pTask->name[0] == '\0') {
         setText(pTask->name, "Power task");
     }
-    return setSchedule(pTask->id, pTask) < 0 ? -1 : syncPowerHardware();
+    return inChange([&] { return setSchedule(pTask->id, pTask) < 0 ? -1 : syncPowerHardware(); });
 }
 
 // An id that is no power id changes nothing, but the configuration is applied all the same.
 int Edit(Task *pTask) {
-    if (setSchedule(pTask->id, pTask) < 0) {
-        return -1;
-    }
-    if (Sync() < 0) {
-        SCHED_LOG("sync hw autopower failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
-        return -1;
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
+    return inChange([&] {
+        if (setSchedule(pTask->id, pTask) < 0) {
+            return -1;
+        }
+        if (applyNow() < 0) {
+            SCHED_LOG("sync hw autopower failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+            return -1;
+        }
+        return 0;
+    });
+}
+
+int Remove(int32_t id) {
+    return inChange([&] {
+        const int removed = setSchedule(id, nullptr);
+        if (removed <= 0) {
+            return removed;
+        }
+        return syncPowerHardware() == 0 ? 1 : -1;
+    });
+}
+
+// ---- Batches ----
+
+bool isTouched() {
+    return applicationIsStaged || staged[0] || staged[1];
+}
+
+int describe(sched::Before &before) {
+    for (const int kind : {TAVI_AUTOPOWER_KIND_ON, TAVI_AUTOPOWER_KIND_OFF}) {
+        auto changed = std::move(staged[static_cast<size_t>(kind)]);
+        if (!changed) {
+            continue;
+        }
+        staged[static_cast<size_t>(kind)].reset();
+        Entries entries;
+        const int read = readEntries(kind, entries);
+        staged[static_cast<size_t>(kind)] = std::move(changed);
+        if (read != 0) {
+            return -1;
+        }
+        describeKind(kind, entries.all(), before);
     }
     return 0;
 }
 
-int Remove(int32_t id) {
-    const int removed = setSchedule(id, nullptr);
-    if (removed <= 0) {
-        return removed;
+int store() {
+    for (const int kind : {TAVI_AUTOPOWER_KIND_ON, TAVI_AUTOPOWER_KIND_OFF}) {
+        const auto &changed = staged[static_cast<size_t>(kind)];
+        if (changed && writeEntries(kind, *changed) != 0) {
+            return -1;
+        }
     }
-    return syncPowerHardware() == 0 ? 1 : -1;
+    return 0;
+}
+
+void forget() {
+    staged = {};
+    applicationIsStaged = false;
 }
 
 int Run(Task *pTask, int *pStatusCode, char *szComment, size_t cbComment) {
@@ -495,6 +603,11 @@ int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) 
                   sched::LogText(szName).c_str());
         return -1;
     }
+    static const bool joined = [] {
+        sched::joinBatches({isTouched, describe, store, applyConfiguration, forget});
+        return true;
+    }();
+    static_cast<void>(joined);
     *pBackend = {.id = pBackend->id,
                  .name = szName,
                  .sync = Sync,

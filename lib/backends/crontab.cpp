@@ -1,12 +1,15 @@
 // Rewriting the runner's lines of /etc/crontab through a temporary file in the same folder.
 #include "crontab.h"
+#include "base/child.h"
+#include "base/file.h"
 #include "platc.h"
 #include "sched_calendar.h"
 #include "sched_error.h"
 #include "sched_handle.h"
+#include "sched_paths.h"
 
+#include <algorithm>
 #include <array>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -18,9 +21,6 @@
 
 namespace {
 
-constexpr const char *kCrontab = "/etc/crontab";
-constexpr const char *kRunner = "/tmp/tavischedtask";
-constexpr const char *kCronPid = "/var/run/crond.pid";
 constexpr const char *kSignalCron = "/bin/kill -HUP `/bin/cat /var/run/crond.pid` > /dev/null 2>&1";
 
 // The rewrite reports as the backend's own source.
@@ -76,7 +76,7 @@ class CrontabLine {
     explicit CrontabLine(const TAVI_SCHED_TASK &task) {
         addTime(task);
         addDate(task);
-        add("root\t%s --run id=%ld", kRunner, static_cast<long>(task.id));
+        add("root\t%s --run id=%ld", sched::kRunner, static_cast<long>(task.id));
     }
     const char *c_str() const { return text_.data(); }
     size_t size() const { return length_; }
@@ -125,127 +125,83 @@ class CrontabLine {
 
 // ---- The new file ----
 
-// The new crontab until it takes the old one's place; removed unless it did.
-class NewCrontab {
-  public:
-    NewCrontab() = default;
-    ~NewCrontab() {
-        if (stream_) {
-            stream_.reset();
-            unlink(path_.data());
-        }
+// Each step of the replacement has its code and its site number.
+int failStep(base::Replacement::Step step) {
+    using Step = base::Replacement::Step;
+    switch (step) {
+    case Step::Create:
+        return fail(sched::kOpenFailed, 185);
+    case Step::Stream:
+        return fail(sched::kOpenFailed, 189);
+    case Step::Write:
+        return fail(sched::kReadWriteFailed, 200);
+    case Step::Flush:
+        return fail(sched::kReadWriteFailed, 225);
+    case Step::Attributes:
+        return fail(sched::kReadWriteFailed, 231);
+    case Step::Close:
+        return fail(sched::kReadWriteFailed, 235);
+    case Step::Rename:
+        return fail(sched::kRenameFailed, 240);
+    default:
+        return fail(sched::kReadWriteFailed, __LINE__);
     }
-    NewCrontab(const NewCrontab &) = delete;
-    NewCrontab &operator=(const NewCrontab &) = delete;
+}
 
-    FILE *stream() const { return stream_.get(); }
-
-    int open() {
-        std::snprintf(path_.data(), path_.size(), "%s.XXXXXX", kCrontab);
-        const int fd = mkostemp(path_.data(), O_CLOEXEC);
-        if (fd == -1) {
-            return fail(sched::kOpenFailed, 185);
-        }
-        stream_.reset(fdopen(fd, "w"));
-        if (!stream_) {
-            fail(sched::kOpenFailed, 189);
-            close(fd);
-            unlink(path_.data());
-            return -1;
-        }
-        return 0;
+// The id in the runner's argument of a line; "" for a line that has none.
+std::string_view idInLine(std::string_view line) {
+    constexpr std::string_view kArgument = " --run id=";
+    const size_t at = line.find(kArgument);
+    if (at == std::string_view::npos) {
+        return {};
     }
+    line.remove_prefix(at + kArgument.size());
+    return line.substr(0, line.find_first_of(" \t\n"));
+}
 
-    int commit(const struct stat &old) {
-        if (std::fflush(stream()) != 0 || std::ferror(stream())) {
-            return fail(sched::kReadWriteFailed, 225);
-        }
-        const int fd = fileno(stream());
-        if (fsync(fd) != 0 || fchown(fd, old.st_uid, old.st_gid) != 0 ||
-            fchmod(fd, old.st_mode & 0xFFF) != 0 || makeLater(fd, old) != 0) {
-            return fail(sched::kReadWriteFailed, 231);
-        }
-        if (std::fclose(stream_.release()) != 0) {
-            fail(sched::kReadWriteFailed, 235);
-        } else if (rename(path_.data(), kCrontab) != 0) {
-            fail(sched::kRenameFailed, 240);
-        } else {
-            return 0;
-        }
-        unlink(path_.data());
-        return -1;
-    }
+// The lines that stay: those that do not name the runner, and those of tasks that are there but
+// cannot be read just now.
+bool stays(std::string_view line, const std::vector<std::string> &unreadable) {
+    return line.find(sched::kRunner) == std::string_view::npos ||
+           std::find(unreadable.begin(), unreadable.end(), idInLine(line)) != unreadable.end();
+}
 
-  private:
-    // cron compares whole seconds: a new crontab of the old one's second would go unseen.
-    static int makeLater(int fd, const struct stat &old) {
-        struct stat status {};
-        if (fstat(fd, &status) != 0) {
-            return -1;
-        }
-        if (status.st_mtim.tv_sec > old.st_mtim.tv_sec) {
-            return 0;
-        }
-        const timespec times[] = {{.tv_sec = 0, .tv_nsec = UTIME_OMIT},
-                                  {.tv_sec = old.st_mtim.tv_sec + 1, .tv_nsec = 0}};
-        return futimens(fd, times);
-    }
-
-    std::array<char, 4096> path_{};
-    sched::File stream_;
-};
-
-// Copies every line that does not name the runner. `endsOpen` tells that the last one copied has no
-// line feed.
-int copyForeignLines(FILE *from, FILE *to, bool &endsOpen) {
+// `endsOpen` tells that the last line copied has no line feed.
+int copyLines(FILE *from, base::Replacement &to, const std::vector<std::string> &unreadable,
+              bool &endsOpen) {
     char *buffer = nullptr;
     size_t capacity = 0;
     ssize_t length = 0;
     bool written = true;
     while (written && (length = getdelim(&buffer, &capacity, '\n', from)) != -1) {
         const std::string_view line(buffer, static_cast<size_t>(length));
-        if (line.find(kRunner) == std::string_view::npos) {
-            written = std::fwrite(line.data(), 1, line.size(), to) == line.size();
+        if (stays(line, unreadable)) {
+            written = to.write(line);
             endsOpen = line.back() != '\n';
         }
     }
     std::free(buffer);
     if (!written) {
-        return fail(sched::kReadWriteFailed, 200);
+        return failStep(to.failedStep());
     }
     return std::feof(from) ? 0 : fail(sched::kReadWriteFailed, 207);
 }
 
-// Write errors are found when the stream is flushed.
-void appendTasks(const TAVI_SCHED_TASK *task, FILE *to, bool endsOpen) {
-    for (; task; task = task->next) {
-        if (task->state == TAVI_SCHED_STATE_ENABLED) {
-            std::fprintf(to, "%s%s\n", endsOpen ? "\n" : "", CrontabLine(*task).c_str());
-            endsOpen = false;
-        }
-    }
-}
-
 // system() with SIGCHLD at its default: in a caller that ignores it there would be no result.
 int runSignalCommand() {
-    struct sigaction standard {};
-    struct sigaction callers {};
-    standard.sa_handler = SIG_DFL;
-    sigaction(SIGCHLD, &standard, &callers);
-    const int result = std::system(kSignalCron);
-    sigaction(SIGCHLD, &callers, nullptr);
-    return result;
+    const base::ChildSignals signals;
+    return std::system(kSignalCron);
 }
 
 void signalCron() {
-    if (PLATCFileExist(kCronPid) && runSignalCommand() != 0) {
+    if (PLATCFileExist(sched::kCronPid) && runSignalCommand() != 0) {
         syslog(LOG_ERR, "%s:%d Failed to hup crond.", kSource, 245);
     }
 }
 
 } // namespace
 
-int sched::rewriteCrontab(const TAVI_SCHED_TASK *tasks) {
+int sched::rewriteCrontab(const RunnerLines &lines) {
     const File old(std::fopen(kCrontab, "re"));
     if (!old) {
         return -1;
@@ -257,14 +213,19 @@ int sched::rewriteCrontab(const TAVI_SCHED_TASK *tasks) {
     if (S_ISDIR(status.st_mode)) {
         return fail(kOpenFailed, 179);
     }
-    NewCrontab crontab;
+    base::Replacement crontab(kCrontab);
     bool endsOpen = false;
-    if (crontab.open() != 0 || copyForeignLines(old.get(), crontab.stream(), endsOpen) != 0) {
+    if (!crontab.open()) {
+        return failStep(crontab.failedStep());
+    }
+    if (copyLines(old.get(), crontab, lines.unreadable, endsOpen) != 0) {
         return -1;
     }
-    appendTasks(tasks, crontab.stream(), endsOpen);
-    if (crontab.commit(status) != 0) {
-        return -1;
+    // Write errors are found when the stream is flushed.
+    crontab.write(endsOpen && !lines.text.empty() ? "\n" : "");
+    crontab.write(lines.text);
+    if (!crontab.commit({.like = &status, .durable = true, .later = true})) {
+        return failStep(crontab.failedStep());
     }
     signalCron();
     return 0;

@@ -1,0 +1,570 @@
+// The schedule backend's task file.
+#include "task_file.h"
+#include "backend_source.h"
+#include "base/file.h"
+#include "base/trust.h"
+#include "change/batch.h"
+#include "change/change.h"
+#include "platc.h"
+#include "sched_guard.h"
+#include "sched_handle.h"
+#include "sched_paths.h"
+#include "sched_shared_file.h"
+#include "staged_tasks.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <span>
+#include <string_view>
+#include <unistd.h>
+
+// An appliance's own platform may lack it.
+extern "C" [[gnu::weak]] int PLATCFileEditSections(const char *szPath, int count,
+                                                   const char *const *rgszSections,
+                                                   const PLATCSZHASH *const *rgHashes);
+
+namespace {
+
+using sched::Hash;
+using sched::kPersistent;
+using sched::kWorkingCopy;
+using sched::LogText;
+
+constexpr int kCapacity = 1024;
+
+sched::StagedTasks staged;
+
+// ---- Reading ----
+
+// The section's stored form, in the hash or as it is staged; nullptr when it cannot be read.
+PLATCSZHASH *readSection(const char *path, const char *section, Hash &hash, int &found) {
+    if (PLATCSZHASH *const form = staged.find(section)) {
+        found = 1;
+        return form;
+    }
+    PLATCHashRemoveAll(hash.get());
+    found = staged.stateOf(section) == sched::StagedTasks::State::Removed
+                ? 0
+                : PLATCFileGetSection(path, section, hash.address());
+    return found > 0 ? hash.get() : nullptr;
+}
+
+// Fills the task from its section; a failure is logged.
+bool readTask(const char *path, const char *section, Hash &hash, TAVI_SCHED_TASK &task) {
+    int found = 0;
+    PLATCSZHASH *const form = readSection(path, section, hash, found);
+    if (!form) {
+        SCHED_LOG_AT(51, "Get section [%s] from [%s] failed. [0x%04X %s:%d]",
+                     LogText(section).c_str(), kWorkingCopy, SCHED_LAST_ERROR);
+        return false;
+    }
+    if (TAVISchedInitTaskFromHash(form, &task) != 0) {
+        SCHED_LOG_AT(60, "Init task from hash failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return false;
+    }
+    if (TAVISchedNextTriggerTime(&task) != 0) {
+        SCHED_LOG_AT(65, "Failed to obtain next trigger time. id:[%ld]. [0x%04X %s:%d]",
+                     static_cast<long>(task.id), SCHED_LAST_ERROR);
+        return false;
+    }
+    return true;
+}
+
+bool isThere(const char *path, bool &unreadable) {
+    const base::Found found = base::look(path, base::kSharedFileToRead);
+    unreadable = found == base::Found::Unreadable;
+    if (unreadable) {
+        SCHED_LOG("%s cannot be looked at: %m", path);
+        SCHED_SET_ERROR(sched::kOpenFailed);
+    }
+    return found != base::Found::Nothing && !unreadable;
+}
+
+// The names of all sections: their number, or -1. Those of the file that are not removed come
+// first, then those that are new.
+int enumerate(const char *path, std::vector<std::string> &names) {
+    bool unreadable = false;
+    if (isThere(path, unreadable)) {
+        sched::List list(kCapacity);
+        const int count = list ? PLATCFileEnumSection(path, list.address()) : -1;
+        for (int i = 0; i < count; ++i) {
+            const char *const name = PLATCSzListGet(list.get(), i);
+            if (staged.stateOf(name) != sched::StagedTasks::State::Removed) {
+                names.emplace_back(name);
+            }
+        }
+        unreadable = count < 0;
+    }
+    if (staged.any()) {
+        const std::set<std::string> present(names.begin(), names.end());
+        std::copy_if(
+            staged.order().begin(), staged.order().end(), std::back_inserter(names),
+            [&](const std::string &name) { return staged.find(name) && !present.contains(name); });
+    }
+    return unreadable ? -1 : static_cast<int>(names.size());
+}
+
+// What a look-up finds before it reads: enumerations that a section does not name stay as they are.
+void makeFresh(TAVI_SCHED_TASK &task) {
+    task.state = 0;
+    task.type = 0;
+}
+
+int pass(const sched::TaskPass &how) {
+    const sched::Reading reading;
+    std::vector<std::string> names;
+    if (!reading || enumerate(reading.path(), names) < 0) {
+        return -1;
+    }
+    Hash hash(kCapacity);
+    if (!hash) {
+        return -1;
+    }
+    sched::Allocated<TAVI_SCHED_TASK> task;
+    for (const std::string &name : names) {
+        if (!task && !(task = sched::allocateTask())) {
+            SCHED_LOG_AT(55, "malloc TAVI_SCHED_TASK failed. key:[%s]",
+                         LogText(name.c_str()).c_str());
+            SCHED_SET_ERROR_AT(56, sched::kTaskOutOfMemory);
+            return -1;
+        }
+        makeFresh(*task);
+        if (!readTask(reading.path(), name.c_str(), hash, *task)) {
+            how.onUnreadable(name.c_str());
+        } else if (!how.onTask(name.c_str(), how.fresh ? task.release() : task.get())) {
+            return 0;
+        }
+    }
+    return 0;
+}
+
+int lookUp(int32_t id, TAVI_SCHED_TASK *task) {
+    const sched::Reading reading;
+    Hash hash(kCapacity);
+    if (!reading || !hash) {
+        return -1;
+    }
+    const sched::SectionName section = sched::sectionName(id);
+    bool unreadable = false;
+    if (staged.stateOf(section.data()) != sched::StagedTasks::State::Stored &&
+        !isThere(reading.path(), unreadable)) {
+        return unreadable ? -1 : 0;
+    }
+    int found = 0;
+    PLATCSZHASH *const form = readSection(reading.path(), section.data(), hash, found);
+    if (found < 0) {
+        SCHED_LOG_AT(537, "Get section [%s] from [%s] failed. [0x%04X %s:%d]", section.data(),
+                     kWorkingCopy, SCHED_LAST_ERROR);
+    }
+    if (found <= 0) {
+        return found;
+    }
+    if (TAVISchedInitTaskFromHash(form, task) != 0) {
+        SCHED_LOG_AT(545, "Init task from hash failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return -1;
+    }
+    if (TAVISchedNextTriggerTime(task) != 0) {
+        SCHED_LOG_AT(550, "Failed to obtain next trigger time. id:[%ld]. [0x%04X %s:%d]",
+                     static_cast<long>(task->id), SCHED_LAST_ERROR);
+        return -1;
+    }
+    return 1;
+}
+
+// ---- Ids ----
+
+// An id is in use when a task has it or a section is named by it: one that cannot be read must not
+// be overwritten.
+int gatherIds(sched::StagedTasks::Ids &ids) {
+    return pass({.onTask =
+                     [&](const char *section, TAVI_SCHED_TASK *task) {
+                         ids.add(section, task->id);
+                         return true;
+                     },
+                 .onUnreadable =
+                     [&](const char *section) {
+                         if (const auto id = sched::idOfSection(section)) {
+                             ids.add(section, *id);
+                         }
+                     }});
+}
+
+// From 1 upward: a smallest id above 1 gives 1, else the first gap above the smallest id, else the
+// largest plus 1. Nothing below the smallest id is looked at, and that is kept.
+int32_t smallestFreeId(const std::multiset<int32_t> &ids) {
+    if (ids.empty() || *ids.begin() > 1) {
+        return 1;
+    }
+    const auto gap = std::adjacent_find(ids.begin(), ids.end(), [](int32_t lower, int32_t upper) {
+        return int64_t{upper} - lower >= 2;
+    });
+    return (gap == ids.end() ? *ids.rbegin() : *gap) + 1;
+}
+
+// ---- Programs that copy ----
+
+int logCopyFailure(const char *from, const char *to, int line) {
+    SCHED_LOG_AT(line, "Copy sched conf failed. [%s] -> [%s] [0x%04X %s:%d]", from, to,
+                 SCHED_LAST_ERROR);
+    return -1;
+}
+
+// Runs cp without a shell; a failure is logged under the site number. Nobody looks at what it
+// overwrites before it has ended, whatever becomes of this process.
+int copyFile(const char *from, const char *to, int line) {
+    const sched::ChangeLock::Inherited lock;
+    const std::array<const char *, 4> arguments = {"-f", from, to, nullptr};
+    return PLATCExec("/bin/cp", arguments.data()) == 0 ? 0 : logCopyFailure(from, to, line);
+}
+
+// Whether the file is one that may be believed and has just this content; then it is flushed, too,
+// when it is to last.
+bool holds(const char *path, const std::string &content, bool durable) {
+    const base::Opened opened = base::openTrusted(path, base::kSharedFile);
+    if (opened.found != base::Found::Trusted) {
+        return false;
+    }
+    const auto present = base::readAll(opened.file.get());
+    return present && *present == content && (!durable || fsync(opened.file.get()) == 0);
+}
+
+// What a copy left must be what was to be copied: between a look at a name and its use by another
+// program somebody else may have acted.
+int verify(const char *from, const char *to, const std::string &content, bool durable, int line) {
+    if (holds(to, content, durable)) {
+        return 0;
+    }
+    SCHED_SET_ERROR_AT(line, sched::kReadWriteFailed);
+    return logCopyFailure(from, to, line);
+}
+
+// ---- The scratch file ----
+
+// The scratch file of one change, named for this process.
+class Scratch {
+  public:
+    Scratch() { std::snprintf(path_.data(), path_.size(), "%s.%d", sched::kScratchStem, getpid()); }
+    ~Scratch() { unlink(path_.data()); }
+    Scratch(const Scratch &) = delete;
+    Scratch &operator=(const Scratch &) = delete;
+
+    const char *path() const { return path_.data(); }
+
+    // Starts as a copy of the working copy, or empty when there is none.
+    int prepare(const std::optional<std::string> &working) const {
+        unlink(path());
+        const bool claimed = sched::claimSharedFile(path()) == 0;
+        if (!claimed) {
+            SCHED_SET_ERROR(sched::kOpenFailed);
+        }
+        if (working) {
+            return claimed ? copyWorking(*working) : logCopyFailure(kWorkingCopy, path(), 379);
+        }
+        if (!claimed || PLATCFileTouch(path()) != 0) {
+            SCHED_LOG_AT(374, "PLATCFileTouch [%s] failed. [0x%04X %s:%d]", path(),
+                         SCHED_LAST_ERROR);
+            return -1;
+        }
+        return 0;
+    }
+
+    // What it holds now.
+    std::optional<std::string> read() const {
+        const base::Opened opened = base::openTrusted(path(), base::kSharedFile);
+        auto content =
+            opened.found == base::Found::Trusted ? base::readAll(opened.file.get()) : std::nullopt;
+        if (!content) {
+            SCHED_SET_ERROR(sched::kReadWriteFailed);
+            SCHED_LOG("%s cannot be read: %m", path());
+        }
+        return content;
+    }
+
+  private:
+    int copyWorking(const std::string &working) const {
+        return copyFile(kWorkingCopy, path(), 379) != 0
+                   ? -1
+                   : verify(kWorkingCopy, path(), working, false, 379);
+    }
+
+    std::array<char, 4096> path_{};
+};
+
+// ---- Writing ----
+
+// The task's stored form, or nothing, which is logged.
+std::unique_ptr<Hash> formOf(const TAVI_SCHED_TASK &task) {
+    auto hash = std::make_unique<Hash>(kCapacity);
+    if (!*hash) {
+        SCHED_LOG_AT(398, "PLATCSzHashAlloc failed.[0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return nullptr;
+    }
+    if (TAVISchedInitHashFromTask(hash->address(), &task) != 0) {
+        SCHED_LOG_AT(403, "Init hash from task failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return nullptr;
+    }
+    return hash;
+}
+
+int writeSection(const char *path, const char *section, const PLATCSZHASH *form) {
+    const int replaced = PLATCFileSetSection(path, section, form);
+    if (replaced < 0) {
+        SCHED_LOG_AT(408, "Save section [%s] to [%s] failed. [0x%04X %s:%d]", section, path,
+                     SCHED_LAST_ERROR);
+        return -1;
+    }
+    if (replaced == 0 && PLATCFileAddSection(path, section, form) < 0) {
+        SCHED_LOG_AT(412, "Add section [%s] to [%s] failed. [0x%04X %s:%d]", section, path,
+                     SCHED_LAST_ERROR);
+        return -1;
+    }
+    return 1;
+}
+
+int removeSection(const char *path, const char *section) {
+    const int removed = PLATCFileRemoveSection(path, section);
+    if (removed < 0) {
+        SCHED_LOG_AT(393, "PLATCFileRemoveSection [%s] from [%s] failed.[0x%04X %s:%d]", section,
+                     path, SCHED_LAST_ERROR);
+    }
+    return removed;
+}
+
+// Reads a task file as it is before a change. False when it must not be believed or cannot be read.
+bool readBefore(const char *path, const base::TrustRule &rule,
+                std::optional<std::string> &content) {
+    const base::Opened opened = base::openTrusted(path, rule);
+    if (opened.found == base::Found::Trusted) {
+        content = base::readAll(opened.file.get());
+    }
+    if (opened.found == base::Found::Nothing || content) {
+        return true;
+    }
+    SCHED_SET_ERROR(sched::kOpenFailed);
+    if (opened.found == base::Found::Strange) {
+        SCHED_LOG("[%s] is refused: another user may have put it there or may write it", path);
+    } else {
+        SCHED_LOG("[%s] cannot be read: %m", path);
+    }
+    return false;
+}
+
+bool readBefore(sched::Before::Tasks &before) {
+    return readBefore(kWorkingCopy, base::kSharedFileToRead, before.working) &&
+           readBefore(kPersistent, {.groupMayWrite = true, .oneName = false}, before.persistent);
+}
+
+// Without a working copy, or with one that a failed copy left empty, a change starts from nothing
+// and would erase every task of the persistent file for good, so that file is put aside first. What
+// was put aside before moves on to the next free number.
+int savePersistent(const sched::Before::Tasks &before) {
+    if ((before.working && !before.working->empty()) || !before.persistent ||
+        before.persistent->empty()) {
+        return 0;
+    }
+    if (PLATCFileExist(sched::kPersistentCopy)) {
+        std::array<char, 512> older{};
+        int number = 0;
+        do {
+            std::snprintf(older.data(), older.size(), "%s.%d", sched::kPersistentCopy, ++number);
+        } while (PLATCFileExist(older.data()));
+        if (rename(sched::kPersistentCopy, older.data()) != 0) {
+            SCHED_SET_ERROR(sched::kRenameFailed);
+            return logCopyFailure(sched::kPersistentCopy, older.data(), __LINE__);
+        }
+    }
+    return copyFile(kPersistent, sched::kPersistentCopy, __LINE__) != 0
+               ? -1
+               : verify(kPersistent, sched::kPersistentCopy, *before.persistent, true, __LINE__);
+}
+
+// A working copy that this process makes is made before cp opens it, so that cp follows no link
+// that somebody put there in between.
+int publishWorking(const char *scratch, const std::string &content) {
+    const sched::WritingLock lock;
+    if (!lock) {
+        return logCopyFailure(scratch, kWorkingCopy, 424);
+    }
+    if (sched::claimSharedFile(kWorkingCopy) != 0) {
+        SCHED_SET_ERROR(sched::kOpenFailed);
+        return logCopyFailure(scratch, kWorkingCopy, 424);
+    }
+    return copyFile(scratch, kWorkingCopy, 424) != 0
+               ? -1
+               : verify(scratch, kWorkingCopy, content, false, 424);
+}
+
+// The persistent file first, the working copy second. What fails is taken back with the change.
+int publish(const Scratch &scratch) {
+    const auto content = scratch.read();
+    if (!content || copyFile(scratch.path(), kPersistent, 419) != 0 ||
+        verify(scratch.path(), kPersistent, *content, true, 419) != 0) {
+        return -1;
+    }
+    return publishWorking(scratch.path(), *content);
+}
+
+int changeScratch(const Scratch &scratch, const std::string &section,
+                  const sched::Before::Tasks &before, const TAVI_SCHED_TASK *task) {
+    if (!task) {
+        return before.working ? removeSection(scratch.path(), section.c_str()) : 0;
+    }
+    const auto form = formOf(*task);
+    return form ? writeSection(scratch.path(), section.c_str(), form->get()) : -1;
+}
+
+int storeSection(const std::string &section, const TAVI_SCHED_TASK *task) {
+    sched::Before before;
+    if (!readBefore(before.tasks.emplace())) {
+        return -1;
+    }
+    if ((task || before.tasks->working) && sched::Change::record(before) != 0) {
+        return -1;
+    }
+    const Scratch scratch;
+    if ((task && savePersistent(*before.tasks) != 0) ||
+        scratch.prepare(before.tasks->working) != 0) {
+        return -1;
+    }
+    const int changed = changeScratch(scratch, section, *before.tasks, task);
+    if (changed <= 0) {
+        return changed;
+    }
+    return publish(scratch) == 0 ? 1 : -1;
+}
+
+// ---- Batches ----
+
+int stage(const std::string &section, const TAVI_SCHED_TASK *task) {
+    if (task) {
+        auto form = formOf(*task);
+        if (!form) {
+            return -1;
+        }
+        staged.store(section, std::move(form));
+        return 1;
+    }
+    if (staged.stateOf(section) == sched::StagedTasks::State::Untouched) {
+        const sched::Reading reading;
+        Hash hash(kCapacity);
+        bool unreadable = false;
+        int found = 0;
+        if (!reading || !hash) {
+            return -1;
+        }
+        if (isThere(reading.path(), unreadable)) {
+            readSection(reading.path(), section.c_str(), hash, found);
+        }
+        if (unreadable || found <= 0) {
+            return unreadable ? -1 : found;
+        }
+    } else if (!staged.find(section)) {
+        return 0;
+    }
+    staged.remove(section);
+    return 1;
+}
+
+int writeStaged(const char *path) {
+    std::vector<const char *> names;
+    std::vector<const PLATCSZHASH *> forms;
+    for (const std::string &section : staged.order()) {
+        names.push_back(section.c_str());
+        forms.push_back(staged.find(section));
+    }
+    if (!PLATCFileEditSections) {
+        for (size_t i = 0; i < names.size(); ++i) {
+            if ((forms[i] ? writeSection(path, names[i], forms[i])
+                          : removeSection(path, names[i])) < 0) {
+                return -1;
+            }
+        }
+        return 0;
+    }
+    if (PLATCFileEditSections(path, static_cast<int>(names.size()), names.data(), forms.data()) !=
+        0) {
+        SCHED_LOG("Save %zu sections to [%s] failed. [0x%04X %s:%d]", names.size(), path,
+                  SCHED_LAST_ERROR);
+        return -1;
+    }
+    return 0;
+}
+
+sched::Before::Tasks beforeBatch;
+
+} // namespace
+
+namespace sched {
+
+SectionName sectionName(int32_t id) {
+    SectionName name{};
+    std::snprintf(name.data(), name.size(), "%ld", static_cast<long>(id));
+    return name;
+}
+
+int forEachStoredTask(const TaskPass &how) {
+    return guarded(
+        SCHED_SITE, [&] { return pass(how); }, -1);
+}
+
+int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
+    return guarded(
+        SCHED_SITE, [&] { return lookUp(id, task); }, -1);
+}
+
+int nextFreeId(int32_t *id) {
+    return guarded(
+        SCHED_SITE,
+        [&] {
+            StagedTasks::Ids gathered;
+            if (!staged.ids) {
+                if (gatherIds(gathered) != 0) {
+                    return -1;
+                }
+                if (isBatchOpen()) {
+                    staged.ids = std::move(gathered);
+                }
+            }
+            *id = smallestFreeId(staged.ids ? staged.ids->used : gathered.used);
+            return 0;
+        },
+        -1);
+}
+
+int setTaskSection(int32_t id, const TAVI_SCHED_TASK *task) {
+    return guarded(
+        SCHED_SITE,
+        [&] {
+            const std::string section = sectionName(id).data();
+            return isBatchOpen() ? stage(section, task) : storeSection(section, task);
+        },
+        -1);
+}
+
+bool isAnyTaskStaged() {
+    return staged.any();
+}
+
+int describeStaged(Before &before) {
+    beforeBatch = {};
+    if (!readBefore(beforeBatch)) {
+        return -1;
+    }
+    before.tasks = beforeBatch;
+    return 0;
+}
+
+int storeStaged() {
+    const Scratch scratch;
+    return savePersistent(beforeBatch) != 0 || scratch.prepare(beforeBatch.working) != 0 ||
+                   writeStaged(scratch.path()) != 0
+               ? -1
+               : publish(scratch);
+}
+
+void forgetStaged() {
+    staged = {};
+}
+
+} // namespace sched

@@ -1,0 +1,126 @@
+// Several changes as one.
+#include "batch.h"
+#include "change.h"
+#include "sched_backend.h"
+#include "sched_guard.h"
+
+#include <memory>
+#include <vector>
+
+namespace {
+
+struct Deferred {
+    sched::ChangeHook hook;
+    int result;
+};
+
+struct Batch {
+    sched::Change change;
+    std::vector<Deferred> hooks;
+};
+
+std::unique_ptr<Batch> batch;
+std::vector<sched::BatchPart> parts;
+
+void forgetStaged() {
+    for (const sched::BatchPart &part : parts) {
+        part.forget();
+    }
+}
+
+// What backends do from here on is done at once.
+std::unique_ptr<Batch> close() {
+    forgetStaged();
+    return std::move(batch);
+}
+
+// The handlers are told when the lock is released: they may change tasks themselves.
+void end(std::unique_ptr<Batch> ended, bool stored) {
+    std::vector<Deferred> hooks = std::move(ended->hooks);
+    ended.reset();
+    const sched::KeptError error;
+    for (Deferred &deferred : hooks) {
+        deferred.hook.afterwards(stored ? deferred.result : -1);
+    }
+}
+
+int forEachTouched(int (*sched::BatchPart::*step)()) {
+    for (const sched::BatchPart &part : parts) {
+        if (part.isTouched() && (part.*step)() != 0) {
+            return -1;
+        }
+    }
+    return 0;
+}
+
+int storeAll() {
+    sched::Before before;
+    bool touched = false;
+    for (const sched::BatchPart &part : parts) {
+        if (part.isTouched()) {
+            touched = true;
+            if (part.describe(before) != 0) {
+                return -1;
+            }
+        }
+    }
+    if (!touched) {
+        return 0;
+    }
+    if (sched::Change::record(before) != 0 || forEachTouched(&sched::BatchPart::store) != 0 ||
+        forEachTouched(&sched::BatchPart::apply) != 0) {
+        return -1;
+    }
+    return 0;
+}
+
+} // namespace
+
+void sched::joinBatches(const BatchPart &part) {
+    parts.push_back(part);
+}
+
+bool sched::isBatchOpen() {
+    return batch != nullptr;
+}
+
+void sched::deferHook(ChangeHook hook, int result) {
+    batch->hooks.push_back({std::move(hook), result});
+}
+
+int TAVISchedChangeBegin() {
+    SCHED_REQUIRE(!batch, "no change has begun", -1);
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    return sched::guarded(
+        SCHED_SITE,
+        [] {
+            auto begun = std::make_unique<Batch>();
+            if (!begun->change) {
+                return -1;
+            }
+            batch = std::move(begun);
+            return 0;
+        },
+        -1);
+}
+
+int TAVISchedChangeCommit() {
+    SCHED_REQUIRE(batch, "a change has begun", -1);
+    int result = sched::guarded(SCHED_SITE, storeAll, -1);
+    auto ended = close();
+    if (result == 0) {
+        result = ended->change.finish();
+    } else {
+        ended->change.rollBack();
+    }
+    end(std::move(ended), result == 0);
+    return result;
+}
+
+int TAVISchedChangeRollback() {
+    SCHED_REQUIRE(batch, "a change has begun", -1);
+    end(close(), false);
+    return 0;
+}

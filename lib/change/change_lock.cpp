@@ -1,0 +1,249 @@
+// The locks of a change.
+#include "change_lock.h"
+#include "sched_error.h"
+#include "sched_paths.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <fcntl.h>
+#include <pthread.h>
+#include <string>
+#include <sys/file.h>
+#include <unistd.h>
+
+namespace {
+
+constexpr long kPatience = 30;        // seconds
+constexpr long kPause = 5'000'000;    // nanoseconds
+constexpr long kShortPause = 200'000; // nanoseconds
+
+base::Descriptor openLockFile(const char *path) {
+    return base::Descriptor(open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600));
+}
+
+// Tries until it works or patience ends.
+template <typename Try> bool retry(long pause, Try &&tryOnce) {
+    timespec start{};
+    clock_gettime(CLOCK_MONOTONIC, &start);
+    for (;;) {
+        if (tryOnce()) {
+            return true;
+        }
+        timespec now{};
+        clock_gettime(CLOCK_MONOTONIC, &now);
+        if (now.tv_sec - start.tv_sec >= kPatience) {
+            return false;
+        }
+        const timespec length{.tv_sec = 0, .tv_nsec = pause};
+        nanosleep(&length, nullptr);
+    }
+}
+
+// ---- The lock of changes ----
+
+struct HeldLock {
+    base::Descriptor file;
+    int depth = 0;
+};
+HeldLock held;
+
+// A child does not hold what its parent holds, and must not keep it either.
+void forgetInChild() {
+    held.file.close();
+    held.depth = 0;
+}
+
+void forgetInChildren() {
+    static const int registered = pthread_atfork(nullptr, nullptr, forgetInChild);
+    static_cast<void>(registered);
+}
+
+pid_t writtenHolder(int fd) {
+    std::array<char, 16> text{};
+    return pread(fd, text.data(), text.size() - 1, 0) > 0 ? std::atoi(text.data()) : 0;
+}
+
+pid_t parentOf(pid_t pid) {
+    std::array<char, 64> path{};
+    std::array<char, 512> stat{};
+    std::snprintf(path.data(), path.size(), "/proc/%d/stat", static_cast<int>(pid));
+    const base::Descriptor file(open(path.data(), O_RDONLY | O_CLOEXEC));
+    if (read(file.get(), stat.data(), stat.size() - 1) <= 0) {
+        return 0;
+    }
+    // The program's name, in parentheses, may hold any byte.
+    const char *const nameEnd = std::strrchr(stat.data(), ')');
+    return nameEnd && std::strlen(nameEnd) > 4 ? std::atoi(nameEnd + 4) : 0;
+}
+
+// A plug-in handler that a change waits for cannot wait for the change.
+bool isBelow(pid_t holder) {
+    pid_t ancestor = getppid();
+    while (ancestor > 1 && ancestor != holder) {
+        ancestor = parentOf(ancestor);
+    }
+    return holder > 1 && ancestor == holder;
+}
+
+enum class Outcome { Held, Busy, Below };
+
+Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
+    if (flock(fd, LOCK_EX | LOCK_NB) == 0) {
+        return Outcome::Held;
+    }
+    if (wait == sched::ChangeLock::Wait::No) {
+        return Outcome::Busy;
+    }
+    bool below = false;
+    const bool locked = retry(kPause, [&] {
+        below = isBelow(writtenHolder(fd));
+        return below || flock(fd, LOCK_EX | LOCK_NB) == 0;
+    });
+    return below ? Outcome::Below : locked ? Outcome::Held : Outcome::Busy;
+}
+
+// For those who wait to tell of, and for the processes below. What stays there counts for nothing
+// while nobody holds the lock.
+void writeHolder(int fd, pid_t holder) {
+    const std::string text = holder == 0 ? "" : std::to_string(holder);
+    if (ftruncate(fd, 0) == 0) {
+        (void)!pwrite(fd, text.data(), text.size(), 0);
+    }
+}
+
+} // namespace
+
+sched::ChangeLock::ChangeLock(Wait wait) {
+    if (held.depth > 0) {
+        ++held.depth;
+        held_ = true;
+        return;
+    }
+    base::Descriptor file = openLockFile(kChangeLock);
+    const Outcome outcome = file ? acquire(file.get(), wait) : Outcome::Held;
+    if (outcome != Outcome::Held) {
+        if (wait == Wait::HalfAMinute) {
+            SCHED_SET_ERROR(kLockFailed);
+            SCHED_LOG("%s (process %d)",
+                      outcome == Outcome::Below
+                          ? "a change waits for this process, which cannot make another one"
+                          : "another change has not ended within half a minute",
+                      static_cast<int>(writtenHolder(file.get())));
+        }
+        return;
+    }
+    forgetInChildren();
+    if (file) {
+        writeHolder(file.get(), getpid());
+    }
+    held.file = std::move(file);
+    held.depth = 1;
+    held_ = true;
+}
+
+sched::ChangeLock::~ChangeLock() {
+    if (!held_ || held.depth == 0 || --held.depth > 0) {
+        return;
+    }
+    if (held.file) {
+        writeHolder(held.file.get(), 0);
+        flock(held.file.get(), LOCK_UN);
+    }
+    held.file.close();
+}
+
+bool sched::ChangeLock::isOutermost() const {
+    return held_ && held.depth == 1;
+}
+
+bool sched::ChangeLock::isUsable() {
+    return held.depth > 0 ? static_cast<bool>(held.file)
+                          : static_cast<bool>(openLockFile(kChangeLock));
+}
+
+bool sched::ChangeLock::isHeldHere() {
+    return held.depth > 0;
+}
+
+sched::ChangeLock::Inherited::Inherited() {
+    if (held.file) {
+        fcntl(held.file.get(), F_SETFD, 0);
+    }
+}
+
+sched::ChangeLock::Inherited::~Inherited() {
+    if (held.file) {
+        fcntl(held.file.get(), F_SETFD, FD_CLOEXEC);
+    }
+}
+
+pid_t sched::changeLockHolder() {
+    const base::Descriptor file(open(kChangeLock, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+    const bool busy = file && flock(file.get(), LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+    return busy ? writtenHolder(file.get()) : 0;
+}
+
+// ---- Reading and writing ----
+
+// Two bytes of one file: readers pass the gate one by one and then share the room; a writer keeps
+// the gate shut while it waits for those inside.
+namespace {
+
+enum Place : off_t { Gate, Room };
+
+bool setLock(int fd, Place place, short type) {
+    struct flock lock {};
+    lock.l_type = type;
+    lock.l_whence = SEEK_SET;
+    lock.l_start = place;
+    lock.l_len = 1;
+    return fcntl(fd, F_OFD_SETLK, &lock) == 0;
+}
+
+bool enter(int fd, short type) {
+    return retry(kShortPause, [&] { return setLock(fd, Gate, type); }) &&
+           retry(kShortPause, [&] { return setLock(fd, Room, type); });
+}
+
+bool failToEnter(const char *what) {
+    SCHED_SET_ERROR(sched::kLockFailed);
+    SCHED_LOG("%s has been %s for half a minute", sched::kWorkingCopy, what);
+    return false;
+}
+
+} // namespace
+
+sched::ReadingLock::ReadingLock() : file_(openLockFile(kReadingLock)) {
+    acquire();
+}
+
+void sched::ReadingLock::acquire() {
+    held_ = !file_ || enter(file_.get(), F_RDLCK) || failToEnter("overwritten");
+    if (file_) {
+        setLock(file_.get(), Gate, F_UNLCK);
+    }
+}
+
+void sched::ReadingLock::release() {
+    if (file_) {
+        setLock(file_.get(), Room, F_UNLCK);
+    }
+    held_ = false;
+}
+
+sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
+    held_ = !file_ || enter(file_.get(), F_WRLCK) || failToEnter("read");
+    if (file_ && held_) {
+        fcntl(file_.get(), F_SETFD, 0); // a program that overwrites tasks keeps readers away
+    }
+}
+
+sched::WritingLock::~WritingLock() {
+    if (file_) {
+        setLock(file_.get(), Room, F_UNLCK);
+        setLock(file_.get(), Gate, F_UNLCK);
+    }
+}

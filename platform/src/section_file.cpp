@@ -1,9 +1,11 @@
 // Section files. A file is read whole; where its sections begin and end follows from the lines that
-// begin with "[" alone, and a section's pairs are split when it is asked for. The last file read is
-// remembered, so that reading all of its sections by name takes one pass. It is served only while
-// device, inode, size, times and the asking user are the same, and only when a change since could
-// not have left the same times: within one tick of the file system's clock it could, and then the
-// file is read again.
+// begin with "[" alone, and a section's pairs are split when it is asked for. Who asks for one
+// section or two gets them out of a small window that moves along the file. For who asks for more
+// the file is read whole and remembered, so that reading all of its sections by name takes one
+// pass. It is served only while device, inode, size, times and the asking user are the same, and
+// only when a change since could not have left the same times: within one tick of the file system's
+// clock it could, and then the file is read again.
+#include "base/file.h"
 #include "containers.h"
 #include "file.h"
 #include "platform.h"
@@ -86,6 +88,15 @@ std::optional<Section> sectionFrom(std::string_view text, size_t from) {
     return section;
 }
 
+// The first section of that name, or nothing.
+std::optional<Section> findFirst(std::string_view text, std::string_view name) {
+    auto section = sectionFrom(text, 0);
+    while (section && section->name != name) {
+        section = sectionFrom(text, section->end);
+    }
+    return section;
+}
+
 void readPairs(std::string_view text, const Section &section, PLATCSZHASH &hash) {
     auto &pairs = hash.pairs;
     for (size_t at = section.body; at < section.end; at = afterLine(text, at)) {
@@ -145,8 +156,7 @@ class SectionFile {
     const Index &index();
 
     std::string text_;
-    Index index_; // the first section of each name; made when it pays
-    int searches_ = 0;
+    Index index_; // the first section of each name; made when somebody asks
 };
 
 const SectionFile::Index &SectionFile::index() {
@@ -173,17 +183,7 @@ std::vector<std::string> SectionFile::names() {
     return names;
 }
 
-// Who asks for one section or two is answered by a look through the file; who asks for more is
-// going through all of them.
 std::optional<Section> SectionFile::find(std::string_view name) {
-    constexpr int kSearchesWithoutIndex = 2;
-    if (index_.empty() && searches_++ < kSearchesWithoutIndex) {
-        auto section = sectionFrom(text_, 0);
-        while (section && section->name != name) {
-            section = sectionFrom(text_, section->end);
-        }
-        return section;
-    }
     const auto found = index().find(name);
     return found == index().end() ? std::nullopt : std::optional(found->second);
 }
@@ -252,7 +252,77 @@ SectionFile *load(const char *path) {
     return remembered.file.get();
 }
 
-// The same for a writer that makes a missing file.
+// ---- One section alone ----
+
+// The text of the first section of that name, empty when there is none; nothing when the file
+// cannot be read to its end.
+std::optional<std::string> readSectionText(int fd, std::string_view name) {
+    constexpr size_t kStep = 65536;
+    std::string window; // begins where a line begins
+    for (bool atEnd = false;;) {
+        const auto section = findFirst(window, name);
+        if (section && (atEnd || section->end < window.size())) {
+            return window.substr(section->header, section->end - section->header);
+        }
+        if (atEnd) {
+            return std::string();
+        }
+        window.erase(0, section ? section->header : window.rfind('\n') + 1);
+        // A section larger than the window is looked at again as often as the window doubles.
+        auto more = base::readSome(fd, std::max(kStep, window.size()));
+        if (!more) {
+            return std::nullopt;
+        }
+        atEnd = more->empty();
+        window += *more;
+    }
+}
+
+// How often sections of a file that is not remembered were asked for.
+struct Asked {
+    Identity identity;
+    int times = 0;
+};
+
+Asked asked;
+
+bool asksForMore(const struct stat &status) {
+    constexpr int kTimesAlone = 2;
+    if (asked.identity != identityOf(status)) {
+        asked = {.identity = identityOf(status), .times = 0};
+    }
+    return asked.times++ >= kTimesAlone;
+}
+
+// 1 found and read into the hash, 0 no such section, -1.
+int readSectionAlone(const base::Opened &opened, std::string_view name, PLATCSZHASH &hash) {
+    const auto text = readSectionText(opened.file.get(), name);
+    if (!text) {
+        return PLATFORM_FAIL(platform::kReadWriteFailed);
+    }
+    const auto section = sectionFrom(*text, 0);
+    if (section) {
+        readPairs(*text, *section, hash);
+    }
+    return section ? 1 : 0;
+}
+
+int readSectionRemembered(const char *path, std::string_view name, PLATCSZHASH &hash) {
+    SectionFile *const file = load(path);
+    const auto section = file ? file->find(name) : std::nullopt;
+    if (!section) {
+        return file ? 0 : -1;
+    }
+    readPairs(file->text(), *section, hash);
+    if (!sectionFrom(file->text(), section->end)) {
+        remembered = {}; // a pass over all sections ends here: so does the need for memory
+    }
+    return 1;
+}
+
+// ---- Changes ----
+
+// The text for a writer that makes a missing file.
 std::optional<std::string_view> textToChange(const char *path) {
     const int there = platform::isThere(path);
     const SectionFile *const file = there == 1 ? load(path) : nullptr;
@@ -261,8 +331,6 @@ std::optional<std::string_view> textToChange(const char *path) {
     }
     return file ? std::string_view(file->text()) : std::string_view();
 }
-
-// ---- Changes ----
 
 struct Change {
     std::string_view name;
@@ -301,11 +369,11 @@ std::string changed(std::string_view text, std::span<const Change> changes) {
 
 // 1 done, 0 when there is no such section, -1.
 int changeExisting(const char *path, const Change &change) {
-    SectionFile *const file = load(path);
+    const SectionFile *const file = load(path);
     if (!file) {
         return -1;
     }
-    if (!file->find(change.name)) {
+    if (!findFirst(file->text(), change.name)) {
         return 0;
     }
     return platform::replaceFile(path, changed(file->text(), {&change, 1})) == 0 ? 1 : -1;
@@ -357,16 +425,13 @@ int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH *
     }
     return guarded(
         [&] {
-            SectionFile *const file = load(szPath);
-            const auto section = file ? file->find(szSection) : std::nullopt;
-            if (!section) {
-                return file ? 0 : -1;
+            if (!mayServeRemembered(szPath)) {
+                const auto opened = platform::openFile(szPath);
+                if (!opened || !asksForMore(opened->status)) {
+                    return opened ? readSectionAlone(*opened, szSection, **ppHash) : -1;
+                }
             }
-            readPairs(file->text(), *section, **ppHash);
-            if (!sectionFrom(file->text(), section->end)) {
-                remembered = {}; // a pass over all sections ends here: so does the need for memory
-            }
-            return 1;
+            return readSectionRemembered(szPath, szSection, **ppHash);
         },
         -1);
 }

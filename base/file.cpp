@@ -50,6 +50,25 @@ bool isInSharedFolder(const std::string &path) {
     return stat(folderOf(path).c_str(), &status) != 0 || (status.st_mode & S_ISVTX) != 0;
 }
 
+namespace {
+
+ssize_t readInto(int fd, char *buffer, size_t size) {
+    ssize_t count = 0;
+    do {
+        count = read(fd, buffer, size);
+    } while (count == -1 && errno == EINTR);
+    return count;
+}
+
+} // namespace
+
+std::optional<std::string> readSome(int fd, size_t most) {
+    std::string text(most, '\0');
+    const ssize_t count = readInto(fd, text.data(), most);
+    text.resize(count > 0 ? static_cast<size_t>(count) : 0);
+    return count < 0 ? std::nullopt : std::optional(std::move(text));
+}
+
 std::optional<std::string> readAll(int fd) {
     struct stat status {};
     if (fstat(fd, &status) != 0) {
@@ -59,10 +78,7 @@ std::optional<std::string> readAll(int fd) {
     std::string text(static_cast<size_t>(status.st_size) + 1, '\0');
     size_t length = 0;
     for (;;) {
-        const ssize_t count = read(fd, text.data() + length, text.size() - length);
-        if (count == -1 && errno == EINTR) {
-            continue;
-        }
+        const ssize_t count = readInto(fd, text.data() + length, text.size() - length);
         if (count <= 0) {
             text.resize(length);
             return count == 0 ? std::optional(std::move(text)) : std::nullopt;

@@ -17,6 +17,8 @@ namespace base {
 // when that cannot be seen.
 bool isInSharedFolder(const std::string &path);
 
+// Up to `most` bytes from the descriptor's position on; none at the end.
+std::optional<std::string> readSome(int fd, size_t most);
 // Everything from the descriptor's position on.
 std::optional<std::string> readAll(int fd);
 bool writeAll(int fd, std::string_view content);

@@ -62,7 +62,7 @@ PLATC_API int PLATCSzHashEnumKey(const PLATCSZHASH *pHash, PLATCSZLIST **ppList)
 
 /* ---- Files ---- */
 
-/* 1 when the path exists (links are followed), else 0. */
+/* 1 when the path exists (links are followed), else 0, also when that cannot be seen. */
 PLATC_API int PLATCFileExist(const char *szPath);
 /* Creates the file empty, or updates the times of an existing one. */
 PLATC_API int PLATCFileTouch(const char *szPath);
@@ -74,10 +74,12 @@ PLATC_API int PLATCFileSetLine(const char *szPath, const char *szMatch, const ch
  * Section files: "[name]" headers, each followed by "key=value" lines. A value is everything after
  * the first "=", blanks included, and may hold any byte but a line feed; a key holds neither "="
  * nor a line feed and does not begin with "["; a name holds neither "]" nor a line feed. Other
- * lines are ignored and kept. Writers replace the file atomically, keeping owner and mode. In a
- * folder with the sticky bit, a file is refused with error 0x0900 and a log line when it is a link,
- * belongs neither to root nor to the effective user, or may be written by everybody: anybody may
- * have put there what it says.
+ * lines are ignored and kept; of sections with one name only the first is read. Writers replace the
+ * file atomically, keeping owner and mode, and the change is on the disk when they answer. In a
+ * folder with the sticky bit it is not, as nothing there outlives a restart, and a file is refused
+ * with error 0x0900 and a log line when it is a link, belongs neither to root nor to the effective
+ * user, or may be written by everybody: anybody may have put there what it says. A file that cannot
+ * be looked at is no missing one: every function answers -1.
  */
 
 /* Empties the list, then lists the names of all sections in file order. Returns their number. */
@@ -93,12 +95,21 @@ PLATC_API int PLATCFileAddSection(const char *szPath, const char *szSection,
                                   const PLATCSZHASH *pHash);
 /* 1 removed, 0 no such section, -1. */
 PLATC_API int PLATCFileRemoveSection(const char *szPath, const char *szSection);
+/* Makes `count` changes at once: a section whose hash is NULL is removed if there is one, any other
+ * is replaced where it stands or else appended, in the order given. The file is written once; a
+ * missing one is made with mode 0600. */
+PLATC_API int PLATCFileEditSections(const char *szPath, int count, const char *const *rgszSections,
+                                    const PLATCSZHASH *const *rgHashes);
+/* Empties the list, then lists in file order what a hand has spoilt, a text each: "line 12: damaged
+ * header: [x" and "line 15: section [3] stands more than once". Returns their number, or -1. */
+PLATC_API int PLATCFileCheckSections(const char *szPath, PLATCSZLIST **ppFaults);
 
 /* ---- Programs and processes ---- */
 
 /* Starts the program (an absolute path, no shell) with the arguments after its name, ended by NULL,
- * and waits for it. 0 when it exited with 0, its exit status when that is another, -1 when it could
- * not be started or was killed. Works in a caller that ignores SIGCHLD too. */
+ * and /dev/null as its standard input, and waits for it. 0 when it exited with 0, its exit status
+ * when that is another, -1 when it could not be started or was killed. Works in a caller that
+ * ignores SIGCHLD too. */
 PLATC_API int PLATCExec(const char *szProgram, const char *const *rgszArgs);
 /* 1 when the process exists and is no zombie, else 0. */
 PLATC_API int PLATCProcAlive(pid_t pid);

@@ -2,9 +2,9 @@
  * The appliance's plug-in interface: packages register handlers for a named plug-in, and a call
  * runs all of them with named text arguments. In the portable implementation a handler is an
  * executable file in /usr/tavi/etc/plugins/<plug-in>/, started as "HANDLER <action> <pre|post>" in
- * name order with every argument in its environment. Handlers must be regular files that belong to
- * root and that nobody else may write, in a folder of the same kind; others are skipped with a log
- * line. Functions return 0 on success, -1 on failure.
+ * name order with every argument in its environment and nothing on its standard input. Handlers
+ * must be regular files that belong to root and that nobody else may write, in a folder of the same
+ * kind; others are skipped with a log line. Functions return 0 on success, -1 on failure.
  */
 #ifndef PLATPLUGIN_H
 #define PLATPLUGIN_H

@@ -1,7 +1,6 @@
 // Whole files: reading, atomic replacement, and the interface's operations on files of any format.
 #include "file.h"
 #include "base/file.h"
-#include "base/trust.h"
 #include "platform.h"
 
 #include <cerrno>
@@ -71,23 +70,31 @@ int isThere(const std::string &path) {
     return errno == ENOENT ? 0 : PLATFORM_FAIL(kStatFailed);
 }
 
-std::optional<FileContent> readFile(const std::string &path) {
+std::optional<base::Opened> openFile(const std::string &path) {
     const bool shared = base::isInSharedFolder(path);
-    const base::Opened opened = base::openTrusted(path.c_str(), ruleFor(shared));
-    if (opened.found != base::Found::Trusted) {
-        if (opened.found == base::Found::Strange) {
-            refuse(path, shared, opened.reason);
-        } else {
-            PLATFORM_FAIL(opened.file ? kStatFailed : kOpenFailed);
-        }
+    base::Opened opened = base::openTrusted(path.c_str(), ruleFor(shared));
+    if (opened.found == base::Found::Trusted) {
+        return opened;
+    }
+    if (opened.found == base::Found::Strange) {
+        refuse(path, shared, opened.reason);
+    } else {
+        PLATFORM_FAIL(opened.file ? kStatFailed : kOpenFailed);
+    }
+    return std::nullopt;
+}
+
+std::optional<FileContent> readFile(const std::string &path) {
+    const auto opened = openFile(path);
+    if (!opened) {
         return std::nullopt;
     }
-    auto text = base::readAll(opened.file.get());
+    auto text = base::readAll(opened->file.get());
     if (!text) {
         PLATFORM_FAIL(kReadWriteFailed);
         return std::nullopt;
     }
-    return FileContent{.text = *std::move(text), .status = opened.status};
+    return FileContent{.text = *std::move(text), .status = opened->status};
 }
 
 int replaceFile(const std::string &path, std::string_view content) {

@@ -1,0 +1,29 @@
+// The fixed paths of the library, each known here alone. The platform keeps its own: the power
+// schedules' file, the plug-in handlers' folder and the clock's wake alarm.
+#pragma once
+
+namespace sched {
+
+// Tasks: the persistent file, what is put aside beside it, and the working copy that is read.
+inline constexpr const char *kTaskFolder = "/usr/tavi/etc";
+inline constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+inline constexpr const char *kPutAside = "/usr/tavi/etc/scheduled_tasks.bak";
+inline constexpr const char *kWorkingCopy = "/tmp/scheduled_tasks";
+inline constexpr const char *kScratchStem = "/tmp/scheduled_tasks.tmp";
+
+// cron: its table, its process id, and what the tasks' lines start.
+inline constexpr const char *kCrontab = "/etc/crontab";
+inline constexpr const char *kCronPid = "/var/run/crond.pid";
+inline constexpr const char *kRunner = "/tmp/tavischedtask";
+
+// What a due power-off schedule runs.
+inline constexpr const char *kPowerOffCheck = "/usr/tavi/bin/tavi_poweroff_feasible_check";
+
+// Runs: their lock and how they ended.
+inline constexpr const char *kRunLockFolder = "/tmp/lock";
+inline constexpr const char *kRunLock = "/tmp/lock/lock_sched_run";
+inline constexpr const char *kStatusDatabase = "/tmp/sched_status.sqlite";
+inline constexpr const char *kStatusJournal = "/tmp/sched_status.sqlite-journal";
+inline constexpr const char *kStatusWal = "/tmp/sched_status.sqlite-wal";
+
+} // namespace sched

@@ -248,6 +248,22 @@ TAVI_SCHED_API int TAVISchedTaskSync(void);
  * hold every line; 0x0D00 for a smaller buffer that does not. */
 TAVI_SCHED_API int TAVISchedCrontabLine(const TAVI_SCHED_TASK *pTask, char *szBuf, size_t cbBuf);
 
+/* When an entry of the crontab is due: bit n stands for the value n. */
+typedef struct TAVI_SCHED_CRON_TIMES {
+    uint64_t minutes;   /* 0-59 */
+    uint32_t hours;     /* 0-23 */
+    uint32_t monthDays; /* 1-31 */
+    uint32_t months;    /* 1-12 */
+    uint32_t weekDays;  /* 0-6, 0 = Sunday */
+} TAVI_SCHED_CRON_TIMES;
+
+/* Judges a line of /etc/crontab, without its line feed, as cron does, which ignores all of the file
+ * for one line that it rejects. 0 when cron takes the line, comments and variables too; 1 when it
+ * does not, and the buffer, for which 512 bytes are enough, tells why; -1. The times (may be NULL)
+ * are those of an entry, and zeros for any other line and for entries such as "@daily". */
+TAVI_SCHED_API int TAVISchedCrontabLineCheck(const char *szLine, TAVI_SCHED_CRON_TIMES *pTimes,
+                                             char *szReason, size_t cbReason);
+
 /* The id that the schedule backend gives to its next task. */
 TAVI_SCHED_API int TAVISchedTaskNextId(int32_t *pId);
 

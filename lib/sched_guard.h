@@ -7,6 +7,7 @@
 #include <array>
 #include <cerrno>
 #include <exception>
+#include <utility>
 
 namespace sched {
 
@@ -21,6 +22,11 @@ auto guarded(const Site &site, Body &&body, decltype(body()) onFailure) noexcept
         PLATCErrSetEx(kTaskOutOfMemory, site.file, site.line);
         return onFailure;
     }
+}
+
+// The same for operations that answer -1.
+template <typename Body> int guarded(const Site &site, Body &&body) noexcept {
+    return guarded(site, std::forward<Body>(body), -1);
 }
 
 // The error state and errno as they were at its construction, set again at its destruction: what

@@ -1,30 +1,37 @@
-// The fixed places of the library's files.
+// The fixed paths of the library, each known here alone. The platform keeps its own: the power
+// schedules' file, the plug-in handlers' folder and the clock's wake alarm.
 #pragma once
 
 namespace sched {
 
-// Tasks: what outlives a restart, what is read, and what a change is prepared in.
-constexpr const char *kFolder = "/usr/tavi/etc";
-constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
-constexpr const char *kPersistentCopy = "/usr/tavi/etc/scheduled_tasks.bak";
-constexpr const char *kWorkingCopy = "/tmp/scheduled_tasks";
-constexpr const char *kScratchStem = "/tmp/scheduled_tasks.tmp";
+// Tasks: the persistent file, what is put aside beside it, and the working copy that is read.
+inline constexpr const char *kTaskFolder = "/usr/tavi/etc";
+inline constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+inline constexpr const char *kPutAside = "/usr/tavi/etc/scheduled_tasks.bak";
+inline constexpr const char *kWorkingCopy = "/tmp/scheduled_tasks";
+inline constexpr const char *kScratchStem = "/tmp/scheduled_tasks.tmp";
 
-// One change after the other, whole or not at all.
-constexpr const char *kChangeLock = "/usr/tavi/etc/scheduled_tasks.lock";
-constexpr const char *kReadingLock = "/usr/tavi/etc/scheduled_tasks.reading";
-constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
-constexpr const char *kRestoring = "/usr/tavi/etc/scheduled_tasks.journal.restoring";
-constexpr const char *kRecordPersistent = "/usr/tavi/etc/scheduled_tasks.journal.persistent";
+// One change after the other, whole or not at all: the locks of changing and of reading, and the
+// record of a change that goes on.
+inline constexpr const char *kChangeLock = "/usr/tavi/etc/scheduled_tasks.lock";
+inline constexpr const char *kReadingLock = "/usr/tavi/etc/scheduled_tasks.reading";
+inline constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
+inline constexpr const char *kRestoring = "/usr/tavi/etc/scheduled_tasks.journal.restoring";
+inline constexpr const char *kRecordPersistent = "/usr/tavi/etc/scheduled_tasks.journal.persistent";
 
-// cron and what it starts.
-constexpr const char *kCrontab = "/etc/crontab";
-constexpr const char *kCronPid = "/var/run/crond.pid";
-constexpr const char *kRunner = "/tmp/tavischedtask";
+// cron: its table, its process id, and what the tasks' lines start.
+inline constexpr const char *kCrontab = "/etc/crontab";
+inline constexpr const char *kCronPid = "/var/run/crond.pid";
+inline constexpr const char *kRunner = "/tmp/tavischedtask";
 
-// Runs.
-constexpr const char *kLockFolder = "/tmp/lock";
-constexpr const char *kLockFile = "/tmp/lock/lock_sched_run";
-constexpr const char *kStatusDatabase = "/tmp/sched_status.sqlite";
+// What a due power-off schedule runs.
+inline constexpr const char *kPowerOffCheck = "/usr/tavi/bin/tavi_poweroff_feasible_check";
+
+// Runs: their lock and how they ended.
+inline constexpr const char *kRunLockFolder = "/tmp/lock";
+inline constexpr const char *kRunLock = "/tmp/lock/lock_sched_run";
+inline constexpr const char *kStatusDatabase = "/tmp/sched_status.sqlite";
+inline constexpr const char *kStatusJournal = "/tmp/sched_status.sqlite-journal";
+inline constexpr const char *kStatusWal = "/tmp/sched_status.sqlite-wal";
 
 } // namespace sched

@@ -2,6 +2,7 @@
 #include "support.h"
 
 #include <csignal>
+#include <cstring>
 #include <fcntl.h>
 
 namespace {
@@ -10,6 +11,18 @@ using namespace support;
 using namespace std::string_literals;
 using Crontab = SchedTest;
 using Cron = SchedTest;
+
+pid_t startCron() {
+    const pid_t cron = fork();
+    if (cron == 0) {
+        execl("/usr/sbin/cron", "cron", "-f", nullptr);
+        _exit(127);
+    }
+    while (access("/var/run/crond.pid", F_OK) != 0) {
+        shell("sleep 0.01");
+    }
+    return cron;
+}
 
 TEST_F(Crontab, LinesOfTasks) {
     constexpr const char *kNow = "2024-05-08 09:00";
@@ -140,20 +153,132 @@ TEST_F(Crontab, FailedRewritesKeepTheOldFile) {
     }
 }
 
+// Lines as three judges see them: the library, cron itself, which is given each line in a file of
+// its own beside a job that then runs or does not, and "crontab -n", which knows no users: it gets
+// the line without root's name, and not what `byUser` alone decides.
+TEST_F(Cron, TakesTheLinesThatTheLibraryTakes) {
+    struct Case {
+        std::string line;
+        bool taken;
+        bool byUser = false;
+    };
+    const Case cases[] = {
+        {"# any", true},
+        {"", true},
+        {"A=b", true},
+        {" 1 = b c", true},
+        {"\"A B\" = 'c'\t", true},
+        {"A=\"\"", true},
+        {"=b", true},
+        {"A= ", false},
+        {"A=\v", false},
+        {"A='b", false},
+        {"A='b' c", false},
+        {"\"A=\"=b", false},
+        {"A B = c", false},
+        {"1 1 1 1 1 root x", true},
+        {"\t1 1\t1 1 1 root x", true},
+        {"5-3,1-5/2 */61 * jan-MAR fri-SUN root x", true},
+        {"1~5 *x 1-2-3 * 7 root x", true},
+        {"4294967297 007 * */4294967297 * root x", true},
+        {"@daily root x", true},
+        {"@Daily root x", false},
+        {"5/10 * * * * root x", false},
+        {"*/0 * * * * root x", false},
+        {"*/2147483648 * * * * root x", false},
+        {"60 * * * * root x", false},
+        {"18446744073709551616 * * * * root x", false},
+        {"* 24 * * * root x", false},
+        {"* * 0 * * root x", false},
+        {"* * * 13 * root x", false},
+        {"* * * january * root x", false},
+        {"* * * * 8 root x", false},
+        {"jan * * * * root x", false},
+        {"1,,2 * * * * root x", false},
+        {"1x * * * * root x", false},
+        {"-1 * * * * root x", false},
+        {"* * * * root x", false},
+        {"* * * *\t\troot x", false},
+        {"1 1 1 1 1 root ", true},
+        {"1 1 1 1 1 root", false, true},
+        {"@daily root", false, true},
+        {"1 1 1 1 1 nosuchuser x", false, true},
+        {"1 1 1 1 1 daemon x", true, true},
+        {"1 1 1 1 1 root " + std::string(998, 'x'), true},
+        {"1 1 1 1 1 root " + std::string(999, 'x'), false},
+    };
+    const auto isTaken = [](const std::string &line) {
+        char reason[512] = "x";
+        const int result = TAVISchedCrontabLineCheck(line.c_str(), nullptr, reason, sizeof reason);
+        EXPECT_EQ(result == 1, reason[0] != '\0') << reason;
+        return result == 0;
+    };
+    for (const Case &c : cases) {
+        EXPECT_EQ(isTaken(c.line), c.taken) << c.line;
+    }
+    if (access("/usr/sbin/cron", X_OK) != 0 || access("/usr/bin/crontab", X_OK) != 0 ||
+        seteuid(1) != 0 || seteuid(0) != 0) {
+        GTEST_SKIP() << "cron's own judgement needs root and cron";
+    }
+    const auto seenBy = [&](size_t i) { return "/tmp/taken." + std::to_string(i); };
+    for (size_t i = 0; i <= std::size(cases); ++i) {
+        const std::string line = i < std::size(cases) ? cases[i].line : "# the last one";
+        writeFile("/etc/cron.d/" + std::to_string(1000 + i),
+                  line + "\n@reboot root : > " + seenBy(i) + "\n");
+    }
+    shell("chmod 644 /etc/cron.d/*");
+    const pid_t cron = startCron();
+    while (access(seenBy(std::size(cases)).c_str(), F_OK) != 0) {
+        shell("sleep 0.01");
+    }
+    kill(cron, SIGTERM);
+    waitForChildren();
+    shell("rm /etc/cron.d/*");
+    for (size_t i = 0; i < std::size(cases); ++i) {
+        std::string line = cases[i].line;
+        EXPECT_EQ(access(seenBy(i).c_str(), F_OK) == 0, cases[i].taken) << line;
+        if (const size_t user = line.find("root "); user != std::string::npos) {
+            line.erase(user, 5);
+        }
+        writeFile("/tmp/line", line + "\n");
+        EXPECT_TRUE(cases[i].byUser ||
+                    (shell("crontab -n /tmp/line > /dev/null 2>&1") == 0) == cases[i].taken)
+            << line;
+    }
+}
+
+TEST_F(Crontab, WhenALineIsDue) {
+    const struct {
+        const char *line;
+        TAVI_SCHED_CRON_TIMES times;
+    } kCases[] = {
+        {"1-5/2,59 */12 1,31 feb-MAR 5-7 root x",
+         {1ULL << 59 | 0x2A, 0x1001, 0x80000002, 0xC, 0x61}},
+        {"5-3 23 */30 12 sun root x", {0, 0x800000, 0x80000002, 0x1000, 1}},
+        {"@daily root x", {}},
+        {"A=b", {}},
+        {"60 * * * * root x", {}},
+    };
+    for (const auto &c : kCases) {
+        TAVI_SCHED_CRON_TIMES times{1, 1, 1, 1, 1};
+        char reason[64];
+        TAVISchedCrontabLineCheck(c.line, &times, reason, sizeof reason);
+        EXPECT_EQ(memcmp(&times, &c.times, sizeof times), 0) << c.line;
+    }
+    char reason[8];
+    EXPECT_EQ(TAVISchedCrontabLineCheck("\x1b * * * *", nullptr, reason, sizeof reason), 1);
+    EXPECT_STREQ(reason, "the min");
+    EXPECT_EQ(failure(TAVISchedCrontabLineCheck(nullptr, nullptr, reason, 8)), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedCrontabLineCheck("", nullptr, reason, 0)), 0x0D00U);
+}
+
 TEST_F(Cron, RunsADueTaskAsItsOwner) {
     if (access("/usr/sbin/cron", X_OK) != 0 || seteuid(1) != 0 || seteuid(0) != 0) {
         GTEST_SKIP() << "needs root and cron";
     }
     ASSERT_EQ(symlink(RUNNER, "/tmp/tavischedtask"), 0);
     chmod(kCrontab, 0644);
-    const pid_t cron = fork();
-    if (cron == 0) {
-        execl("/usr/sbin/cron", "cron", "-f", nullptr);
-        _exit(127);
-    }
-    while (access("/var/run/crond.pid", F_OK) != 0) {
-        shell("sleep 0.01");
-    }
+    const pid_t cron = startCron();
     // Due in the next minute, or the one after when that is about to begin.
     const time_t due = time(nullptr) + 65;
     Task task = newTask("id -un > /tmp/ran; exit 4");

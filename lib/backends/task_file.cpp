@@ -19,10 +19,7 @@
 #include <string_view>
 #include <unistd.h>
 
-// An appliance's own platform may lack it.
-extern "C" [[gnu::weak]] int PLATCFileEditSections(const char *szPath, int count,
-                                                   const char *const *rgszSections,
-                                                   const PLATCSZHASH *const *rgHashes);
+#pragma weak PLATCFileEditSections // an appliance's own platform may lack it
 
 namespace {
 
@@ -363,20 +360,20 @@ int savePersistent(const sched::Before::Tasks &before) {
         before.persistent->empty()) {
         return 0;
     }
-    if (PLATCFileExist(sched::kPersistentCopy)) {
+    if (PLATCFileExist(sched::kPutAside)) {
         std::array<char, 512> older{};
         int number = 0;
         do {
-            std::snprintf(older.data(), older.size(), "%s.%d", sched::kPersistentCopy, ++number);
+            std::snprintf(older.data(), older.size(), "%s.%d", sched::kPutAside, ++number);
         } while (PLATCFileExist(older.data()));
-        if (rename(sched::kPersistentCopy, older.data()) != 0) {
+        if (rename(sched::kPutAside, older.data()) != 0) {
             SCHED_SET_ERROR(sched::kRenameFailed);
-            return logCopyFailure(sched::kPersistentCopy, older.data(), __LINE__);
+            return logCopyFailure(sched::kPutAside, older.data(), __LINE__);
         }
     }
-    return copyFile(kPersistent, sched::kPersistentCopy, __LINE__) != 0
+    return copyFile(kPersistent, sched::kPutAside, __LINE__) != 0
                ? -1
-               : verify(kPersistent, sched::kPersistentCopy, *before.persistent, true, __LINE__);
+               : verify(kPersistent, sched::kPutAside, *before.persistent, true, __LINE__);
 }
 
 // A working copy that this process makes is made before cp opens it, so that cp follows no link
@@ -510,7 +507,7 @@ int forEachStoredTask(const TaskPass &how) {
 
 int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
     return guarded(
-        SCHED_SITE, [&] { return lookUp(id, task); }, -1);
+        SCHED_SITE, [&] { return lookUp(id, task); });
 }
 
 int nextFreeId(int32_t *id) {

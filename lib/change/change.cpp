@@ -101,7 +101,7 @@ void sched::Change::rollBack() {
 
 int sched::Change::record(const Before &before) {
     // Without the folder there is no persistent file that could be overwritten: the copy fails.
-    const bool hasFolder = access(kFolder, F_OK) == 0 || errno != ENOENT;
+    const bool hasFolder = access(kTaskFolder, F_OK) == 0 || errno != ENOENT;
     if (hasFolder && writeRecord(before) != 0) {
         return -1;
     }

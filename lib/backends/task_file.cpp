@@ -506,8 +506,7 @@ int forEachStoredTask(const TaskPass &how) {
 }
 
 int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
-    return guarded(
-        SCHED_SITE, [&] { return lookUp(id, task); });
+    return guarded(SCHED_SITE, [&] { return lookUp(id, task); });
 }
 
 int nextFreeId(int32_t *id) {

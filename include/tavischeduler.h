@@ -266,6 +266,18 @@ TAVI_SCHED_API int TAVISchedCrontabLineCheck(const char *szLine, TAVI_SCHED_CRON
 
 /* The id that the schedule backend gives to its next task. */
 TAVI_SCHED_API int TAVISchedTaskNextId(int32_t *pId);
+/* Stores a new task under the id that it has. 0x0D00 when that is no id for the task's backend to
+ * give, or not free. */
+TAVI_SCHED_API int TAVISchedTaskCreateWithId(TAVI_SCHED_TASK *pTask);
+/* Lists the tasks of one backend (TAVI_SCHED_BACKEND_*) as TAVISchedTaskListGet does those of all, but
+ * answers -1 when the backend cannot list them. */
+TAVI_SCHED_API int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTaskList,
+                                          TAVI_SCHED_FILTER filter);
+
+/* Makes the machine ready after its start, with root's rights: takes back what a change that was cut
+ * off left, makes the working copy where there is none, the lock folder and the runner's link, and
+ * synchronises. May be called at any time. */
+TAVI_SCHED_API int TAVISchedStart(void);
 
 /* ---- Several changes as one ---- */
 

@@ -166,6 +166,7 @@ void SchedTest::SetUp() {
     // Never across a mount point: a checkout below /tmp is there, as it is on the machine.
     shell("find /tmp /usr/tavi/etc /run -xdev -mindepth 1 -delete 2>/dev/null");
     writeFile(kCrontab, kForeignCrontab);
+    symlink(RUNNER, "/tmp/tavischedtask");
     setenv("TZ", "UTC", 1);
     logs();
     pauses();

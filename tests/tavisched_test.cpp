@@ -20,7 +20,7 @@ class CommandLine : public SchedTest {
             "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins /run/tavisched.lock; chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
             "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
             "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
-            "ln -s /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
+            "ln -sfn /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
         writeFile("/run/crond.pid", std::to_string(cron_) + "\n");
     }
     // Stands for a cron that is running and takes its signals.

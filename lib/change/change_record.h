@@ -54,6 +54,9 @@ std::optional<Record> readRecord();
 // record still there. The crontab is the caller's.
 int restore(const Record &record);
 
+// Puts a new working copy in the place of whatever is there, in one step. False with errno set.
+bool replaceWorkingCopy(const std::string &content);
+
 // Whether the record can be read in the place of the working copy.
 bool recordHasTasks();
 

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <chrono>
 #include <csignal>
+#include <fcntl.h>
 #include <filesystem>
 #include <malloc.h>
 #include <regex>
@@ -283,7 +284,7 @@ TEST_F(Platform, ProgramsAndProcesses) {
     }
     // Nothing that the caller is sent is eaten.
     int input[2];
-    ASSERT_EQ(pipe(input), 0);
+    ASSERT_EQ(pipe2(input, O_NONBLOCK), 0);
     const int own = dup(0);
     dup2(input[0], 0);
     EXPECT_EQ(::write(input[1], "line\n", 5), 5);

@@ -44,6 +44,9 @@ extern "C" {
 #define TAVI_SCHED_TYPE_MONTHLY 3
 #define TAVI_SCHED_TYPE_YEARLY 4
 
+/* The longest command that can be stored, in bytes. */
+#define TAVI_SCHED_MAX_COMMAND 12285
+
 /* The number of days in a week mask and of names in TAVISchedWeekDayNames. */
 #define TAVI_SCHED_WEEK_DAYS 7
 
@@ -81,7 +84,7 @@ typedef struct TAVI_SCHED_TASK {
     char appName[1024];  /* its display name */
     char appArgs[8192];  /* its arguments, free text */
     char action[1024];   /* short description of what the task does */
-    char command[16384]; /* shell command; more than 12,285 bytes cannot be stored */
+    char command[16384]; /* shell command; TAVI_SCHED_MAX_COMMAND bytes can be stored */
 } TAVI_SCHED_TASK;
 
 #include "tavischedgetter.h"
@@ -146,6 +149,38 @@ TAVI_SCHED_API int TAVISchedTaskConvertToJsonById(int32_t id, char *szBuf, size_
  * are the same, else creates a new one; `create` non-zero always creates. Returns the task's id, or
  * -1 with nothing stored. An empty object stores nothing and returns -1, the id of a new task. */
 TAVI_SCHED_API int32_t TAVISchedTaskSaveFromJson(const char *szJson, int create);
+
+/* ---- What is wrong with a task, before it is stored ----
+ *
+ * Create, edit and save store what they are given; these tell what would come of it. A fault is no
+ * failure: nothing is logged, and the error state means nothing. */
+
+#define TAVI_SCHED_FAULT_VALUE 1       /* a value that is not accepted, or not kept as it is */
+#define TAVI_SCHED_FAULT_UNREADABLE 2  /* a stored value for which no task can be read */
+#define TAVI_SCHED_FAULT_MISSING 3     /* a key without which no task can be read */
+#define TAVI_SCHED_FAULT_UNKNOWN_KEY 4 /* a key that is passed over */
+
+typedef struct TAVI_SCHED_FAULT {
+    int32_t kind;     /* TAVI_SCHED_FAULT_* */
+    char key[64];     /* the field's stored key; "" when no single field is at fault */
+    char reason[512]; /* what is wrong and what is accepted, one line of printable UTF-8 */
+} TAVI_SCHED_FAULT;
+
+/* Looks for the first fault, in the order of the field table: numbers out of their ranges, days
+ * that do not exist, an owner who does not, texts that do not survive storing or JSON, a command
+ * that is too long, what a power schedule cannot be, and a line that cron would reject, whatever
+ * the state. Dates and week days count as far as the type looks at them. 0 the task is sound, 1 a
+ * fault was found, -1. */
+TAVI_SCHED_API int TAVISchedTaskCheck(const TAVI_SCHED_TASK *pTask, TAVI_SCHED_FAULT *pFault);
+/* Whether a value of the stored form comes back as it is written: 0 it does, 1 there is a fault,
+ * -1. The command is base64 here. */
+TAVI_SCHED_API int TAVISchedValueCheck(const char *szKey, const char *szValue,
+                                       TAVI_SCHED_FAULT *pFault);
+/* The same for a whole stored form, such as the members of a JSON text: writes its first `cFaults`
+ * faults and returns how many there are, 0 for none, or -1. A task can be read when every fault is
+ * of the kind VALUE or UNKNOWN_KEY; TAVISchedTaskCheck tells the rest of it. */
+TAVI_SCHED_API int TAVISchedHashCheck(struct PLATCSZHASH *pHash, TAVI_SCHED_FAULT *rgFaults,
+                                      size_t cFaults);
 
 /* ---- Dates, local time ---- */
 
@@ -369,6 +404,25 @@ TAVI_SCHED_API int TAVISchedDBIsTaskRunning(struct sqlite3 *db, int32_t taskId,
                                             TAVI_SCHED_STATUS *pStatus);
 TAVI_SCHED_API int TAVISchedDBIsAppRunning(struct sqlite3 *db, const char *szApp,
                                            TAVI_SCHED_STATUS *pStatus);
+
+/* ---- What is wrong with the machine ---- */
+
+typedef struct TAVI_SCHED_FINDING {
+    struct TAVI_SCHED_FINDING *next;
+    char name[32];     /* what was looked at, a stable word: "runner", "task files", ... */
+    char what[2048];   /* what is wrong; texts of tasks stand in it as they are */
+    char advice[1024]; /* what to do about it */
+    int32_t canRepair; /* 1 = TAVISchedFindingRepair can do it without a person */
+    int32_t isNote;    /* 1 = nothing is wrong yet */
+} TAVI_SCHED_FINDING;
+
+/* Looks at everything that scheduled tasks need, with root's rights. Returns how many findings there
+ * are; the head is overwritten with a list of them, those first on which others build. */
+TAVI_SCHED_API int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings);
+/* Repairs one: 0 when it is not found any more, else -1. Others may be gone or new afterwards. */
+TAVI_SCHED_API int TAVISchedFindingRepair(const TAVI_SCHED_FINDING *pFinding);
+/* Frees all findings of a list and empties the head. */
+TAVI_SCHED_API void TAVISchedFindingListFree(TAVI_SCHED_FINDING **ppFindings);
 
 /* ---- Plug-in hooks ---- */
 

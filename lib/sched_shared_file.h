@@ -13,8 +13,8 @@ int checkSharedFile(const char *path);
 int claimSharedFile(const char *path);
 
 // Makes sure that a folder is there that is no link, belongs to root or to the effective user and
-// that not everybody may write: a missing one is made with mode 0755, a strange one is left alone.
-// 0 or -1.
+// that not everybody may write: a missing one is made with mode 0755, one that everybody may write
+// is given that mode, a strange one is left alone. 0 or -1.
 int claimSharedFolder(const char *path);
 
 } // namespace sched

@@ -178,7 +178,7 @@ TEST_F(Run, ConflictingRunsFollowEachOther) {
 
 TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     storedTask();
-    mkdir("/tmp/lock", 0755);
+    shell("mkdir -m 1777 /tmp/lock"); // root's own, but anybody's to write: it is set right
     const int other = open("/tmp/lock/lock_sched_run", O_CREAT | O_RDWR, 0600);
     flock(other, LOCK_EX);
     EXPECT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
@@ -187,6 +187,7 @@ TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     flock(other, LOCK_UN);
     waitForChildren();
     EXPECT_EQ(rows(), "1:3: ");
+    EXPECT_EQ(statusOf("/tmp/lock").st_mode, S_IFDIR | 0755U);
     close(other);
 }
 

@@ -350,6 +350,11 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
  * the child was started; -1 when the task cannot be read or is marked not existing (0x2000), or the
  * date or the fork fails (0x2A00). */
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
+/* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
+ * row bears, and `pEnd` a descriptor that reads end-of-file once the child has ended, also when it
+ * recorded nothing; the caller closes it. Both are -1 when the task was skipped. */
+TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
+                                            int32_t *pPid, int *pEnd);
 
 /* The run lock's open file while it is held, else NULL. */
 extern TAVI_SCHED_API FILE *pfLock;
@@ -378,10 +383,15 @@ typedef struct TAVI_SCHED_STATUS {
 
 struct sqlite3;
 
-/* Opens the status database, made when missing; the caller closes it with sqlite3_close. NULL with
- * error 0x0900, or without one when the table cannot be made. A statement that meets a locked
- * database is tried up to 101 times with a pause of up to a second between. */
+/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose or
+ * sqlite3_close. NULL with error 0x0900, or without one when the table cannot be made. A statement
+ * that meets a locked database is tried up to 101 times with a pause of up to a second between. */
 TAVI_SCHED_API struct sqlite3 *TAVISchedDBInit(void);
+/* Opens it to read what is there and makes nothing: 1 with the handle, 0 with NULL when there were
+ * no runs yet, -1 with NULL and error 0x0900. */
+TAVI_SCHED_API int TAVISchedDBOpenForReading(struct sqlite3 **ppDb);
+/* Closes a handle of either function. 0x0B00 when statements of the caller's own are open on it. */
+TAVI_SCHED_API int TAVISchedDBClose(struct sqlite3 *db);
 /* Adds a running row of this process for the task. 0x0B00 when the row is not found again. */
 TAVI_SCHED_API int TAVISchedDBAddRecord(struct sqlite3 *db, const TAVI_SCHED_TASK *pTask,
                                         int32_t *pStatusId);
@@ -404,6 +414,17 @@ TAVI_SCHED_API int TAVISchedDBIsTaskRunning(struct sqlite3 *db, int32_t taskId,
                                             TAVI_SCHED_STATUS *pStatus);
 TAVI_SCHED_API int TAVISchedDBIsAppRunning(struct sqlite3 *db, const char *szApp,
                                            TAVI_SCHED_STATUS *pStatus);
+
+/* Is handed one row, which is gone after the call; anything but 0 ends the list. */
+typedef int (*TAVI_SCHED_STATUS_READER)(void *pContext, const TAVI_SCHED_STATUS *pStatus);
+/* Hands the runs of a task, or of all tasks for -1, to the reader, the newest first, a running one
+ * whose process is gone as SCHED_STATUS_CODE_INTERRUPTED. Returns how many the reader was handed.
+ * The database cannot be changed meanwhile: the reader only takes down what it needs. */
+TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
+                                         TAVI_SCHED_STATUS_READER reader, void *pContext);
+/* The same for the newest run of every task that has one, in the order of their ids. */
+TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
+                                             void *pContext);
 
 /* ---- What is wrong with the machine ---- */
 

@@ -123,7 +123,7 @@ int findNextRun(const TAVI_SCHED_TASK &task, std::optional<Date> &next) {
 int TAVISchedDateNormalize(TAVI_SCHED_DATE *pDate) {
     SCHED_REQUIRE(pDate, "((void *)0) != pDate", -1);
     // The daylight-saving flag stays 0, so that a time in a daylight-saving period comes back an
-    // hour later. This is kept: what is shown as next trigger time has always been computed so.
+    // hour later. The web back end expects its next trigger times so.
     tm broken{};
     broken.tm_year = static_cast<int>(pDate->year - 1900);
     broken.tm_mon = static_cast<int>(pDate->month - 1);

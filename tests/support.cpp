@@ -201,7 +201,7 @@ tm *localtime(const time_t *time) noexcept {
 
 void syslog(int priority, const char *format, ...) {
     const int savedErrno = errno; // also for %m
-    char line[16384] = "wrong priority";
+    char line[80000] = "wrong priority";
     if (priority == LOG_ERR) {
         va_list arguments;
         va_start(arguments, format);

@@ -66,17 +66,6 @@ bool claim(const char *path) {
     return false;
 }
 
-// Takes everybody's right to write from a folder that is root's or the effective user's own.
-bool setRight(const char *path) {
-    const base::Descriptor folder(open(path, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    struct stat status {};
-    if (!folder || fstat(folder.get(), &status) != 0) {
-        return false;
-    }
-    status.st_mode &= ~static_cast<mode_t>(S_IWOTH);
-    return base::isTrusted(status, base::kSharedFolder) && fchmod(folder.get(), 0755) == 0;
-}
-
 } // namespace
 
 // The look alone: opening and closing a SQLite file here would drop the process's locks on it.

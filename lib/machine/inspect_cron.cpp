@@ -11,6 +11,8 @@
 #include "tavischeduler.h"
 
 #include <algorithm>
+#include <array>
+#include <cstring>
 #include <fcntl.h>
 #include <fstream>
 #include <sys/stat.h>

@@ -6,6 +6,7 @@
 #include "tavischeduler.h"
 #include "tavisdk.h"
 
+#include <array>
 #include <cstring>
 #include <unistd.h>
 

@@ -7,6 +7,7 @@
 #include "sched_paths.h"
 #include "tavischeduler.h"
 
+#include <algorithm>
 #include <array>
 #include <cstring>
 

@@ -69,15 +69,8 @@ bool makePersistent() {
            file.commit({});
 }
 
-// Exchanged in one step: the name is never free for others.
 bool makeLockFolder() {
-    if (claimSharedFolder(kRunLockFolder) == 0) {
-        return true;
-    }
-    const base::PrivateFolder folder(kRunLockFolder);
-    const std::string made = folder.path() + "/lock";
-    return folder && mkdir(made.c_str(), 0755) == 0 && chmod(made.c_str(), 0755) == 0 &&
-           base::exchange(made.c_str(), kRunLockFolder);
+    return ensureSharedFolder(kRunLockFolder) == 0;
 }
 
 void inspectRoomIn(const char *folder, Inspection &inspection) {

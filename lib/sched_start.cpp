@@ -13,6 +13,8 @@
 #include "tavischeduler.h"
 
 #include <cerrno>
+#include <ctime>
+#include <limits>
 #include <optional>
 #include <string>
 #include <sys/stat.h>
@@ -86,7 +88,9 @@ int makeTasksReady() {
     if (!change) {
         return -1;
     }
-    sched::removeLeftovers();
+    constexpr timespec kNever{.tv_sec = std::numeric_limits<time_t>::max(), .tv_nsec = 0};
+    sched::removeLeftovers(
+        kNever); // temporary crontabs may be those of a change that goes on elsewhere
     const off_t size = ensureWorkingCopy();
     return size >= 0 ? synchronise(size > 0) : -1;
 }

@@ -208,13 +208,19 @@ struct Output {
     _exit(127);
 }
 
-// Waits for the shell; -1 when the child reported that it did not become one.
-int waitForShell(pid_t pid, int report) {
+// Waits for the shell; -1 when the child reported that it did not become one. What the watch does
+// comes after the shell's start, which it would delay.
+int waitForShell(pid_t pid, Output &output, int report) {
     char failed = 0;
     ssize_t reported = 0;
     while ((reported = read(report, &failed, 1)) == -1 && errno == EINTR) {
     }
-    const int status = watching ? watching->wait(pid) : base::waitForChild(pid);
+    if (!watching) {
+        const int status = base::waitForChild(pid);
+        return reported == 1 ? -1 : status;
+    }
+    watching->begun(pid, std::move(output.reading));
+    const int status = watching->wait(pid);
     return reported == 1 ? -1 : status;
 }
 
@@ -234,10 +240,7 @@ int startAndWait(const char *command, Setting &setting) {
     }
     close(report[1]);
     output.writing.close();
-    if (watching && pid != -1) {
-        watching->begun(pid, std::move(output.reading));
-    }
-    const int status = pid == -1 ? -1 : waitForShell(pid, report[0]);
+    const int status = pid == -1 ? -1 : waitForShell(pid, output, report[0]);
     close(report[0]);
     return status;
 }

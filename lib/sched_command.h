@@ -16,7 +16,7 @@ class CommandWatch {
     // "NAME=value" each, for the command's environment beside its other variables.
     virtual std::vector<std::string> variables() const = 0;
     virtual bool wantsOutput() const = 0;
-    // The command's process has been forked. What it prints comes out of `output`, if anything.
+    // The command's shell has begun. What it prints comes out of `output`, if anything.
     virtual void begun(pid_t process, base::Descriptor output) = 0;
     // Waits for it: its wait status, or -1.
     virtual int wait(pid_t process) = 0;

@@ -651,6 +651,35 @@ TEST_F(Records, HandlersAreTold) {
                              "20..-..-..T..:..:..\\+00:00\nSigBlk:.0000000000000000\n"));
 }
 
+// The examples, with stand-ins for the programs that they call; nothing in a name is obeyed.
+TEST_F(Records, HandlersThatAreShipped) {
+    const std::string folder = "/usr/tavi/etc/plugins/task_scheduler_run";
+    shell("mkdir -p /tmp/bin " + folder + "; cp " EXAMPLES "/* " + folder);
+    writeFile("/tmp/bin/sendmail", "#!/bin/sh\ncat > /tmp/mail\n");
+    writeFile("/tmp/bin/curl", "#!/bin/sh\nfor word; do echo \"$word\"; done > /tmp/post\n");
+    shell("chmod 755 /tmp/bin/*");
+    const std::string path = std::getenv("PATH");
+    setenv("PATH", ("/tmp/bin:" + path).c_str(), 1);
+    setenv("TAVI_POST_URL", "http://localhost/", 1);
+    setenv("TAVI_METRICS_FOLDER", "/tmp", 1);
+    Task task = newTask("echo printed; exit 3");
+    TAVISchedCTaskSetName(task.get(), "a \"b\" $(c) \\ &d=\xc3\xa9");
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    run();
+    waitForChildren();
+    setenv("PATH", path.c_str(), 1);
+    EXPECT_THAT(readFile("/tmp/mail"),
+                StartsWith("To: root\nSubject: task 1 (a \"b\" $(c) \\ &d=\xc3\xa9): exit 3\n"));
+    EXPECT_EQ(shell("sed '1,/^$/d' /tmp/mail | base64 -d | grep -qx printed"), 0);
+    EXPECT_THAT(readFile("/tmp/post"),
+                AllOf(HasSubstr("name=a \"b\" $(c) \\ &d=\xc3\xa9\n"), HasSubstr("result=exit\n"),
+                      testing::EndsWith("\n--\nhttp://localhost/\n")));
+    EXPECT_THAT(
+        readFile("/tmp/tavischeduler_task_1.prom"),
+        HasSubstr("last_run_success{task=\"1\",name=\"a \\\"b\\\" $(c) \\\\ &d=\xc3\xa9\"} 0\n"));
+    EXPECT_THAT(logs(), IsEmpty());
+}
+
 // The clock is taken to tick so fast that every process is old.
 TEST_F(Records, HandlersThatHangAreEnded) {
     addHandler("a", "sleep 600 & echo $! > /tmp/hangs; wait");

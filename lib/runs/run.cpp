@@ -30,7 +30,9 @@ constexpr size_t kBuffer = 65536;
 constexpr int kKillPause = 200;         // milliseconds
 constexpr int kMaxKills = 25;           // what is stuck in the kernel does not end
 constexpr int kWithoutSignalFile = 100; // milliseconds
-constexpr int kHandlerPause = 1000;     // milliseconds
+// A command that is over by then is recorded once, and one that begins is left the processor.
+constexpr int kUnrecorded = 30;     // milliseconds
+constexpr int kHandlerPause = 1000; // milliseconds
 
 int64_t millisecondsOf(clockid_t clock) {
     timespec now{};
@@ -193,7 +195,6 @@ std::vector<std::string> sched::Run::variables() const {
     return variables;
 }
 
-// The command is on its way meanwhile.
 void sched::Run::begun(pid_t process, base::Descriptor pipe) {
     awaited_ = process;
     began_ = steadyClock();
@@ -201,7 +202,6 @@ void sched::Run::begun(pid_t process, base::Descriptor pipe) {
     record_.result = TAVI_SCHED_RUN_RUNNING;
     record_.began = wallClock();
     logBegin();
-    store(false);
 }
 
 // What belongs to the result is what the command has printed by now. What it has left behind is
@@ -209,13 +209,19 @@ void sched::Run::begun(pid_t process, base::Descriptor pipe) {
 int sched::Run::wait(pid_t process) {
     listenToChildren();
     int status = -1;
+    bool isStored = false;
     while (true) {
         const Left left = reap(process, status);
         const bool isStopping = wasStopped_ && kills_ < kMaxKills;
         if (left == Left::None || (left == Left::Others && !isStopping)) {
             break;
         }
-        await(stopStep());
+        if (!isStored && steadyClock() - began_ >= kUnrecorded) {
+            store(false);
+            isStored = true;
+        }
+        const int next = stopStep();
+        await(isStored || next == 0 ? next : kUnrecorded);
     }
     takeRest();
     return status;

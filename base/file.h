@@ -84,6 +84,8 @@ class PrivateFolder {
   public:
     explicit PrivateFolder(const std::string &besides);
     ~PrivateFolder();
+    PrivateFolder(PrivateFolder &&other) noexcept : path_(std::exchange(other.path_, {})) {}
+    PrivateFolder &operator=(PrivateFolder &&) = delete;
     PrivateFolder(const PrivateFolder &) = delete;
     PrivateFolder &operator=(const PrivateFolder &) = delete;
 

@@ -4,10 +4,9 @@
  *   task save FILE      stores the task that the file describes and prints its id
  *   task show ID        prints name, next run and last result
  *
- * Build: cc task.c -o task $(pkg-config --cflags --libs tavischeduler sqlite3)
+ * Build: cc task.c -o task $(pkg-config --cflags --libs tavischeduler)
  */
 #include <platc.h>
-#include <sqlite3.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -46,19 +45,23 @@ static const char *resultName(int32_t code) {
 
 static int show(int32_t id) {
     TAVI_SCHED_TASK *task = TAVISchedTaskAlloc();
-    struct sqlite3 *db = TAVISchedDBInit();
+    struct sqlite3 *db = NULL; /* stays so when there were no runs yet */
     int32_t code = SCHED_STATUS_CODE_NONE;
     char comment[16] = "";
     int result = 1;
-    if (!task || !db || TAVISchedTaskGetByID(id, task) != 0) {
+    if (!task || TAVISchedDBOpenForReading(&db) < 0 || TAVISchedTaskGetByID(id, task) != 0) {
         fail("the task cannot be read");
     } else {
         printf("name:     %s\nnext run: %s\n", task->name, task->nextTriggerTime);
-        TAVISchedDBGetStatusByTaskID(db, id, NULL, &code, comment, sizeof comment);
+        if (db) {
+            TAVISchedDBGetStatusByTaskID(db, id, NULL, &code, comment, sizeof comment);
+        }
         printf("last run: %s %s\n", resultName(code), comment);
         result = 0;
     }
-    sqlite3_close(db);
+    if (db) {
+        TAVISchedDBClose(db);
+    }
     if (task) {
         TAVISchedTaskFree(task);
     }

@@ -44,6 +44,9 @@ extern "C" {
 #define TAVI_SCHED_TYPE_MONTHLY 3
 #define TAVI_SCHED_TYPE_YEARLY 4
 
+/* The longest command that can be stored, in bytes. */
+#define TAVI_SCHED_MAX_COMMAND 12285
+
 /* The number of days in a week mask and of names in TAVISchedWeekDayNames. */
 #define TAVI_SCHED_WEEK_DAYS 7
 
@@ -81,7 +84,7 @@ typedef struct TAVI_SCHED_TASK {
     char appName[1024];  /* its display name */
     char appArgs[8192];  /* its arguments, free text */
     char action[1024];   /* short description of what the task does */
-    char command[16384]; /* shell command; more than 12,285 bytes cannot be stored */
+    char command[16384]; /* shell command; TAVI_SCHED_MAX_COMMAND bytes can be stored */
 } TAVI_SCHED_TASK;
 
 #include "tavischedgetter.h"
@@ -147,6 +150,38 @@ TAVI_SCHED_API int TAVISchedTaskConvertToJsonById(int32_t id, char *szBuf, size_
  * -1 with nothing stored. An empty object stores nothing and returns -1, the id of a new task. */
 TAVI_SCHED_API int32_t TAVISchedTaskSaveFromJson(const char *szJson, int create);
 
+/* ---- What is wrong with a task, before it is stored ----
+ *
+ * Create, edit and save store what they are given; these tell what would come of it. A fault is no
+ * failure: nothing is logged, and the error state means nothing. */
+
+#define TAVI_SCHED_FAULT_VALUE 1       /* a value that is not accepted, or not kept as it is */
+#define TAVI_SCHED_FAULT_UNREADABLE 2  /* a stored value for which no task can be read */
+#define TAVI_SCHED_FAULT_MISSING 3     /* a key without which no task can be read */
+#define TAVI_SCHED_FAULT_UNKNOWN_KEY 4 /* a key that is passed over */
+
+typedef struct TAVI_SCHED_FAULT {
+    int32_t kind;     /* TAVI_SCHED_FAULT_* */
+    char key[64];     /* the field's stored key; "" when no single field is at fault */
+    char reason[512]; /* what is wrong and what is accepted, one line of printable UTF-8 */
+} TAVI_SCHED_FAULT;
+
+/* Looks for the first fault, in the order of the field table: numbers out of their ranges, days
+ * that do not exist, an owner who does not, texts that do not survive storing or JSON, a command
+ * that is too long, what a power schedule cannot be, and a line that cron would reject, whatever
+ * the state. Dates and week days count as far as the type looks at them. 0 the task is sound, 1 a
+ * fault was found, -1. */
+TAVI_SCHED_API int TAVISchedTaskCheck(const TAVI_SCHED_TASK *pTask, TAVI_SCHED_FAULT *pFault);
+/* Whether a value of the stored form comes back as it is written: 0 it does, 1 there is a fault,
+ * -1. The command is base64 here. */
+TAVI_SCHED_API int TAVISchedValueCheck(const char *szKey, const char *szValue,
+                                       TAVI_SCHED_FAULT *pFault);
+/* The same for a whole stored form, such as the members of a JSON text: writes its first `cFaults`
+ * faults and returns how many there are, 0 for none, or -1. A task can be read when every fault is
+ * of the kind VALUE or UNKNOWN_KEY; TAVISchedTaskCheck tells the rest of it. */
+TAVI_SCHED_API int TAVISchedHashCheck(struct PLATCSZHASH *pHash, TAVI_SCHED_FAULT *rgFaults,
+                                      size_t cFaults);
+
 /* ---- Dates, local time ---- */
 
 typedef struct TAVI_SCHED_DATE {
@@ -176,6 +211,15 @@ TAVI_SCHED_API int TAVISchedRandInit(void);
 /* Writes the next minute at which the task will run into its `nextTriggerTime`, or "N/A". 0x2A00
  * when the date cannot be had; the text is then left as it was. */
 TAVI_SCHED_API int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask);
+
+/* The moments from `from` until before `until` (seconds since the epoch) at which an enabled task will
+ * really be started: those at which cron takes its line and the task is then due, in the process's
+ * time zone. Of an hour that daylight saving time skips there is none, of one that it repeats the
+ * first. For a power schedule the moments at which the machine goes on or off. Writes the first
+ * `cMax` of them, in rising order, and returns how many it wrote, or -1. Nothing is allocated; the
+ * time it takes is linear in the days. */
+TAVI_SCHED_API int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t until,
+                                       int64_t *rgStarts, size_t cMax);
 
 /* ---- Backends ---- */
 
@@ -266,6 +310,18 @@ TAVI_SCHED_API int TAVISchedCrontabLineCheck(const char *szLine, TAVI_SCHED_CRON
 
 /* The id that the schedule backend gives to its next task. */
 TAVI_SCHED_API int TAVISchedTaskNextId(int32_t *pId);
+/* Stores a new task under the id that it has. 0x0D00 when that is no id for the task's backend to
+ * give, or not free. */
+TAVI_SCHED_API int TAVISchedTaskCreateWithId(TAVI_SCHED_TASK *pTask);
+/* Lists the tasks of one backend (TAVI_SCHED_BACKEND_*) as TAVISchedTaskListGet does those of all, but
+ * answers -1 when the backend cannot list them. */
+TAVI_SCHED_API int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTaskList,
+                                          TAVI_SCHED_FILTER filter);
+
+/* Makes the machine ready after its start, with root's rights: takes back what a change that was cut
+ * off left, makes the working copy where there is none, the lock folder and the runner's link, and
+ * synchronises. May be called at any time. */
+TAVI_SCHED_API int TAVISchedStart(void);
 
 /* ---- Several changes as one ---- */
 
@@ -303,6 +359,11 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
  * the child was started; -1 when the task cannot be read or is marked not existing (0x2000), or the
  * date or the fork fails (0x2A00). */
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
+/* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
+ * row bears, and `pEnd` a descriptor that reads end-of-file once the child has ended, also when it
+ * recorded nothing; the caller closes it. Both are -1 when the task was skipped. */
+TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
+                                            int32_t *pPid, int *pEnd);
 
 /* The run lock's open file while it is held, else NULL. */
 extern TAVI_SCHED_API FILE *pfLock;
@@ -331,10 +392,15 @@ typedef struct TAVI_SCHED_STATUS {
 
 struct sqlite3;
 
-/* Opens the status database, made when missing; the caller closes it with sqlite3_close. NULL with
- * error 0x0900, or without one when the table cannot be made. A statement that meets a locked
- * database is tried up to 101 times with a pause of up to a second between. */
+/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose or
+ * sqlite3_close. NULL with error 0x0900, or without one when the table cannot be made. A statement
+ * that meets a locked database is tried up to 101 times with a pause of up to a second between. */
 TAVI_SCHED_API struct sqlite3 *TAVISchedDBInit(void);
+/* Opens it to read what is there and makes nothing: 1 with the handle, 0 with NULL when there were
+ * no runs yet, -1 with NULL and error 0x0900. */
+TAVI_SCHED_API int TAVISchedDBOpenForReading(struct sqlite3 **ppDb);
+/* Closes a handle of either function. 0x0B00 when statements of the caller's own are open on it. */
+TAVI_SCHED_API int TAVISchedDBClose(struct sqlite3 *db);
 /* Adds a running row of this process for the task. 0x0B00 when the row is not found again. */
 TAVI_SCHED_API int TAVISchedDBAddRecord(struct sqlite3 *db, const TAVI_SCHED_TASK *pTask,
                                         int32_t *pStatusId);
@@ -357,6 +423,36 @@ TAVI_SCHED_API int TAVISchedDBIsTaskRunning(struct sqlite3 *db, int32_t taskId,
                                             TAVI_SCHED_STATUS *pStatus);
 TAVI_SCHED_API int TAVISchedDBIsAppRunning(struct sqlite3 *db, const char *szApp,
                                            TAVI_SCHED_STATUS *pStatus);
+
+/* Is handed one row, which is gone after the call; anything but 0 ends the list. */
+typedef int (*TAVI_SCHED_STATUS_READER)(void *pContext, const TAVI_SCHED_STATUS *pStatus);
+/* Hands the runs of a task, or of all tasks for -1, to the reader, the newest first, a running one
+ * whose process is gone as SCHED_STATUS_CODE_INTERRUPTED. Returns how many the reader was handed.
+ * The database cannot be changed meanwhile: the reader only takes down what it needs. */
+TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
+                                         TAVI_SCHED_STATUS_READER reader, void *pContext);
+/* The same for the newest run of every task that has one, in the order of their ids. */
+TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
+                                             void *pContext);
+
+/* ---- What is wrong with the machine ---- */
+
+typedef struct TAVI_SCHED_FINDING {
+    struct TAVI_SCHED_FINDING *next;
+    char name[32];     /* what was looked at, a stable word: "runner", "task files", ... */
+    char what[2048];   /* what is wrong; texts of tasks stand in it as they are */
+    char advice[1024]; /* what to do about it */
+    int32_t canRepair; /* 1 = TAVISchedFindingRepair can do it without a person */
+    int32_t isNote;    /* 1 = nothing is wrong yet */
+} TAVI_SCHED_FINDING;
+
+/* Looks at everything that scheduled tasks need, with root's rights. Returns how many findings there
+ * are; the head is overwritten with a list of them, those first on which others build. */
+TAVI_SCHED_API int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings);
+/* Repairs one: 0 when it is not found any more, else -1. Others may be gone or new afterwards. */
+TAVI_SCHED_API int TAVISchedFindingRepair(const TAVI_SCHED_FINDING *pFinding);
+/* Frees all findings of a list and empties the head. */
+TAVI_SCHED_API void TAVISchedFindingListFree(TAVI_SCHED_FINDING **ppFindings);
 
 /* ---- Plug-in hooks ---- */
 

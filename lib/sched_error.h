@@ -9,7 +9,11 @@
 #include "sched_text.h"
 
 #include <algorithm>
-#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+#include <new>
 #include <string_view>
 #include <syslog.h>
 
@@ -28,8 +32,9 @@ constexpr unsigned int kRenameFailed = 0x2800;
 constexpr unsigned int kSystemCallFailed = 0x2A00;
 constexpr unsigned int kBadFormat = 0x4000;
 
-// A source's name as messages carry it: the path below lib/ or include/.
-constexpr const char *sourceName(const char *path) {
+// A source's name as messages carry it: the path below lib/ or include/. Found at compile time, as
+// operations name their place also when nothing fails.
+consteval const char *sourceName(const char *path) {
     constexpr size_t npos = std::string_view::npos;
     const std::string_view text(path);
     size_t start = 0;
@@ -49,14 +54,35 @@ struct Site {
     int line;
 };
 
-// A text from outside, cut for a log line: the system log drops very long messages without a word.
+// A text from outside as a log line shows it: whole up to 64 KiB, and cut beyond that with a mark,
+// as the system log drops very long messages without a word. The text must outlive it.
 class LogText {
   public:
-    explicit LogText(const char *text) { copyText(text_.data(), text_.size(), text); }
-    const char *c_str() const { return text_.data(); }
+    explicit LogText(const char *text) : shown_(text) {
+        const size_t length = std::strlen(text);
+        if (length > kMost) {
+            cut(length);
+        }
+    }
+    const char *c_str() const { return shown_; }
 
   private:
-    std::array<char, 4097> text_;
+    static constexpr size_t kMost = 65536;
+    static constexpr size_t kMarkSize = 64;
+
+    void cut(size_t length) {
+        const int savedErrno = errno; // for %m of the same message
+        copy_.reset(new (std::nothrow) char[kMost + kMarkSize]);
+        if (copy_) {
+            std::memcpy(copy_.get(), shown_, kMost);
+            std::snprintf(copy_.get() + kMost, kMarkSize, " [... %zu bytes more]", length - kMost);
+        }
+        shown_ = copy_ ? copy_.get() : "[... a long text, and no memory to show it]";
+        errno = savedErrno;
+    }
+
+    const char *shown_;
+    std::unique_ptr<char[]> copy_;
 };
 
 } // namespace sched
@@ -79,8 +105,8 @@ class LogText {
 #define SCHED_SET_ERROR_AT(line, code) PLATCErrSetEx((code), SCHED_SOURCE, (line))
 #define SCHED_SET_ERROR(code) SCHED_SET_ERROR_AT(__LINE__, code)
 
-// Leaves the function with `result` when an argument is bad. `text` is the condition as messages
-// have always shown it.
+// Leaves the function with `result` when an argument is bad. `text` is the condition as the support
+// scripts know it.
 #define SCHED_REQUIRE_AT(line, condition, text, result)                                            \
     do {                                                                                           \
         if (!(condition)) {                                                                        \

@@ -5,6 +5,7 @@
 #include "base/trust.h"
 
 #include <cerrno>
+#include <fcntl.h>
 #include <new>
 #include <string>
 #include <sys/stat.h>
@@ -30,6 +31,17 @@ bool replaceStrange(const char *path) {
         base::exchange(ours.c_str(), path);
     }
     return true;
+}
+
+// A folder of root's or the effective user's that everybody may write: it is that no more.
+bool setRight(const char *path) {
+    const base::Descriptor folder(open(path, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    struct stat status {};
+    if (!folder || fstat(folder.get(), &status) != 0) {
+        return false;
+    }
+    status.st_mode &= ~static_cast<mode_t>(S_IWOTH);
+    return base::isTrusted(status, base::kSharedFolder) && fchmod(folder.get(), 0755) == 0;
 }
 
 bool claim(const char *path) {
@@ -82,6 +94,27 @@ int sched::claimSharedFolder(const char *path) {
     if (mkdir(path, 0700) == 0) {
         return chmod(path, 0755);
     }
-    return errno == EEXIST && base::look(path, base::kSharedFolder) == base::Found::Trusted ? 0
-                                                                                            : -1;
+    if (errno != EEXIST) {
+        return -1;
+    }
+    const base::Found found = base::look(path, base::kSharedFolder);
+    return found == base::Found::Trusted || (found == base::Found::Strange && setRight(path)) ? 0
+                                                                                              : -1;
+}
+
+int sched::ensureSharedFolder(const char *path) {
+    if (claimSharedFolder(path) == 0) {
+        return 0;
+    }
+    try {
+        const base::PrivateFolder folder(path);
+        const std::string made = folder.path() + "/folder";
+        return folder && mkdir(made.c_str(), 0755) == 0 && chmod(made.c_str(), 0755) == 0 &&
+                       base::exchange(made.c_str(), path)
+                   ? 0
+                   : -1;
+    } catch (const std::bad_alloc &) {
+        errno = ENOMEM;
+        return -1;
+    }
 }

@@ -8,11 +8,11 @@
 #include "tavischeduler.h"
 #include "tavisdk.h"
 
+#include <algorithm>
 #include <array>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <limits>
 
 namespace {
 
@@ -32,32 +32,17 @@ int ToHashStr(const Field &field, const TAVI_SCHED_TASK &task, NumberText &text)
     return length < 0 ? -1 : 0;
 }
 
-// Numbers beyond a field's 32 bits are clamped: an owner of 4294967296 must not become root.
-int32_t signedFromHashStr(const char *text) {
-    using Limits = std::numeric_limits<int32_t>;
-    const long value = std::strtol(text, nullptr, 10);
-    return static_cast<int32_t>(std::clamp<long>(value, Limits::min(), Limits::max()));
-}
-
-// A negative number counts as one beyond the field's largest, as -1 always has.
-int unsignedFromHashStr(const char *text, uint32_t &value) {
-    constexpr uint32_t kLargest = std::numeric_limits<uint32_t>::max();
-    char *end = nullptr;
-    const unsigned long parsed = std::strtoul(text, &end, 10);
-    if (*end != '\0') {
+int fnFromHashStr(const Field &field, const char *text, TAVI_SCHED_TASK &task) {
+    if (field.kind == FieldKind::Signed) {
+        field.signedIn(task) = sched::signedFromText(text);
+        return 0;
+    }
+    const auto number = sched::unsignedFromText(text);
+    if (!number) {
         SCHED_SET_ERROR(sched::kBadFormat);
         return -1;
     }
-    const bool negative = parsed != 0 && std::strchr(text, '-') != nullptr;
-    value = negative ? kLargest : static_cast<uint32_t>(std::min<unsigned long>(parsed, kLargest));
-    return 0;
-}
-
-int fnFromHashStr(const Field &field, const char *text, TAVI_SCHED_TASK &task) {
-    if (field.kind == FieldKind::Unsigned) {
-        return unsignedFromHashStr(text, field.unsignedIn(task));
-    }
-    field.signedIn(task) = signedFromHashStr(text);
+    field.unsignedIn(task) = *number;
     return 0;
 }
 
@@ -165,6 +150,22 @@ int decodeCommand(TAVI_SCHED_TASK &task) {
 }
 
 } // namespace
+
+int32_t sched::signedFromText(const char *text) {
+    const long value = std::strtol(text, nullptr, 10);
+    return static_cast<int32_t>(std::clamp<long>(value, kAnySigned.low, kAnySigned.high));
+}
+
+std::optional<uint32_t> sched::unsignedFromText(const char *text) {
+    constexpr auto kLargest = static_cast<unsigned long>(kAnyUnsigned.high);
+    char *end = nullptr;
+    const unsigned long value = std::strtoul(text, &end, 10);
+    if (*end != '\0') {
+        return std::nullopt;
+    }
+    const bool isNegative = value != 0 && std::strchr(text, '-') != nullptr;
+    return static_cast<uint32_t>(isNegative ? kLargest : std::min(value, kLargest));
+}
 
 void sched::setNewTaskValues(PLATCSZHASH **hash, const char *name, const char *appName) {
     const std::array<std::array<const char *, 2>, 13> values = {{{"id", "-1"},

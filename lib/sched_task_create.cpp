@@ -1,4 +1,5 @@
 // Storing a new task.
+#include "change/change.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -18,4 +19,36 @@ int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask) {
     sched::ChangeHook hook(SCHED_SITE, "task_create", nullptr, pTask);
     hook.after(-1);
     return -1;
+}
+
+namespace {
+
+// Of the schedule backend alone: the others compute their ids.
+bool isFree(int32_t id) {
+    for (const TAVI_SCHED_BACKEND_RECORD &backend : sched::registeredBackends()) {
+        TAVI_SCHED_TASK present{};
+        if ((backend.owns_id && backend.owns_id(id) != 0) ||
+            (backend.get_by_id && backend.get_by_id(id, &present) != 0)) {
+            return false;
+        }
+    }
+    return id > 0;
+}
+
+} // namespace
+
+int TAVISchedTaskCreateWithId(TAVI_SCHED_TASK *pTask) {
+    SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    sched::Change change;
+    if (!change) {
+        return -1;
+    }
+    SCHED_REQUIRE(pTask->backend == TAVI_SCHED_BACKEND_SCHEDULE && isFree(pTask->id), "id is free",
+                  -1);
+    const int result =
+        sched::dispatch(SCHED_SITE, "edit", pTask, &TAVI_SCHED_BACKEND_RECORD::edit).value_or(-1);
+    return result == 0 ? change.finish() : -1;
 }

@@ -1,8 +1,10 @@
 // The status database: a row for every run of a task. Many runners use it at once, so a statement
 // that meets a locked database is tried again after a random pause.
+#include "base/trust.h"
 #include "platc.h"
 #include "sched_error.h"
 #include "sched_handle.h"
+#include "sched_paths.h"
 #include "sched_shared_file.h"
 #include "sched_text.h"
 #include "tavischeduler.h"
@@ -15,6 +17,7 @@
 #include <cstring>
 #include <ctime>
 #include <sqlite3.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace {
@@ -22,7 +25,6 @@ namespace {
 using sched::LogText;
 using sched::SqlText;
 
-constexpr const char *kDatabase = "/tmp/sched_status.sqlite";
 constexpr const char *kCreateTable =
     "CREATE TABLE if not exists task_status(status_id INTEGER PRIMARY KEY ASC, pid INTEGER, "
     "timestamp INTEGER, app STRING, task_id INTEGER, status_code INTEGER, comment STRING);";
@@ -30,24 +32,25 @@ constexpr const char *kCreateTable =
 constexpr const char *kKeepJournal = "PRAGMA journal_mode=TRUNCATE;";
 constexpr int kMaxRetries = 100;
 
-using RowReader = int (*)(void *status, int columns, char **values, char **names);
+using RowReader = int (*)(void *context, int columns, char **values, char **names);
 
 // A pause of 0.1 s to 1 s. The product wraps, a negative sum counts as a large unsigned number: the
-// distribution of the pauses is the one that runners have always had.
+// distribution of the pauses is that of the runners which share the database on an appliance that
+// is being upgraded.
 void pauseBeforeRetry() {
     const auto product = static_cast<int32_t>(static_cast<uint32_t>(std::rand()) * 32U);
     const auto sum = static_cast<uint32_t>(product % 1000000 + 100000);
     usleep(std::min(sum, 999999U));
 }
 
-int execute(sqlite3 *db, const char *sql, RowReader reader = nullptr,
-            TAVI_SCHED_STATUS *status = nullptr) {
+int execute(sqlite3 *db, const char *sql, RowReader reader = nullptr, void *context = nullptr) {
     for (int retries = 0;; ++retries) {
         char *text = nullptr;
-        if (sqlite3_exec(db, sql, reader, status, &text) == SQLITE_OK) {
+        const int result = sqlite3_exec(db, sql, reader, context, &text);
+        const SqlText error(text);
+        if (result == SQLITE_OK || (reader && result == SQLITE_ABORT)) { // the reader has enough
             return 0;
         }
-        const SqlText error(text);
         if (!error) {
             return -1;
         }
@@ -66,8 +69,8 @@ template <typename... Args> SqlText format(const char *sql, Args... args) {
 }
 
 int executeBuilt(sqlite3 *db, const SqlText &sql, RowReader reader = nullptr,
-                 TAVI_SCHED_STATUS *status = nullptr) {
-    return sql ? execute(db, sql.get(), reader, status) : -1;
+                 void *context = nullptr) {
+    return sql ? execute(db, sql.get(), reader, context) : -1;
 }
 
 int32_t number(const char *value) {
@@ -122,14 +125,19 @@ int readLiveRow(void *argument, int columns, char **values, char **names) {
     return 0;
 }
 
+// The row's code, or that it was interrupted: nobody is left to end it.
+int32_t reportedCode(const TAVI_SCHED_STATUS &status) {
+    const bool gone = status.statusCode == SCHED_STATUS_CODE_RUNNING && status.pid > 0 &&
+                      PLATCProcAlive(status.pid) != 1;
+    return gone ? SCHED_STATUS_CODE_INTERRUPTED : status.statusCode;
+}
+
 // Hands a row out as a read of the last status: 1, or 0 when there was no row.
 int reportStatus(const TAVI_SCHED_STATUS &status, int32_t *code, char *comment, size_t cbComment) {
     if (!status.found) {
         return 0;
     }
-    const bool gone = status.statusCode == SCHED_STATUS_CODE_RUNNING && status.pid > 0 &&
-                      PLATCProcAlive(status.pid) != 1;
-    *code = gone ? SCHED_STATUS_CODE_INTERRUPTED : status.statusCode;
+    *code = reportedCode(status);
     if (comment && cbComment > 0) {
         sched::copyText(comment, cbComment, status.comment);
     }
@@ -138,14 +146,25 @@ int reportStatus(const TAVI_SCHED_STATUS &status, int32_t *code, char *comment, 
 
 // A journal or a write-ahead log that another user put beside the database would be obeyed; SQLite
 // looks for them again and again, so their names are held by empty files.
-int claimDatabase() {
-    for (const char *path :
-         {"/tmp/sched_status.sqlite-wal", "/tmp/sched_status.sqlite-journal", kDatabase}) {
-        if (sched::claimSharedFile(path) != 0) {
-            return -1;
-        }
+bool claimJournals() {
+    return sched::claimSharedFile(sched::kStatusWal) == 0 &&
+           sched::claimSharedFile(sched::kStatusJournal) == 0;
+}
+
+void failToOpen(const char *reason) {
+    SCHED_LOG("Can't open database: %s\n", reason);
+    SCHED_SET_ERROR(sched::kOpenFailed);
+}
+
+sched::Database openDatabase(int flags) {
+    sqlite3 *handle = nullptr;
+    const int result = sqlite3_open_v2(sched::kStatusDatabase, &handle, flags, nullptr);
+    sched::Database db(handle);
+    if (result != SQLITE_OK) {
+        failToOpen(sqlite3_errmsg(db.get()));
+        return nullptr;
     }
-    return 0;
+    return db;
 }
 
 // The pragma counts for the next commit. While the database is locked it fails, and the statement
@@ -154,6 +173,39 @@ int createTable(sqlite3 *db) {
     const bool keeps = sqlite3_exec(db, kKeepJournal, nullptr, nullptr, nullptr) == SQLITE_OK;
     const int created = execute(db, kCreateTable);
     return created != 0 || keeps ? created : execute(db, kKeepJournal);
+}
+
+// Hands rows over to a caller's function.
+struct Listing {
+    TAVI_SCHED_STATUS_READER reader;
+    void *context;
+    bool lastOnly;
+    int count = 0;
+    TAVI_SCHED_STATUS status{};
+};
+
+int handOver(void *argument, int columns, char **values, char **names) {
+    auto &listing = *static_cast<Listing *>(argument);
+    TAVI_SCHED_STATUS &status = listing.status;
+    const int32_t taskBefore = status.taskId;
+    storeRow(status, columns, values, names);
+    if (listing.lastOnly && listing.count > 0 && status.taskId == taskBefore) {
+        return 0;
+    }
+    status.statusCode = reportedCode(status);
+    status.found = 1;
+    ++listing.count;
+    return listing.reader(listing.context, &status);
+}
+
+// Rows are in memory one at a time. With `lastOnly` those of a task stand together, the newest
+// first.
+int list(sqlite3 *db, int32_t taskId, Listing &&listing) {
+    const SqlText sql = format("SELECT status_id, pid, timestamp, app, task_id, status_code, "
+                               "comment FROM task_status WHERE %d = -1 OR task_id = %d "
+                               "ORDER BY %s timestamp DESC, status_id DESC",
+                               taskId, taskId, listing.lastOnly ? "task_id," : "");
+    return executeBuilt(db, sql, handOver, &listing) == 0 ? listing.count : -1;
 }
 
 // A statement put together piece by piece in a bounded buffer.
@@ -180,20 +232,46 @@ class BoundedStatement {
 
 sqlite3 *TAVISchedDBInit() {
     TAVISchedRandInit();
-    if (claimDatabase() != 0) {
-        SCHED_LOG("Can't open database: %s\n", std::strerror(errno));
-        SCHED_SET_ERROR(sched::kOpenFailed);
+    if (!claimJournals() || sched::claimSharedFile(sched::kStatusDatabase) != 0) {
+        failToOpen(std::strerror(errno));
         return nullptr;
     }
-    sqlite3 *handle = nullptr;
-    const int result = sqlite3_open(kDatabase, &handle);
-    sched::Database db(handle);
-    if (result != SQLITE_OK) {
-        SCHED_SET_ERROR(sched::kOpenFailed);
-        SCHED_LOG("Can't open database: %s\n", sqlite3_errmsg(db.get()));
+    sched::Database db = openDatabase(SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE);
+    if (!db) {
         return nullptr;
     }
     return createTable(db.get()) == 0 ? db.release() : nullptr;
+}
+
+// The handle may write, or what a dead writer left in the journal could not be taken back.
+int TAVISchedDBOpenForReading(sqlite3 **ppDb) {
+    SCHED_REQUIRE(ppDb, "((void *)0) != ppDb", -1);
+    *ppDb = nullptr;
+    struct stat status {};
+    if (lstat(sched::kStatusDatabase, &status) != 0 && errno == ENOENT) {
+        return 0;
+    }
+    const char *const strange = base::whyNotTrusted(status, base::kSharedFile);
+    if (!strange && status.st_size == 0) {
+        return 0; // the first runner is about to fill it
+    }
+    if (strange || access(sched::kStatusDatabase, R_OK | W_OK) != 0 || !claimJournals()) {
+        failToOpen(strange ? strange : std::strerror(errno));
+        return -1;
+    }
+    TAVISchedRandInit();
+    *ppDb = openDatabase(SQLITE_OPEN_READWRITE).release();
+    return *ppDb ? 1 : -1;
+}
+
+int TAVISchedDBClose(sqlite3 *db) {
+    SCHED_REQUIRE(db, "((void *)0) != db", -1);
+    if (sqlite3_close(db) != SQLITE_OK) {
+        SCHED_LOG("Can't close database: %s\n", sqlite3_errmsg(db));
+        SCHED_SET_ERROR(sched::kReadWriteFailed);
+        return -1;
+    }
+    return 0;
 }
 
 int TAVISchedDBAddRecord(sqlite3 *db, const TAVI_SCHED_TASK *pTask, int32_t *pStatusId) {
@@ -303,4 +381,17 @@ int TAVISchedDBIsAppRunning(sqlite3 *db, const char *szApp, TAVI_SCHED_STATUS *p
                                "status_code=%d;",
                                szApp, SCHED_STATUS_CODE_RUNNING),
                         readLiveRow, pStatus);
+}
+
+int TAVISchedDBListStatus(sqlite3 *db, int32_t taskId, TAVI_SCHED_STATUS_READER reader,
+                          void *pContext) {
+    SCHED_REQUIRE(db, "((void *)0) != db", -1);
+    SCHED_REQUIRE(reader, "NULL != reader", -1);
+    return list(db, taskId, {.reader = reader, .context = pContext, .lastOnly = false});
+}
+
+int TAVISchedDBListLastStatus(sqlite3 *db, TAVI_SCHED_STATUS_READER reader, void *pContext) {
+    SCHED_REQUIRE(db, "((void *)0) != db", -1);
+    SCHED_REQUIRE(reader, "NULL != reader", -1);
+    return list(db, -1, {.reader = reader, .context = pContext, .lastOnly = true});
 }

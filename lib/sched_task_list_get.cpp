@@ -31,6 +31,25 @@ int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) 
     return total;
 }
 
+int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
+    SCHED_REQUIRE(pTaskList, "((void *)0) != pTaskList", -1);
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    const auto row = sched::findBackend(backend, &TAVI_SCHED_BACKEND_RECORD::list_get);
+    if (!row) {
+        SCHED_LOG("No %s backend (%ld) is found", "list_get", static_cast<long>(backend));
+        sched::setNoBackend(SCHED_SITE);
+        return -1;
+    }
+    sched::TaskList tasks;
+    const int count = SchedBackends[*row].list_get(tasks.address(), filter);
+    if (count > 0) {
+        *pTaskList = tasks.release();
+    }
+    return count;
+}
+
 TAVI_SCHED_TASK *TAVISchedTaskNext(const TAVI_SCHED_TASK *pTask) {
     return pTask ? pTask->next : nullptr;
 }

@@ -1,11 +1,13 @@
 // Running a stored task. The caller's process decides whether it is due; a detached child waits
 // until nothing conflicts, records the run, executes the command as the task's owner and stores how
 // it ended. The lock covers the check for conflicts and the recording only, never the execution.
+#include "base/descriptor.h"
 #include "platc.h"
 #include "sched_backend.h"
 #include "sched_calendar.h"
 #include "sched_error.h"
 #include "sched_handle.h"
+#include "sched_paths.h"
 #include "sched_shared_file.h"
 #include "tavischeduler.h"
 #include "tavisdk.h"
@@ -15,14 +17,13 @@
 #include <cstdlib>
 #include <grp.h>
 #include <sys/file.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 FILE *pfLock = nullptr;
 
 namespace {
 
-constexpr const char *kLockFolder = "/tmp/lock";
-constexpr const char *kLockFile = "/tmp/lock/lock_sched_run";
 constexpr int kLockTries = 101;
 constexpr useconds_t kLockPause = 50000; // microseconds
 constexpr int kMaxWaits = 20;
@@ -88,7 +89,8 @@ int releaseLock() {
 
 // Waits as long as another runner holds the lock.
 bool takeLock() {
-    if (sched::claimSharedFolder(kLockFolder) != 0 || sched::claimSharedFile(kLockFile) != 0) {
+    if (sched::claimSharedFolder(sched::kRunLockFolder) != 0 ||
+        sched::claimSharedFile(sched::kRunLock) != 0) {
         return false;
     }
     for (int tries = 0; tries < kLockTries; ++tries) {
@@ -98,7 +100,7 @@ bool takeLock() {
         if (tries > 0) {
             usleep(kLockPause);
         }
-        sched::File file(std::fopen(kLockFile, "re"));
+        sched::File file(std::fopen(sched::kRunLock, "re"));
         if (file && flock(fileno(file.get()), LOCK_EX) == 0) {
             pfLock = file.release();
             return true;
@@ -122,7 +124,7 @@ bool switchTo(const TAVIUSER &user, uid_t uid) {
         switched = false;
     }
     if (initgroups(user.szName, user.gid) != 0) {
-        SCHED_LOG("Failed to initgroups: [%u] %m", uid); // the user's id, as it has always been
+        SCHED_LOG("Failed to initgroups: [%u] %m", uid); // scripts look for the user's id here
         switched = false;
     }
     if (seteuid(uid) != 0) {
@@ -320,9 +322,77 @@ class TaskRun {
     _exit(0);
 }
 
-} // namespace
+// ---- Following the child ----
 
-int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly) {
+struct Followed {
+    int32_t &pid;
+    int &end;
+};
+
+// A connection between the caller's process and the child: it carries the child's process id, and
+// it ends with the child, as nobody else has that side of it.
+class Connection {
+  public:
+    bool make() {
+        std::array<int, 2> ends{};
+        if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()) != 0) {
+            return false;
+        }
+        callers_ = base::Descriptor(ends[0]);
+        childs_ = base::Descriptor(ends[1]);
+        return true;
+    }
+    // In the child, for as long as it lives. A caller that is gone by now is no reason to end.
+    void tellPid() {
+        const int32_t pid = getpid();
+        send(childs_.release(), &pid, sizeof pid, MSG_NOSIGNAL);
+        callers_.close();
+    }
+    // In the caller's process. A child that was killed at once tells nothing.
+    void takePid(const Followed &followed) {
+        childs_.close();
+        if (recv(callers_.get(), &followed.pid, sizeof followed.pid, MSG_WAITALL) !=
+            sizeof followed.pid) {
+            followed.pid = -1;
+        }
+        followed.end = callers_.release();
+    }
+
+  private:
+    base::Descriptor callers_;
+    base::Descriptor childs_;
+};
+
+int failToRun(int32_t id) {
+    SCHED_LOG("run task failed. [%ld] [0x%04X %s:%d]", static_cast<long>(id), SCHED_LAST_ERROR);
+    return -1;
+}
+
+int startChild(int32_t id, TAVI_SCHED_TASK &task, const Followed *followed) {
+    Connection connection;
+    if (followed && !connection.make()) {
+        SCHED_LOG("socketpair failed. %m");
+        SCHED_SET_ERROR(sched::kSystemCallFailed);
+        return failToRun(id);
+    }
+    switch (PLATCProcForkChildNoWait()) {
+    case 1:
+        if (followed) {
+            connection.takePid(*followed);
+        }
+        return 0;
+    case 0:
+        if (followed) {
+            connection.tellPid();
+        }
+        runInChild(task);
+    default:
+        SCHED_LOG("Fork error! [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return failToRun(id);
+    }
+}
+
+int runTask(int32_t id, int32_t mode, int32_t enabledOnly, const Followed *followed) {
     TAVI_SCHED_TASK task{};
     if (TAVISchedTaskGetByID(id, &task) < 0) {
         SCHED_LOG("get task failed. [%ld] [0x%04X %s:%d]", static_cast<long>(id), SCHED_LAST_ERROR);
@@ -344,14 +414,21 @@ int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly) {
     if (due != 1) {
         return due;
     }
-    switch (PLATCProcForkChildNoWait()) {
-    case 1:
-        return 0;
-    case 0:
-        runInChild(task);
-    default:
-        SCHED_LOG("Fork error! [0x%04X %s:%d]", SCHED_LAST_ERROR);
-        SCHED_LOG("run task failed. [%ld] [0x%04X %s:%d]", static_cast<long>(id), SCHED_LAST_ERROR);
-        return -1;
-    }
+    return startChild(id, task, followed);
+}
+
+} // namespace
+
+int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly) {
+    return runTask(id, mode, enabledOnly, nullptr);
+}
+
+int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly, int32_t *pPid,
+                             int *pEnd) {
+    SCHED_REQUIRE(pPid, "((void *)0) != pPid", -1);
+    SCHED_REQUIRE(pEnd, "NULL != pEnd", -1);
+    *pPid = -1;
+    *pEnd = -1;
+    const Followed followed{.pid = *pPid, .end = *pEnd};
+    return runTask(id, mode, enabledOnly, &followed);
 }

@@ -98,6 +98,88 @@ TEST_F(Convert, BadValuesAreReported) {
     }
 }
 
+// The conversion itself is the judge: a form without a fault comes back as it was, one that cannot
+// be read has a fault that says so.
+TEST_F(Convert, ChecksForeseeWhatComesBack) {
+    const auto repeated = [](const char *text, int count) {
+        std::string result = "cmd=";
+        while (count-- > 0) {
+            result += text;
+        }
+        return result + ";";
+    };
+    constexpr int Value = TAVI_SCHED_FAULT_VALUE;
+    constexpr int Unreadable = TAVI_SCHED_FAULT_UNREADABLE;
+    const struct {
+        std::string pairs;
+        int kind;
+        const char *key, *reason;
+    } kCases[] = {
+        {"", 0, "", ""},
+        {"id=-2147483648;owner=4294967295;state=NotExisted;app args=\x1b;", 0, "", ""},
+        {"id=007;", Value, "id", "\"007\" would be stored as \"7\""},
+        {"id=-0;", Value, "id", "\"-0\" would be stored as \"0\""},
+        {"id=99999999999;", Value, "id", "would be stored as \"2147483647\""},
+        {"listable=x;", Value, "listable", "\"x\" would be stored as \"0\""},
+        {"owner=-1;", Value, "owner", "\"-1\" would be stored as \"4294967295\""},
+        {"owner=\x1b[2J\xff\u202e;", Unreadable, "owner",
+         "\"\uFFFD[2J\uFFFD\uFFFD\" is no number that can be stored"},
+        {"run min= 5;", Value, "run min", "\" 5\" would be stored as \"5\""},
+        {"type=Daily;", Value, "type",
+         "\"Daily\" would be stored as \"daily\"; accepted: once, daily, weekly, monthly, yearly"},
+        {"state=on;", Value, "state", "stored as \"enabled\"; accepted: disabled, enabled"},
+        {"week=12345678;", Value, "week", "8 bytes; accepted: at most 7"},
+        {"name=a\nb;", Value, "name", "it holds a line break"},
+        {repeated("eHh4", 4095), 0, "", ""},
+        {repeated("eHh4", 4096), Unreadable, "cmd",
+         "\"eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4…\" is not the base64 text "
+         "of a command of at most 12285 bytes"},
+        {"cmd=dHJ1ZQ=;", Unreadable, "cmd", "\"dHJ1ZQ=\" is not the base64"},
+        {"cmd=YQBi;", Value, "cmd", "\"YQBi\" is not the base64"},
+        {"typ=x;", TAVI_SCHED_FAULT_UNKNOWN_KEY, "typ", "no task has it; accepted: id, can edit"},
+        {"backend=x;", TAVI_SCHED_FAULT_UNKNOWN_KEY, "backend", "no task has it"},
+    };
+    for (const auto &c : kCases) {
+        SCOPED_TRACE(c.pairs.substr(0, 80));
+        PLATCHashRemoveAll(hash_);
+        setRequired();
+        set("type=daily;" + c.pairs);
+        TAVI_SCHED_FAULT faults[2] = {};
+        EXPECT_EQ(TAVISchedHashCheck(hash_, faults, 2), c.kind == 0 ? 0 : 1);
+        EXPECT_EQ(faults[0].kind, c.kind);
+        EXPECT_STREQ(faults[0].key, c.key);
+        EXPECT_THAT(faults[0].reason, HasSubstr(c.reason));
+        const std::string key = c.pairs.substr(0, c.pairs.find('='));
+        const std::string value = values({key.c_str()});
+        TAVI_SCHED_FAULT fault{};
+        EXPECT_EQ(
+            TAVISchedValueCheck(key.c_str(), value.substr(0, value.size() - 1).c_str(), &fault),
+            c.kind == 0 && !key.empty() ? 0 : 1);
+        EXPECT_TRUE(key.empty() || std::string(fault.reason) == faults[0].reason);
+        EXPECT_THAT(logs(), IsEmpty());
+
+        Task task = newTask();
+        EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, task.get()), c.kind == Unreadable ? -1 : 0);
+        EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, task.get()), 0);
+        EXPECT_TRUE((values({key.c_str()}) == value) == (c.kind == 0) || key.empty());
+        logs();
+    }
+    PLATCHashRemoveAll(hash_);
+    set("id=x;zz=;aa=;");
+    TAVI_SCHED_FAULT faults[12] = {};
+    faults[3].kind = -1;
+    EXPECT_EQ(TAVISchedHashCheck(hash_, faults, 3), 12);
+    EXPECT_EQ(faults[3].kind, -1); // there was no room for it
+    EXPECT_EQ(TAVISchedHashCheck(hash_, faults, 12), 12);
+    EXPECT_STREQ(faults[1].key, "run hour");
+    EXPECT_EQ(faults[1].kind, TAVI_SCHED_FAULT_MISSING);
+    EXPECT_STREQ(faults[10].key, "aa");
+    EXPECT_EQ(TAVISchedHashCheck(hash_, nullptr, 0), 12);
+    EXPECT_EQ(failure(TAVISchedHashCheck(hash_, nullptr, 1)), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedHashCheck(nullptr, nullptr, 0)), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedValueCheck("id", nullptr, faults)), 0x0D00U);
+}
+
 class Sort : public SchedTest {
   protected:
     // Sorts three tasks that lie in memory in this order, listed back to front; their names.

@@ -68,11 +68,16 @@ TEST_F(Json, BadTextsStoreNothing) {
         EXPECT_EQ(TAVISchedTaskSaveFromJson(json.c_str(), 1), -1);
         EXPECT_EQ(lastLog(), "sched_task_save_from_json_string.cpp:* " + message);
     };
-    for (const std::string &json :
-         std::vector<std::string>{"[]", "\"x\"", "null", "{\"id\":", "{\"id\":7}", "{\"id\":{}}",
-                                  "{\"id\":\"[1]\"}", "{\"i\\u0000d\":\"7\"}", deep,
-                                  "{\"id\":\"" + deep + "\"}", std::string(10 << 20, '!')}) {
-        expectRefused(json, "parse json failed, szJson=" + json.substr(0, 4096));
+    const auto shown = [](const std::string &text) { // whole up to 64 KiB
+        const size_t more = text.size() - std::min<size_t>(text.size(), 65536);
+        return text.substr(0, 65536) +
+               (more > 0 ? " [... " + std::to_string(more) + " bytes more]" : "");
+    };
+    for (const std::string &json : std::vector<std::string>{
+             "[]", "\"x\"", "null", "{\"id\":", "{\"id\":7}", "{\"id\":{}}", "{\"id\":\"[1]\"}",
+             "{\"i\\u0000d\":\"7\"}", deep, deep.substr(0, 65536), "{\"id\":\"" + deep + "\"}",
+             std::string(10 << 20, '!')}) {
+        expectRefused(json, "parse json failed, szJson=" + shown(json));
     }
     expectRefused("", "Bad parameter");
     expectRefused(replaced(good, "\"cmd\"", "\"cmx\""), "hash to task failed, task id=1");

@@ -92,7 +92,7 @@ expect_only_cron_missing
 
 step "programs built over the installed package"
 # shellcheck disable=SC2046 # a list of words
-quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler sqlite3)
+quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler)
 quietly cmake -S "$source/examples" -B /mnt/example
 quietly cmake --build /mnt/example
 

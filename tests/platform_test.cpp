@@ -1,7 +1,14 @@
 // The portable platform where the library's own tests do not reach.
 #include "support.h"
+#include "tavisdk.h"
 
+#include <algorithm>
+#include <chrono>
 #include <csignal>
+#include <fcntl.h>
+#include <filesystem>
+#include <malloc.h>
+#include <regex>
 
 namespace {
 
@@ -67,6 +74,206 @@ TEST_F(Platform, SectionFilesKeepWhatTheyDoNotChange) {
     EXPECT_EQ(readFile("/etc/f"), "[2] \r\nk=2\n[3\nk=3\n");
 }
 
+// Small requests look through a window over the file, further ones at what is remembered of it.
+TEST_F(Platform, SectionsAreFoundWhereverTheyLie) {
+    const Texts expected = {{"b", "1:mid"}, {"c", "0:"}, {"d", "1:end"}, {"a", "1:0"}, {"e", "0:"}};
+    for (size_t filler = 65536 - 24; filler < 65536 + 8; ++filler) {
+        for (const std::string &rest : {std::string(), std::string(200000, 'y')}) {
+            writeFile("/etc/f", "[a]\nk=0\nx=" + std::string(filler, '[') + "\n[b] \nk=mid\n" +
+                                    rest + "\n[c]x\n[b]\nk=twice\n[d]\nk=end");
+            shell("sleep 0.005");
+            for (const auto &[name, value] : expected) {
+                EXPECT_EQ(sectionOf("/etc/f", name), value) << name << " " << filler;
+            }
+        }
+    }
+}
+
+TEST_F(Platform, APassOverAllSectionsIsLinearAndLeavesNoMemory) {
+    constexpr int kSections = 4000;
+    std::string text;
+    for (int i = 0; i < kSections; ++i) {
+        text += "[" + std::to_string(i) + "]\nk=" + std::string(1000, 'x') + "\n";
+    }
+    writeFile("/etc/f", text);
+    shell("sleep 0.02");
+    const auto inUse = [] { return mallinfo2().uordblks + mallinfo2().hblkhd; };
+    const auto timeOf = [](auto &&function) {
+        const auto begin = std::chrono::steady_clock::now();
+        function();
+        return std::chrono::steady_clock::now() - begin;
+    };
+    PLATCSZLIST *names = PLATCSzListAlloc(1);
+    const auto once = timeOf([&] { PLATCFileCheckSections("/etc/f", &names); });
+    const size_t before = inUse();
+    const auto pass = timeOf([&] {
+        for (int i = 0; i < kSections; ++i) {
+            sectionOf("/etc/f", std::to_string(i));
+        }
+    });
+    EXPECT_LT(pass / once, 200);
+    EXPECT_EQ(PLATCFileEnumSection("/etc/f", &names), kSections);
+    sectionOf("/etc/f", std::to_string(kSections - 1));
+    PLATCSzListFree(names);
+    EXPECT_LT(inUse(), before + text.size() / 2);
+}
+
+TEST_F(Platform, SeveralSectionsChangeInOneWrite) {
+    PLATCSZHASH *hash = PLATCSzHashAlloc(1);
+    PLATCSzHashSetValue(&hash, "k", "new");
+    using Changes = std::vector<std::pair<const char *, const PLATCSZHASH *>>;
+    const auto edit = [](const char *path, const Changes &changes) {
+        std::vector<const char *> names;
+        std::vector<const PLATCSZHASH *> hashes;
+        for (const auto &[name, pairs] : changes) {
+            names.push_back(name);
+            hashes.push_back(pairs);
+        }
+        return PLATCFileEditSections(path, static_cast<int>(changes.size()), names.data(),
+                                     hashes.data());
+    };
+    const std::string old = "head\n[a]\nk=1\n[b]\nk=2\n[x\nk=3\n[a]\nk=4\n[c]\nk=5";
+    const struct {
+        Changes changes;
+        std::string expected;
+    } cases[] = {
+        {{}, old},
+        {{{"z", hash}, {"b", hash}, {"y", hash}, {"none", nullptr}},
+         "head\n[a]\nk=1\n[b]\nk=new\n[x\nk=3\n[a]\nk=4\n[c]\nk=5\n[z]\nk=new\n[y]\nk=new\n"},
+        {{{"a", nullptr}, {"c", nullptr}}, "head\n[b]\nk=2\n[x\nk=3\n"},
+        {{{"a", hash}, {"c", hash}, {"c", nullptr}}, "head\n[a]\nk=new\n[b]\nk=2\n[x\nk=3\n"},
+    };
+    for (const auto &[changes, expected] : cases) {
+        writeFile("/etc/f", old);
+        EXPECT_EQ(edit("/etc/f", changes), 0);
+        EXPECT_EQ(readFile("/etc/f"), expected);
+    }
+    EXPECT_EQ(edit("/etc/new", {{"b", hash}, {"a", hash}, {"c", nullptr}}), 0);
+    EXPECT_EQ(readFile("/etc/new"), "[b]\nk=new\n[a]\nk=new\n");
+    EXPECT_EQ(statusOf("/etc/new").st_mode & 07777, 0600U);
+    // All or nothing.
+    EXPECT_EQ(failure(edit("/etc/new", {{"d", hash}, {"e]", hash}})), 0x0D00U);
+    EXPECT_EQ(failure(edit("/etc/new", {{"d", hash}, {nullptr, nullptr}})), 0x0D00U);
+    EXPECT_EQ(readFile("/etc/new"), "[b]\nk=new\n[a]\nk=new\n");
+    symlink("/etc/loop", "/etc/loop"); // not missing, but not to be looked at
+    symlink("/etc/none", "/tmp/f");    // somebody's, in a shared folder
+    EXPECT_EQ(failure(edit("/etc/loop", {{"d", hash}})), 0x2700U);
+    EXPECT_EQ(failure(PLATCFileAddSection("/etc/loop", "d", hash)), 0x2700U);
+    EXPECT_EQ(failure(edit("/tmp/f", {{"d", hash}})), 0x0900U);
+    EXPECT_TRUE(S_ISLNK(statusOf("/etc/loop").st_mode) && S_ISLNK(statusOf("/tmp/f").st_mode));
+    PLATCSzHashFree(hash);
+}
+
+TEST_F(Platform, WhatAHandSpoiltInASectionFileIsTold) {
+    const Texts cases = {
+        {"", ""},
+        {"junk\n[a] \t\r\nk=[b\n [c\n[]\n[d]", ""},
+        {"[a]\n[b\n[\n[a]x\nk=1\n[a]\n\n[a]\n[b]",
+         "line 2: damaged header: [b|line 3: damaged header: [|line 4: damaged header: [a]x|"
+         "line 6: section [a] stands more than once|line 8: section [a] stands more than once|"},
+    };
+    PLATCSZLIST *faults = PLATCSzListAlloc(1);
+    for (const auto &[text, expected] : cases) {
+        writeFile("/etc/f", text);
+        std::string told;
+        const int count = PLATCFileCheckSections("/etc/f", &faults);
+        for (int i = 0; i < count; ++i) {
+            told += PLATCSzListGet(faults, i) + std::string("|");
+        }
+        EXPECT_EQ(told, expected);
+        EXPECT_EQ(count, std::count(told.begin(), told.end(), '|'));
+    }
+    EXPECT_EQ(failure(PLATCFileCheckSections("/etc/none", &faults)), 0x0900U);
+    PLATCSzListFree(faults);
+}
+
+// The names of what lies beside a file, with its temporary files.
+std::string beside(const std::string &path) {
+    std::string names;
+    const std::filesystem::path file(path);
+    for (const auto &entry : std::filesystem::directory_iterator(file.parent_path())) {
+        const std::string name = entry.path().filename();
+        names += name.starts_with(file.filename().string() + ".") ? name + " " : "";
+    }
+    return names;
+}
+
+// A change that is answered with success outlives a loss of power; what a restart empties needs no
+// flush.
+TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
+    TAVIAUTOPOWER entry{};
+    TAVISCHEDULE schedule{};
+    schedule.weekBits = 1;
+    schedule.szCommand[0] = 'x';
+    const auto write = [&](const std::string &path) {
+        return path == "/etc/crontab" ? TAVIScheduleSet(&schedule, 1)
+               : path == "/usr/tavi/etc/auto_power"
+                   ? TAVIAutoPowerConfSet(0, 1, &entry)
+                   : PLATCFileEditSections(path.c_str(), 0, nullptr, nullptr);
+    };
+    const std::string own = "." + std::to_string(getpid()) + "\\.\\w{6}";
+    const auto calls = [&] {
+        std::string all;
+        for (const std::string &call : fileCalls()) {
+            all += std::regex_replace(call, std::regex("\\" + own), ".TMP") + "|";
+        }
+        return all;
+    };
+    for (const std::string path : {"/etc/crontab", "/usr/tavi/etc/auto_power"}) {
+        const std::string folder = path.substr(0, path.rfind('/'));
+        calls();
+        EXPECT_EQ(write(path), 0);
+        EXPECT_EQ(calls(), "fsync " + path + ".TMP|rename " + path + ".TMP " + path + "|fsync " +
+                               folder + "|");
+        const struct {
+            bool Fakes::*fails;
+            unsigned int code;
+            bool isOld;
+        } cases[] = {{&Fakes::fsyncFails, 0x0B00, true},
+                     {&Fakes::renameFails, 0x2800, true},
+                     {&Fakes::folderFsyncFails, 0x0B00, false}};
+        for (const auto &row : cases) {
+            const std::string old = readFile(path);
+            entry.minute++;
+            schedule.minute++;
+            fakes.*row.fails = true;
+            EXPECT_EQ(failure(write(path)), row.code);
+            fakes = {};
+            EXPECT_EQ(readFile(path) == old, row.isOld) << row.code;
+            EXPECT_EQ(beside(path), "");
+        }
+    }
+    calls();
+    EXPECT_EQ(write("/tmp/f"), 0);
+    EXPECT_EQ(calls(), "rename /tmp/f.TMP /tmp/f|");
+}
+
+TEST_F(Platform, WritersRemoveWhatDeadOnesLeft) {
+    const pid_t child = fork();
+    if (child == 0) {
+        _exit(0);
+    }
+    siginfo_t info{};
+    waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT); // a zombie writes no more
+    const std::string dead = "." + std::to_string(child);
+    for (const char *const path : {"/etc/left", "/tmp/left"}) {
+        for (const std::string &name :
+             {dead + ".aB3dEf", dead + ".five5", dead + ".seven77", dead + ".a-b-c-", dead,
+              "." + std::to_string(getpid()) + ".mine11", std::string(".1.init11"),
+              std::string(".bak.savedd"), "h" + dead + ".aB3dEf"}) {
+            writeFile(path + name, "");
+        }
+        EXPECT_EQ(PLATCFileEditSections(path, 0, nullptr, nullptr), 0);
+        const bool wentThere = access((path + dead + ".aB3dEf").c_str(), F_OK) != 0;
+        EXPECT_EQ(wentThere, std::string("/etc/left") == path);
+        EXPECT_EQ(shell("test $(ls -d " + std::string(path) + ".* " + path +
+                        "h.* | wc -l) = " + (wentThere ? "8" : "9")),
+                  0);
+        shell(std::string("rm -f ") + path + "*");
+    }
+    waitpid(child, nullptr, 0);
+}
+
 TEST_F(Platform, ProgramsAndProcesses) {
     for (auto *action : {SIG_IGN, SIG_DFL}) {
         signal(SIGCHLD, action);
@@ -75,6 +282,21 @@ TEST_F(Platform, ProgramsAndProcesses) {
         EXPECT_EQ(PLATCExec("/bin/true", arguments + 2), 0);
         EXPECT_EQ(failure(PLATCExec("/no/such/program", arguments + 2)), 0x2A00U);
     }
+    // Nothing that the caller is sent is eaten.
+    int input[2];
+    ASSERT_EQ(pipe2(input, O_NONBLOCK), 0);
+    const int own = dup(0);
+    dup2(input[0], 0);
+    EXPECT_EQ(::write(input[1], "line\n", 5), 5);
+    const char *const reads[] = {"-c", "read line && exit 4; exit 5", nullptr};
+    EXPECT_EQ(PLATCExec("/bin/sh", reads), 5);
+    dup2(own, 0);
+    char line[8];
+    EXPECT_EQ(::read(input[0], line, sizeof line), 5);
+    for (const int end : {input[0], input[1], own}) {
+        close(end);
+    }
+
     const pid_t child = fork();
     if (child == 0) {
         _exit(0);

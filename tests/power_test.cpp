@@ -134,6 +134,25 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     }
 }
 
+// No configuration and no cron is one thing; not being able to tell is another.
+TEST_F(Power, WhatCannotBeLookedAtIsNotTakenForMissing) {
+    TAVIAUTOPOWER entry{1, 127, 7, 30};
+    for (const int kind : {TAVI_AUTOPOWER_KIND_ON, TAVI_AUTOPOWER_KIND_OFF}) {
+        EXPECT_EQ(TAVIAutoPowerConfGet(kind, 1, &entry), 0);
+    }
+    EXPECT_EQ(TAVIUpdateCrontab("true", 1, 1), 0);
+    for (const char *const path : {kConfiguration, "/var/run/crond.pid"}) {
+        EXPECT_EQ(symlink(path, path), 0); // a loop
+    }
+    EXPECT_EQ(failure(TAVIAutoPowerConfGet(TAVI_AUTOPOWER_KIND_ON, 1, &entry)), 0x2700U);
+    EXPECT_EQ(failure(TAVIAutoPowerConfSet(TAVI_AUTOPOWER_KIND_ON, 1, &entry)), 0x2700U);
+    EXPECT_EQ(failure(TAVIAutoPoweronSet()), 0x2700U);
+    EXPECT_TRUE(S_ISLNK(statusOf(kConfiguration).st_mode));
+    EXPECT_EQ(failure(TAVIUpdateCrontab("true", 0, 1)), 0x2700U);
+    EXPECT_THAT(lastLog(), HasSubstr("cron cannot be told: /var/run/crond.pid cannot be read"));
+    EXPECT_EQ(readFile(kCrontab), kForeignCrontab);
+}
+
 TEST_F(Power, SchedulesAreWholeLinesThatCronTakes) {
     TAVISCHEDULE schedule{};
     schedule.weekBits = 127;

@@ -5,6 +5,7 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <sys/file.h>
+#include <sys/socket.h>
 
 namespace {
 
@@ -177,7 +178,7 @@ TEST_F(Run, ConflictingRunsFollowEachOther) {
 
 TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     storedTask();
-    mkdir("/tmp/lock", 0755);
+    shell("mkdir -m 1777 /tmp/lock"); // root's own, but anybody's to write: it is set right
     const int other = open("/tmp/lock/lock_sched_run", O_CREAT | O_RDWR, 0600);
     flock(other, LOCK_EX);
     EXPECT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
@@ -186,7 +187,27 @@ TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     flock(other, LOCK_UN);
     waitForChildren();
     EXPECT_EQ(rows(), "1:3: ");
+    EXPECT_EQ(statusOf("/tmp/lock").st_mode, S_IFDIR | 0755U);
     close(other);
+}
+
+TEST_F(Run, FollowedToItsEnd) {
+    Task task = storedTask("read line < /tmp/fifo");
+    mkfifo("/tmp/fifo", 0600);
+    int32_t pid = 0;
+    int end = 0;
+    EXPECT_EQ(TAVISchedTaskRunFollowed(1, 2, 0, &pid, &end), 0); // skipped
+    EXPECT_EQ(pid * 10 + end, -11);
+    EXPECT_EQ(TAVISchedTaskRunFollowed(1, 0, 0, &pid, &end), 0);
+    const int fifo = open("/tmp/fifo", O_WRONLY); // the command runs
+    EXPECT_EQ(query("SELECT pid, status_code FROM task_status"), std::to_string(pid) + " 2 ");
+    char byte = 0;
+    EXPECT_EQ(recv(end, &byte, 1, MSG_DONTWAIT), -1);
+    close(fifo);
+    EXPECT_EQ(read(end, &byte, 1), 0);
+    EXPECT_EQ(rows(), "1:7:1 ");
+    close(end);
+    waitForChildren();
 }
 
 TEST_F(Run, GivesUpSilentlyAfterTwentyWaits) {

@@ -97,6 +97,66 @@ TEST_F(StatusDatabase, DeadRunnersAreInterruptedAndNoConflict) {
     EXPECT_EQ(status.found * 10 + status.statusId, 12);
 }
 
+// Takes rows down as "status:task:time:code:comment"; ends the list after `most` rows.
+struct Taken {
+    size_t most = 100;
+    std::vector<std::string> rows;
+
+    static int take(void *context, const TAVI_SCHED_STATUS *row) {
+        auto &self = *static_cast<Taken *>(context);
+        self.rows.push_back(std::to_string(row->statusId) + ":" + std::to_string(row->taskId) +
+                            ":" + std::to_string(row->timestamp) + ":" +
+                            std::to_string(row->statusCode) + ":" + row->comment);
+        return self.rows.size() == self.most;
+    }
+};
+
+TEST_F(StatusDatabase, ListsOfRuns) {
+    query("INSERT INTO task_status (pid, timestamp, task_id, status_code, comment) VALUES "
+          "(999999999, 30, 6, 2, NULL), (1, 20, 5, 7, '3'), (1, 20, 5, 3, ''), (" +
+          std::to_string(getpid()) + ", 40, 5, 2, NULL), (1, 10, 6, 6, '9')");
+    const std::string gone = "1:6:30:1:", running = "4:5:40:2:";
+    Taken all, one, last, first{1, {}}, none;
+    EXPECT_EQ(TAVISchedDBListStatus(db_, -1, Taken::take, &all), 5);
+    EXPECT_THAT(all.rows, ElementsAre(running, gone, "3:5:20:3:", "2:5:20:7:3", "5:6:10:6:9"));
+    EXPECT_EQ(TAVISchedDBListStatus(db_, 6, Taken::take, &one), 2);
+    EXPECT_THAT(one.rows, ElementsAre(gone, "5:6:10:6:9"));
+    EXPECT_EQ(TAVISchedDBListLastStatus(db_, Taken::take, &last), 2);
+    EXPECT_THAT(last.rows, ElementsAre(running, gone));
+    EXPECT_EQ(TAVISchedDBListStatus(db_, -1, Taken::take, &first), 1);
+    EXPECT_THAT(first.rows, ElementsAre(running));
+    EXPECT_EQ(TAVISchedDBListStatus(db_, 7, Taken::take, &none), 0);
+    EXPECT_THAT(logs(), IsEmpty());
+}
+
+TEST_F(StatusDatabase, ReadersMakeNothingAndBelieveNoOther) {
+    const struct {
+        const char *found;
+        int result;
+    } cases[] = {{":", 0},
+                 {"touch $d", 0}, // the first runner is about to fill it
+                 {"ln -s /tmp/other $d", -1},
+                 {"cp other $d; chmod 666 $d", -1},
+                 {"cp other $d; ln -s victim $d-journal", 1}};
+    EXPECT_EQ(TAVISchedDBClose(db_), 0);
+    shell("mv /tmp/sched_status.sqlite /tmp/other; echo safe > /tmp/victim");
+    for (const auto &[found, result] : cases) {
+        shell(std::string("cd /tmp; d=sched_status.sqlite; rm -f $d*; ") + found + "; ls > before");
+        EXPECT_EQ(TAVISchedDBOpenForReading(&db_), result) << found;
+        if (result == 1) {
+            EXPECT_EQ(TAVISchedDBListStatus(db_, -1, Taken::take, nullptr), 0);
+            EXPECT_EQ(TAVISchedDBClose(db_), 0);
+            EXPECT_EQ(readFile("/tmp/victim"), "safe\n");
+            EXPECT_EQ(statusOf("/tmp/sched_status.sqlite-journal").st_mode, S_IFREG | 0600U);
+        } else {
+            EXPECT_EQ(shell("cd /tmp; ls | cmp - before"), 0) << found;
+        }
+    }
+    EXPECT_THAT(logs(), ElementsAre(HasSubstr("Can't open database: it is a link\n"),
+                                    HasSubstr("Can't open database: everybody may write it\n")));
+    db_ = nullptr;
+}
+
 TEST_F(StatusDatabase, ALockIsWaitedForAHundredTimes) {
     sqlite3 *other = nullptr;
     sqlite3_open(kDatabase, &other);
@@ -150,6 +210,7 @@ TEST_F(StatusDatabase, WhatOthersPutThereIsNotFollowed) {
 TEST_F(StatusDatabase, ManyMayOpenItFirst) {
     sqlite3_close(db_);
     db_ = nullptr;
+    fakes.pauseMicroseconds = 10000; // a process that is not on the CPU holds its lock for longer
     for (int round = 0; round < 20; ++round) {
         shell("rm -f /tmp/sched_status.sqlite*");
         for (int i = 0; i < 8; ++i) {

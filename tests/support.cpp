@@ -16,6 +16,7 @@
 #include <sys/mman.h>
 #include <sys/prctl.h>
 #include <syslog.h>
+#include <utility>
 
 namespace support {
 
@@ -40,6 +41,8 @@ Journal &journal() {
 template <typename Function> Function next(const char *name) {
     return reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
 }
+
+std::vector<std::string> calledOnFiles;
 
 void recordPause(long microseconds) {
     journal().pauses[journal().pauseCount++ % 4096] = microseconds;
@@ -68,6 +71,10 @@ std::string lastLog(bool stable) {
 std::vector<long> pauses() {
     const size_t count = std::min<size_t>(journal().pauseCount.exchange(0), 4096);
     return {journal().pauses, journal().pauses + count};
+}
+
+std::vector<std::string> fileCalls() {
+    return std::exchange(calledOnFiles, {});
 }
 
 std::string readFile(const std::string &path) {
@@ -166,6 +173,7 @@ void SchedTest::SetUp() {
     // Never across a mount point: a checkout below /tmp is there, as it is on the machine.
     shell("find /tmp /usr/tavi/etc /run -xdev -mindepth 1 -delete 2>/dev/null");
     writeFile(kCrontab, kForeignCrontab);
+    symlink(RUNNER, "/tmp/tavischedtask");
     setenv("TZ", "UTC", 1);
     logs();
     pauses();
@@ -193,7 +201,7 @@ tm *localtime(const time_t *time) noexcept {
 
 void syslog(int priority, const char *format, ...) {
     const int savedErrno = errno; // also for %m
-    char line[16384] = "wrong priority";
+    char line[80000] = "wrong priority";
     if (priority == LOG_ERR) {
         va_list arguments;
         va_start(arguments, format);
@@ -233,13 +241,18 @@ void *calloc(size_t count, size_t size) noexcept {
 
 int rename(const char *from, const char *to) noexcept {
     auto *const real = support::next<int (*)(const char *, const char *)>("rename");
+    support::calledOnFiles.push_back("rename " + std::string(from) + " " + to);
     errno = EXDEV;
     return fakes.renameFails ? -1 : real(from, to);
 }
 
 int fsync(int fd) {
+    const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd));
+    support::calledOnFiles.push_back("fsync " + path.string());
+    const bool fails =
+        fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path));
     errno = EIO;
-    return fakes.fsyncFails ? -1 : support::next<int (*)(int)>("fsync")(fd);
+    return fails ? -1 : support::next<int (*)(int)>("fsync")(fd);
 }
 
 } // extern "C"

@@ -38,6 +38,7 @@ struct Fakes {
     size_t callocFails = 0; // a calloc of at least that many bytes fails; 0 = none
     bool renameFails = false;
     bool fsyncFails = false;
+    bool folderFsyncFails = false;
     long pauseMicroseconds = 0; // how long sleep() and usleep() really last
 };
 extern Fakes fakes;
@@ -49,6 +50,9 @@ std::vector<std::string> logs(bool stable = false);
 std::string lastLog(bool stable = false);
 // The arguments of all calls of sleep() and usleep() since the last call, in microseconds.
 std::vector<long> pauses();
+
+// This process's flushes and renames since the last call: "fsync /etc/f", "rename /etc/f.1 /etc/f".
+std::vector<std::string> fileCalls();
 
 // The error code of a call that failed; 0 for one that did not.
 inline unsigned int failure(int result) {

@@ -2,8 +2,10 @@
 #include "crontab.h"
 #include "base/child.h"
 #include "base/file.h"
+#include "cron/runner.h"
 #include "platc.h"
 #include "sched_error.h"
+#include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
 
@@ -118,6 +120,10 @@ int sched::rewriteCrontab(const RunnerLines &lines) {
     }
     if (S_ISDIR(status.st_mode)) {
         return fail(kOpenFailed, 179);
+    }
+    if (!lines.text.empty()) {
+        const KeptError error;
+        ensureRunner();
     }
     base::Replacement crontab(kCrontab);
     bool endsOpen = false;

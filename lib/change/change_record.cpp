@@ -131,22 +131,6 @@ int removeFile(const char *path) {
 
 // ---- Restoring ----
 
-// A new file in the place of whatever is there, in one step.
-bool replaceWorking(const std::string &content) {
-    const base::PrivateFolder folder(kWorkingCopy);
-    const std::string made = folder.path() + "/file";
-    if (!folder || !base::makeEmpty(made.c_str())) {
-        return false;
-    }
-    struct stat like {};
-    const bool keeps = lstat(kWorkingCopy, &like) == 0 && base::isTrusted(like, base::kSharedFile);
-    base::Descriptor file(open(made.c_str(), O_WRONLY | O_CLOEXEC));
-    return file && base::writeAll(file.get(), content) &&
-           (!keeps || (fchown(file.get(), like.st_uid, like.st_gid) == 0 &&
-                       fchmod(file.get(), like.st_mode & ALLPERMS) == 0)) &&
-           file.close() && base::exchange(made.c_str(), kWorkingCopy);
-}
-
 // For a file system without room for both: what the torn copy took is room too.
 bool overwriteWorking(const std::string &content) {
     base::Descriptor file(
@@ -167,7 +151,7 @@ int restoreWorking(const std::optional<std::string> &content) {
     if (!content) {
         return removeFile(kWorkingCopy);
     }
-    return replaceWorking(*content) || overwriteWorking(*content)
+    return replaceWorkingCopy(*content) || overwriteWorking(*content)
                ? 0
                : fail(kReadWriteFailed, "cannot be restored", kWorkingCopy);
 }
@@ -249,6 +233,21 @@ Record parseRecord(const std::string &text) {
 }
 
 } // namespace
+
+bool replaceWorkingCopy(const std::string &content) {
+    const base::PrivateFolder folder(kWorkingCopy);
+    const std::string made = folder.path() + "/file";
+    if (!folder || !base::makeEmpty(made.c_str())) {
+        return false;
+    }
+    struct stat like {};
+    const bool keeps = lstat(kWorkingCopy, &like) == 0 && base::isTrusted(like, base::kSharedFile);
+    base::Descriptor file(open(made.c_str(), O_WRONLY | O_CLOEXEC));
+    return file && base::writeAll(file.get(), content) &&
+           (!keeps || (fchown(file.get(), like.st_uid, like.st_gid) == 0 &&
+                       fchmod(file.get(), like.st_mode & ALLPERMS) == 0)) &&
+           file.close() && base::exchange(made.c_str(), kWorkingCopy);
+}
 
 RecordState recordState() {
     for (const char *const path : {kRecord, kRestoring}) {

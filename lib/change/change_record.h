@@ -56,6 +56,9 @@ std::optional<Record> readRecord();
 int restoreWhatIsRead(const Record &record);
 int restorePersistent(const Record &record);
 
+// Puts a new working copy in the place of whatever is there, in one step. False with errno set.
+bool replaceWorkingCopy(const std::string &content);
+
 // Whether the record can be read in the place of the working copy.
 bool recordHasTasks();
 

@@ -29,6 +29,9 @@ PLATC_API int PLATPluginSetArgByInt(PLATPLUGIN *pPlugin, const char *szName, int
 /* Runs every handler once for the phase and waits for each. -1 when one could not be started or did
  * not exit with 0; the others have run all the same. No handler is a success. */
 PLATC_API int PLATPluginAction(int phase, PLATPLUGIN *pPlugin);
+/* Empties the list, then lists why handlers of the plug-in are skipped, a text each. Returns their
+ * number, or -1. */
+PLATC_API int PLATPluginCheck(const char *szPlugin, PLATCSZLIST **ppFaults);
 /* Releases the handle and clears it; a handle that is NULL already is a success. */
 PLATC_API int PLATPluginExit(PLATPLUGIN **ppPlugin);
 

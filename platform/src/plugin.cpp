@@ -1,6 +1,7 @@
 // The plug-in mechanism: every handler of a plug-in is started once a phase, with the call's
 // arguments in its environment.
 #include "base/trust.h"
+#include "containers.h"
 #include "platform.h"
 #include "platplugin.h"
 #include "process.h"
@@ -8,6 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <filesystem>
+#include <fstream>
 #include <map>
 #include <memory>
 #include <string>
@@ -162,4 +164,64 @@ int PLATPluginExit(PLATPLUGIN **ppPlugin) {
     delete *ppPlugin;
     *ppPlugin = nullptr;
     return 0;
+}
+
+namespace {
+
+// A file that was meant as a handler begins as a script or a program does.
+bool looksLikeProgram(const std::filesystem::path &path) {
+    std::error_code error;
+    if (!std::filesystem::is_regular_file(path, error)) {
+        return false;
+    }
+    std::ifstream file(path, std::ios::binary);
+    std::string start(4, '\0');
+    file.read(start.data(), static_cast<std::streamsize>(start.size()));
+    return start.starts_with("#!") || start == "\177ELF";
+}
+
+std::string faultOfHandler(const std::filesystem::path &path) {
+    if (isProgram(path)) {
+        return base::look(path.c_str(), base::kRootsFile) == base::Found::Trusted
+                   ? ""
+                   : "it must be a file of root's that nobody else may write";
+    }
+    return looksLikeProgram(path) ? "it is not executable" : "";
+}
+
+int listFaults(const std::filesystem::path &folder, std::vector<std::string> &faults) {
+    switch (base::look(folder.c_str(), base::kRootsFolder)) {
+    case base::Found::Nothing:
+        return 0;
+    case base::Found::Trusted:
+        break;
+    default:
+        faults.push_back("all plug-in handlers are skipped: " + folder.string() +
+                         " must belong to root, and nobody else may write it");
+        return 1;
+    }
+    std::error_code error;
+    std::filesystem::directory_iterator entry(folder, error);
+    for (; !error && entry != std::filesystem::directory_iterator(); entry.increment(error)) {
+        if (const std::string fault = faultOfHandler(entry->path()); !fault.empty()) {
+            faults.push_back("the plug-in handler " + entry->path().string() +
+                             " is skipped: " + fault);
+        }
+    }
+    std::sort(faults.begin(), faults.end());
+    return error ? failToRead(folder, error.message().c_str()) : static_cast<int>(faults.size());
+}
+
+} // namespace
+
+int PLATPluginCheck(const char *szPlugin, PLATCSZLIST **ppFaults) {
+    if (!szPlugin || !ppFaults || !*ppFaults) {
+        return PLATFORM_FAIL(platform::kInvalidArgument);
+    }
+    return platform::guarded(
+        [&] {
+            (*ppFaults)->texts.clear();
+            return listFaults(std::filesystem::path(kPluginRoot) / szPlugin, (*ppFaults)->texts);
+        },
+        -1);
 }

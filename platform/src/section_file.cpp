@@ -225,17 +225,16 @@ struct Remembered {
 
 Remembered remembered;
 
-bool mayServeRemembered(const char *path) {
+// What is remembered of the file, as long as it may be served.
+SectionFile *recall(const char *path) {
     struct stat status {};
-    return remembered.settled && remembered.path == path && stat(path, &status) == 0 &&
-           identityOf(status) == remembered.identity && changeWouldShow(status);
+    const bool serves = remembered.settled && remembered.path == path && stat(path, &status) == 0 &&
+                        identityOf(status) == remembered.identity && changeWouldShow(status);
+    return serves ? remembered.file.get() : nullptr;
 }
 
-// The file as it is now; valid until the next call. Nothing with the error state set.
-SectionFile *load(const char *path) {
-    if (mayServeRemembered(path)) {
-        return remembered.file.get();
-    }
+// The file as it is now, read anew. Nothing with the error state set.
+SectionFile *remember(const char *path) {
     remembered.settled = false;
     struct stat before {};
     const bool settled = stat(path, &before) == 0 && changeWouldShow(before);
@@ -250,6 +249,12 @@ SectionFile *load(const char *path) {
     remembered.identity = identityOf(content->status);
     remembered.settled = settled && identityOf(before) == remembered.identity;
     return remembered.file.get();
+}
+
+// The file as it is now; valid until the next call. Nothing with the error state set.
+SectionFile *load(const char *path) {
+    SectionFile *const recalled = recall(path);
+    return recalled ? recalled : remember(path);
 }
 
 // ---- One section alone ----
@@ -307,14 +312,13 @@ int readSectionAlone(const base::Opened &opened, std::string_view name, PLATCSZH
     return section ? 1 : 0;
 }
 
-int readSectionRemembered(const char *path, std::string_view name, PLATCSZHASH &hash) {
-    SectionFile *const file = load(path);
-    const auto section = file ? file->find(name) : std::nullopt;
+int readSectionOf(SectionFile &file, std::string_view name, PLATCSZHASH &hash) {
+    const auto section = file.find(name);
     if (!section) {
-        return file ? 0 : -1;
+        return 0;
     }
-    readPairs(file->text(), *section, hash);
-    if (!sectionFrom(file->text(), section->end)) {
+    readPairs(file.text(), *section, hash);
+    if (!sectionFrom(file.text(), section->end)) {
         remembered = {}; // a pass over all sections ends here: so does the need for memory
     }
     return 1;
@@ -322,7 +326,7 @@ int readSectionRemembered(const char *path, std::string_view name, PLATCSZHASH &
 
 // ---- Changes ----
 
-// The text for a writer that makes a missing file.
+// The text to be changed by a writer that makes a missing file. Nothing with the error state set.
 std::optional<std::string_view> textToChange(const char *path) {
     const int there = platform::isThere(path);
     const SectionFile *const file = there == 1 ? load(path) : nullptr;
@@ -425,13 +429,15 @@ int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH *
     }
     return guarded(
         [&] {
-            if (!mayServeRemembered(szPath)) {
+            SectionFile *file = recall(szPath);
+            if (!file) {
                 const auto opened = platform::openFile(szPath);
                 if (!opened || !asksForMore(opened->status)) {
                     return opened ? readSectionAlone(*opened, szSection, **ppHash) : -1;
                 }
+                file = remember(szPath);
             }
-            return readSectionRemembered(szPath, szSection, **ppHash);
+            return file ? readSectionOf(*file, szSection, **ppHash) : -1;
         },
         -1);
 }

@@ -5,6 +5,8 @@
 
 #include <array>
 #include <cerrno>
+#include <cstdio>
+#include <cstring>
 #include <ctime>
 #include <fcntl.h>
 #include <optional>
@@ -83,4 +85,14 @@ int TAVIAutoPoweronSet() {
         }
     }
     return platform::guarded([&] { return armClock(wake); }, -1);
+}
+
+int TAVIAutoPoweronCheck(char *szReason, size_t cbReason) {
+    if (access(kWakeAlarm, W_OK) == 0) {
+        return 0;
+    }
+    if (szReason && cbReason > 0) {
+        std::snprintf(szReason, cbReason, "%s: %s", kWakeAlarm, std::strerror(errno));
+    }
+    return -1;
 }

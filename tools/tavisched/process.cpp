@@ -1,36 +1,32 @@
 // What /proc tells of processes.
 #include "process.h"
 
+#include <cstdlib>
 #include <fstream>
-#include <sstream>
+#include <string>
 #include <unistd.h>
 
 namespace tavisched {
 
-Process describe(const std::string &pid) {
+namespace {
+
+// 0 when there is no such process.
+pid_t parentOf(pid_t process) {
     std::string line;
-    std::ifstream file("/proc/" + pid + "/stat");
+    std::ifstream file("/proc/" + std::to_string(process) + "/stat");
     std::getline(file, line);
-    const size_t begin = line.find('(');
-    const size_t end = line.rfind(')');
-    if (begin == std::string::npos || end == std::string::npos) {
-        return {};
-    }
-    Process process{.name = line.substr(begin, end - begin)};
-    std::istringstream fields(line.substr(end + 1));
-    std::string skipped;
-    fields >> skipped >> process.parent;
-    for (int field = 5; field < 22; ++field) {
-        fields >> skipped;
-    }
-    fields >> process.startTime;
-    return process;
+    const size_t nameEnd = line.rfind(')'); // the name may hold any byte; then state and parent
+    return nameEnd == std::string::npos || nameEnd + 4 > line.size()
+               ? 0
+               : std::atoi(line.c_str() + nameEnd + 4);
 }
+
+} // namespace
 
 bool isAncestor(pid_t pid) {
     pid_t ancestor = getppid();
     while (ancestor > 1 && ancestor != pid) {
-        ancestor = describe(std::to_string(ancestor)).parent;
+        ancestor = parentOf(ancestor);
     }
     return ancestor > 1;
 }

@@ -4,10 +4,9 @@
 #include "paths.h"
 #include "tavischeduler.h"
 
-#include <array>
 #include <charconv>
+#include <exception>
 #include <memory>
-#include <sqlite3.h>
 #include <string_view>
 #include <unistd.h>
 
@@ -15,43 +14,57 @@ namespace tavisched {
 
 namespace {
 
-constexpr int kBusyTimeout = 5000; // milliseconds
 constexpr int kAnyFailure = 1;
 constexpr int kNotStarted = 127;
 constexpr int kSignalBase = 128;
 
-using Database = std::unique_ptr<sqlite3, decltype(&sqlite3_close)>;
-using Statement = std::unique_ptr<sqlite3_stmt, decltype(&sqlite3_finalize)>;
+using Database = std::unique_ptr<sqlite3, decltype(&TAVISchedDBClose)>;
 
+[[noreturn]] void failToRead(const std::string &reason) {
+    throw Failure(std::string("cannot read ") + kStatusDatabase + ": " + reason);
+}
+
+// Nothing before the first run since the machine's start.
 Database openDatabase() {
-    if (access(kStatusDatabase, R_OK | W_OK) != 0) {
-        throw Failure(std::string("cannot read ") + kStatusDatabase + ": " + systemReason());
+    sqlite3 *database = nullptr;
+    if (access(kStatusDatabase, F_OK) == 0 && access(kStatusDatabase, R_OK | W_OK) != 0) {
+        failToRead(systemReason());
     }
-    Database database(TAVISchedDBInit(), sqlite3_close);
-    if (!database) {
-        throw Failure(std::string("cannot open ") + kStatusDatabase + ": " + libraryError());
+    if (TAVISchedDBOpenForReading(&database) < 0) {
+        failToRead(libraryError());
     }
-    sqlite3_busy_timeout(database.get(), kBusyTimeout);
-    return database;
+    return {database, TAVISchedDBClose};
 }
 
-Run readRow(sqlite3_stmt *row) {
-    const auto *const comment = reinterpret_cast<const char *>(sqlite3_column_text(row, 5));
-    return {.statusId = sqlite3_column_int(row, 0),
-            .taskId = sqlite3_column_int(row, 1),
-            .start = static_cast<time_t>(sqlite3_column_int64(row, 2)),
-            .pid = sqlite3_column_int(row, 3),
-            .code = sqlite3_column_int(row, 4),
-            .comment = comment ? comment : ""};
-}
+// Collects rows; no exception may pass through the library.
+struct Collector {
+    std::vector<Run> runs;
+    std::exception_ptr failure;
 
-// The library tells a run that goes on from one whose process is gone.
-void settleRunning(sqlite3 *database, Run &run) {
-    std::array<char, 1024> comment{};
-    TAVISchedDBGetStatusByStatusID(database, run.statusId, &run.code, comment.data(),
-                                   comment.size());
-    run.comment = comment.data();
-}
+    static int add(void *collector, const TAVI_SCHED_STATUS *row) {
+        auto &self = *static_cast<Collector *>(collector);
+        try {
+            self.runs.push_back({.taskId = row->taskId,
+                                 .start = row->timestamp,
+                                 .pid = row->pid,
+                                 .code = row->statusCode,
+                                 .comment = row->comment});
+            return 0;
+        } catch (...) {
+            self.failure = std::current_exception();
+            return -1;
+        }
+    }
+    std::vector<Run> result(int count) {
+        if (failure) {
+            std::rethrow_exception(failure);
+        }
+        if (count < 0) {
+            failToRead(libraryError());
+        }
+        return std::move(runs);
+    }
+};
 
 int numberIn(std::string_view text) {
     int number = 0;
@@ -62,41 +75,21 @@ int numberIn(std::string_view text) {
 } // namespace
 
 std::vector<Run> readRuns(std::optional<int32_t> taskId) {
-    if (access(kStatusDatabase, F_OK) != 0) {
-        return {};
-    }
     const Database database = openDatabase();
-    sqlite3_stmt *prepared = nullptr;
-    sqlite3_prepare_v2(database.get(),
-                       "SELECT status_id, task_id, timestamp, pid, status_code, comment "
-                       "FROM task_status WHERE ?1 IS NULL OR task_id = ?1 "
-                       "ORDER BY timestamp DESC, status_id DESC",
-                       -1, &prepared, nullptr);
-    const Statement statement(prepared, sqlite3_finalize);
-    if (taskId) {
-        sqlite3_bind_int(prepared, 1, *taskId);
-    }
-    std::vector<Run> runs;
-    int step = SQLITE_ROW;
-    while ((step = sqlite3_step(prepared)) == SQLITE_ROW) {
-        runs.push_back(readRow(prepared));
-    }
-    if (step != SQLITE_DONE) {
-        throw Failure(std::string("cannot read ") + kStatusDatabase + ": " +
-                      sqlite3_errmsg(database.get()));
-    }
-    for (Run &run : runs) {
-        if (run.code == SCHED_STATUS_CODE_RUNNING) {
-            settleRunning(database.get(), run);
-        }
-    }
-    return runs;
+    Collector runs;
+    return database ? runs.result(TAVISchedDBListStatus(database.get(), taskId.value_or(-1),
+                                                        Collector::add, &runs))
+                    : std::vector<Run>();
 }
 
 std::map<int32_t, Run> readLatestRuns() {
     std::map<int32_t, Run> latest;
-    for (Run &run : readRuns()) {
-        latest.try_emplace(run.taskId, std::move(run));
+    if (const Database database = openDatabase()) {
+        Collector runs;
+        for (Run &run :
+             runs.result(TAVISchedDBListLastStatus(database.get(), Collector::add, &runs))) {
+            latest.try_emplace(run.taskId, std::move(run));
+        }
     }
     return latest;
 }

@@ -12,7 +12,6 @@
 namespace tavisched {
 
 struct Run {
-    int32_t statusId;
     int32_t taskId;
     time_t start;
     pid_t pid;

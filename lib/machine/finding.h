@@ -1,0 +1,53 @@
+// What is wrong with this machine, as far as scheduled tasks are concerned. Each function looks at one
+// thing and adds what it finds; machine.cpp has the table of them.
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace sched {
+
+struct Finding {
+    std::string what;
+    std::string advice;
+    std::function<bool()> repair = nullptr; // empty when it is not safe without a person
+    bool isNote = false;                    // nothing is wrong yet
+};
+
+// What was found, and what those that come later build on.
+struct Inspection {
+    std::vector<Finding> findings;
+    bool hasRoom = true;            // in /tmp
+    bool canReadTasks = true;       // else everything that follows from them would look wrong
+    bool areCopiesSame = true;      // both task files say the same
+    bool areSectionsGood = true;    // every section is a task as it is written
+    bool canReadPower = true;
+
+    void add(Finding finding) { findings.push_back(std::move(finding)); }
+};
+
+// inspect_files.cpp
+void inspectRoom(Inspection &inspection);
+void inspectFolders(Inspection &inspection);
+void inspectTaskFiles(Inspection &inspection);
+void inspectPutAside(Inspection &inspection);
+void inspectRunner(Inspection &inspection);
+
+// inspect_tasks.cpp
+void inspectSections(Inspection &inspection);
+void inspectTasks(Inspection &inspection);
+
+// inspect_cron.cpp
+void inspectCron(Inspection &inspection);
+void inspectCrontabFile(Inspection &inspection);
+void inspectLines(Inspection &inspection);
+
+// inspect_power.cpp
+void inspectPower(Inspection &inspection);
+
+// inspect_runs.cpp
+void inspectStatusDatabase(Inspection &inspection);
+void inspectPlugins(Inspection &inspection);
+
+} // namespace sched

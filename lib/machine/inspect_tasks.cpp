@@ -1,0 +1,145 @@
+// The sections of the working copy, and the tasks that they are.
+#include "backends/task_file.h"
+#include "change/change.h"
+#include "finding.h"
+#include "platc.h"
+#include "sched_handle.h"
+#include "sched_paths.h"
+#include "tavischeduler.h"
+
+#include <algorithm>
+#include <array>
+#include <cstring>
+
+#pragma weak PLATCFileCheckSections // an appliance's own platform may lack it
+
+namespace sched {
+
+namespace {
+
+constexpr const char *kByHand = "mend it in both task files by hand";
+constexpr size_t kMostFaults = 32;
+
+void inspectHeaders(const char *path, Inspection &inspection) {
+    List faults(16);
+    const int count =
+        PLATCFileCheckSections && faults ? PLATCFileCheckSections(path, faults.address()) : 0;
+    for (int i = 0; i < count; ++i) {
+        inspection.add({std::string(kWorkingCopy) + ": " + PLATCSzListGet(faults.get(), i),
+                        kByHand});
+    }
+}
+
+std::string describe(const TAVI_SCHED_FAULT &fault) {
+    return fault.key[0] == '\0' ? fault.reason
+                                : "\"" + std::string(fault.key) + "\": " + fault.reason;
+}
+
+// What is wrong with a stored form, in words; "" for nothing.
+std::string faultsOf(PLATCSZHASH *form, bool &readable) {
+    std::array<TAVI_SCHED_FAULT, kMostFaults> faults{};
+    const int count = TAVISchedHashCheck(form, faults.data(), faults.size());
+    std::string text;
+    for (size_t i = 0; i < std::min<size_t>(faults.size(), static_cast<size_t>(std::max(count, 0)));
+         ++i) {
+        readable = readable && (faults[i].kind == TAVI_SCHED_FAULT_VALUE ||
+                                faults[i].kind == TAVI_SCHED_FAULT_UNKNOWN_KEY);
+        text += (text.empty() ? "" : "; ") + describe(faults[i]);
+    }
+    return text;
+}
+
+void inspectSection(const char *path, const std::string &name, Inspection &inspection) {
+    const std::string section = "the section [" + name + "] of " + kWorkingCopy;
+    Hash form(64);
+    if (!form || PLATCFileGetSection(path, name.c_str(), form.address()) <= 0) {
+        inspection.add({section + " cannot be read", kByHand});
+        return;
+    }
+    bool readable = true;
+    const std::string faults = faultsOf(form.get(), readable);
+    const char *const id = PLATCSzHashGetValue(form.get(), "id");
+    if (!faults.empty()) {
+        inspection.add({section +
+                            (readable ? " is not read as it is written: "
+                                      : " is no task that can be read: ") +
+                            faults,
+                        std::string(kByHand) + ", or remove it there"});
+    } else if (name != (id ? id : "")) {
+        inspection.add({section + " says that its task has the id " + (id ? id : ""),
+                        "give both the same number in both task files"});
+    } else if (name.starts_with('-') || name == "0") {
+        inspection.add({section + " has a number below 1",
+                        "give it another one in both task files"});
+    }
+}
+
+bool runsOnFirstDay(const TAVI_SCHED_TASK &task) {
+    TAVI_SCHED_DATE now{};
+    TAVI_SCHED_DATE start{};
+    start.year = task.startYear;
+    start.month = task.startMonth;
+    start.day = task.startDay;
+    return TAVISchedDateGet(&now) != 0 || TAVISchedDateComp(&now, &start) >= 0;
+}
+
+// Daily and weekly tasks run from their first day on, although their next run is shown before it.
+bool startsLater(const TAVI_SCHED_TASK &task) {
+    const bool isByDay = task.type == TAVI_SCHED_TYPE_DAILY || task.type == TAVI_SCHED_TYPE_WEEKLY;
+    return isByDay && task.state == TAVI_SCHED_STATE_ENABLED && !runsOnFirstDay(task);
+}
+
+std::string called(const TAVI_SCHED_TASK &task) {
+    const std::string number = "task " + std::to_string(task.id);
+    return task.name[0] == '\0' ? number : number + " (" + task.name + ")";
+}
+
+void inspectTask(const TAVI_SCHED_TASK &task, Inspection &inspection) {
+    const std::string id = std::to_string(task.id);
+    TAVI_SCHED_FAULT fault{};
+    if (TAVISchedTaskCheck(&task, &fault) == 1) {
+        const bool isLine = fault.key[0] == '\0';
+        inspection.add({called(task) + ": " +
+                            (isLine ? std::string("its line")
+                                    : "its \"" + std::string(fault.key) + "\"") +
+                            " is wrong: " + fault.reason,
+                        "mend it with tavisched edit " + id + ", or where the task was made"});
+    } else if (startsLater(task)) {
+        inspection.add({called(task) + " does not run before its first day, whatever is shown as "
+                                       "its next run",
+                        "say its days anew: tavisched edit " + id + " --daily or --weekly"});
+    }
+}
+
+} // namespace
+
+void inspectSections(Inspection &inspection) {
+    if (!inspection.canReadTasks) {
+        return;
+    }
+    const Reading reading;
+    if (!reading || PLATCFileExist(reading.path()) != 1) {
+        return;
+    }
+    const size_t before = inspection.findings.size();
+    inspectHeaders(reading.path(), inspection);
+    List names(1024);
+    const int count = names ? PLATCFileEnumSection(reading.path(), names.address()) : 0;
+    for (int i = 0; i < count; ++i) {
+        inspectSection(reading.path(), PLATCSzListGet(names.get(), i), inspection);
+    }
+    inspection.areSectionsGood = inspection.findings.size() == before;
+}
+
+void inspectTasks(Inspection &inspection) {
+    if (!inspection.canReadTasks) {
+        return;
+    }
+    forEachStoredTask({.onTask = [&](const char *, TAVI_SCHED_TASK *task) {
+        task->backend = TAVI_SCHED_BACKEND_SCHEDULE;
+        inspectTask(*task, inspection);
+        return true;
+    }});
+}
+
+} // namespace sched

@@ -32,8 +32,9 @@ constexpr unsigned int kRenameFailed = 0x2800;
 constexpr unsigned int kSystemCallFailed = 0x2A00;
 constexpr unsigned int kBadFormat = 0x4000;
 
-// A source's name as messages carry it: the path below lib/ or include/.
-constexpr const char *sourceName(const char *path) {
+// A source's name as messages carry it: the path below lib/ or include/. Found at compile time, as
+// operations name their place also when nothing fails.
+consteval const char *sourceName(const char *path) {
     constexpr size_t npos = std::string_view::npos;
     const std::string_view text(path);
     size_t start = 0;

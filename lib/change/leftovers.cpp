@@ -1,7 +1,7 @@
 // What changes that were cut off leave.
 #include "leftovers.h"
 #include "base/file.h"
-#include "base/trust.h"
+#include "change_record.h"
 #include "platc.h"
 #include "sched_paths.h"
 
@@ -50,19 +50,21 @@ bool isTemporaryCrontab(const fs::path &path, const timespec &since) {
 
 } // namespace
 
-void sched::removeLeftovers() {
+void sched::removeLeftovers(const timespec &since) {
     forEachEntry("/tmp", [](const fs::path &path) {
         if (isScratchOfTheDead(path.native())) {
             unlink(path.c_str());
         }
     });
     base::removeLeftovers(kWorkingCopy);
-    struct stat record {};
-    if (stat(kRecord, &record) == 0) {
-        forEachEntry("/etc", [&](const fs::path &path) {
-            if (isTemporaryCrontab(path, record.st_mtim)) {
-                unlink(path.c_str());
-            }
-        });
+    base::removeLeftovers(kCrontab);
+    forEachEntry("/etc", [&](const fs::path &path) {
+        if (isTemporaryCrontab(path, since)) {
+            unlink(path.c_str());
+        }
+    });
+    unlink(kFinished);
+    if (recordState() == RecordState::None) {
+        unlink(kRecordPersistent);
     }
 }

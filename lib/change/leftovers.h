@@ -1,10 +1,12 @@
 // What changes that were cut off leave beside the files that they were about to replace.
 #pragma once
 
+#include <ctime>
+
 namespace sched {
 
-// Removes scratch files of dead processes in /tmp, and temporary crontabs that are not older than
-// the record of the change that was cut off.
-void removeLeftovers();
+// Removes scratch files of dead processes in /tmp, temporary crontabs that are not older than the
+// beginning of the change that was cut off, and what is left of records that have gone.
+void removeLeftovers(const timespec &since);
 
 } // namespace sched

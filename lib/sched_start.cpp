@@ -13,6 +13,7 @@
 #include "tavischeduler.h"
 
 #include <cerrno>
+#include <ctime>
 #include <optional>
 #include <string>
 #include <sys/stat.h>
@@ -86,7 +87,9 @@ int makeTasksReady() {
     if (!change) {
         return -1;
     }
-    sched::removeLeftovers();
+    timespec now{}; // a change that was cut off has been taken back, with its temporary crontab
+    clock_gettime(CLOCK_REALTIME, &now);
+    sched::removeLeftovers(now);
     const off_t size = ensureWorkingCopy();
     return size >= 0 ? synchronise(size > 0) : -1;
 }

@@ -14,6 +14,7 @@
 
 #include <cerrno>
 #include <ctime>
+#include <limits>
 #include <optional>
 #include <string>
 #include <sys/stat.h>
@@ -87,9 +88,9 @@ int makeTasksReady() {
     if (!change) {
         return -1;
     }
-    timespec now{}; // a change that was cut off has been taken back, with its temporary crontab
-    clock_gettime(CLOCK_REALTIME, &now);
-    sched::removeLeftovers(now);
+    // A change that was cut off has been taken back, with its temporary crontab.
+    constexpr timespec kNever{.tv_sec = std::numeric_limits<time_t>::max(), .tv_nsec = 0};
+    sched::removeLeftovers(kNever);
     const off_t size = ensureWorkingCopy();
     return size >= 0 ? synchronise(size > 0) : -1;
 }

@@ -57,6 +57,7 @@ void sched::removeLeftovers(const timespec &since) {
         }
     });
     base::removeLeftovers(kWorkingCopy);
+    base::removeLeftovers(kRunner);
     base::removeLeftovers(kCrontab);
     forEachEntry("/etc", [&](const fs::path &path) {
         if (isTemporaryCrontab(path, since)) {

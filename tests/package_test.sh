@@ -182,6 +182,11 @@ mv /mnt/cp /usr/bin/cp
 expect "no change is possible afterwards" grep -q '^name=New$' $tasks
 quietly tavisched remove --yes 2
 expect_same "a task that came and went" $tasks
+rm $tasks # lines of tasks that are nowhere else are the last trace of them
+boot is-lost
+expect_same "a boot without tasks" $crontab
+expect_working_copy "a boot without tasks" /dev/null
+cp /mnt/${tasks##*/} $tasks
 install -o nobody /mnt/new.json $working # and a user's file at the name is not believed
 boot stays
 expect_working_copy boot $tasks

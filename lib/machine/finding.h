@@ -1,5 +1,5 @@
-// What is wrong with this machine, as far as scheduled tasks are concerned. Each function looks at one
-// thing and adds what it finds; machine.cpp has the table of them.
+// What is wrong with this machine, as far as scheduled tasks are concerned. Each function looks at
+// one thing and adds what it finds; machine.cpp has the table of them.
 #pragma once
 
 #include <functional>
@@ -18,10 +18,10 @@ struct Finding {
 // What was found, and what those that come later build on.
 struct Inspection {
     std::vector<Finding> findings;
-    bool hasRoom = true;            // in /tmp
-    bool canReadTasks = true;       // else everything that follows from them would look wrong
-    bool areCopiesSame = true;      // both task files say the same
-    bool areSectionsGood = true;    // every section is a task as it is written
+    bool hasRoom = true;         // in /tmp
+    bool canReadTasks = true;    // else everything that follows from them would look wrong
+    bool areCopiesSame = true;   // both task files say the same
+    bool areSectionsGood = true; // every section is a task as it is written
     bool canReadPower = true;
 
     void add(Finding finding) { findings.push_back(std::move(finding)); }

@@ -38,8 +38,8 @@ Crontab readCrontab() {
     return crontab;
 }
 
-// cron holds a lock on the file with its process id for as long as it runs; another process can have
-// come by the same id.
+// cron holds a lock on the file with its process id for as long as it runs; another process can
+// have come by the same id.
 bool isCronRunning() {
     pid_t pid = 0;
     std::string name;
@@ -79,8 +79,8 @@ bool arePowerOffLinesRight(const Crontab &crontab) {
     };
     Times asked;
     for (const TAVI_SCHED_TASK *task = tasks.head(); task; task = task->next) {
-        if (task->state == TAVI_SCHED_STATE_ENABLED && std::strcmp(task->appArgs, "poweroff") == 0 &&
-            std::strchr(task->week, '1')) {
+        if (task->state == TAVI_SCHED_STATE_ENABLED &&
+            std::strcmp(task->appArgs, "poweroff") == 0 && std::strchr(task->week, '1')) {
             asked.push_back(timesOf(CronLine(*task).c_str()));
         }
     }
@@ -103,8 +103,8 @@ bool synchronise() {
 
 void inspectCron(Inspection &inspection) {
     if (!isCronRunning()) {
-        inspection.add({"cron is not running, so that no task runs",
-                        "start it: systemctl enable --now cron"});
+        inspection.add(
+            {"cron is not running, so that no task runs", "start it: systemctl enable --now cron"});
     }
 }
 
@@ -112,8 +112,8 @@ void inspectCrontabFile(Inspection &inspection) {
     const Crontab crontab = readCrontab();
     if (!crontab.isReadable) {
         inspection.canReadTasks = false;
-        inspection.add({std::string(kCrontab) + " cannot be read",
-                        "make it; an empty file is enough"});
+        inspection.add(
+            {std::string(kCrontab) + " cannot be read", "make it; an empty file is enough"});
         return;
     }
     base::TrustRule rule = base::kRootsFile;
@@ -136,9 +136,9 @@ void inspectCrontabFile(Inspection &inspection) {
         }
     }
     if (!crontab.endsWithLineFeed) {
-        inspection.add({"cron ignores all of " + std::string(kCrontab) +
-                            ", as its last line has no line feed",
-                        "add one at the end of the file"});
+        inspection.add(
+            {"cron ignores all of " + std::string(kCrontab) + ", as its last line has no line feed",
+             "add one at the end of the file"});
     }
 }
 

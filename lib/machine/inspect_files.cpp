@@ -25,8 +25,8 @@ constexpr const char *kNobodyElse = " must belong to root, and nobody else may w
 
 std::string adviseRootsAlone(const std::string &path) {
     struct stat status {};
-    const bool isOwn = lstat(path.c_str(), &status) == 0 &&
-                       (S_ISREG(status.st_mode) || path == kTaskFolder);
+    const bool isOwn =
+        lstat(path.c_str(), &status) == 0 && (S_ISREG(status.st_mode) || path == kTaskFolder);
     return isOwn ? "look who changed it; then chown root " + path + " and chmod go-w " + path
                  : "remove it: rm -r " + path;
 }
@@ -146,9 +146,9 @@ void inspectTaskFiles(Inspection &inspection) {
             {std::string(kWorkingCopy) + ", from which tasks are read, is missing or empty",
              std::string("make it from ") + kPersistent, makeWorkingCopy});
     } else if (working.found == base::Found::Nothing) {
-        inspection.add({std::string(kWorkingCopy) +
-                            " is missing, and any user could put one of his own there",
-                        "make it, empty", makeWorkingCopy});
+        inspection.add(
+            {std::string(kWorkingCopy) + " is missing, and any user could put one of his own there",
+             "make it, empty", makeWorkingCopy});
     } else if (stored.isEmpty() && !working.isEmpty()) {
         inspection.add({std::string(kPersistent) + " is missing or empty, so that all tasks are "
                                                    "lost when the machine restarts",

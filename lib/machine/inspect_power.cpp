@@ -34,10 +34,10 @@ void inspectTwins(const TAVI_SCHED_TASK *tasks, Inspection &inspection) {
     for (; tasks; tasks = tasks->next) {
         for (const TAVI_SCHED_TASK *other = tasks->next; other; other = other->next) {
             if (other->id == tasks->id) {
-                inspection.add({"power schedule " + std::to_string(tasks->id) +
-                                    " is there more than once",
-                                "remove one of them",
-                                [id = tasks->id] { return TAVISchedTaskRemove(id) == 0; }});
+                inspection.add(
+                    {"power schedule " + std::to_string(tasks->id) + " is there more than once",
+                     "remove one of them",
+                     [id = tasks->id] { return TAVISchedTaskRemove(id) == 0; }});
                 break;
             }
         }
@@ -64,11 +64,11 @@ void inspectPower(Inspection &inspection) {
     std::array<char, 256> reason{};
     if (TAVIAutoPoweronCheck && TAVIAutoPoweronCheck(reason.data(), reason.size()) != 0) {
         const bool isAsked = isAny(tasks.head(), "poweron");
-        inspection.add({(isAsked ? "there are power-on schedules, but this machine"
-                                 : "this machine") +
-                            std::string(" has no clock that can wake it (") + reason.data() + ")",
-                        isAsked ? "remove or disable them" : "power-on schedules are not possible",
-                        nullptr, !isAsked});
+        inspection.add(
+            {(isAsked ? "there are power-on schedules, but this machine" : "this machine") +
+                 std::string(" has no clock that can wake it (") + reason.data() + ")",
+             isAsked ? "remove or disable them" : "power-on schedules are not possible", nullptr,
+             !isAsked});
     }
 }
 

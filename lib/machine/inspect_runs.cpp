@@ -30,8 +30,8 @@ bool isDatabaseReadable() {
 // A full file system is no reason to give the results of earlier runs up.
 void inspectStatusDatabase(Inspection &inspection) {
     if (inspection.hasRoom && !isDatabaseReadable()) {
-        inspection.add({std::string("no task runs without its status database ") +
-                            kStatusDatabase + ", which cannot be read",
+        inspection.add({std::string("no task runs without its status database ") + kStatusDatabase +
+                            ", which cannot be read",
                         std::string("remove ") + kStatusDatabase +
                             ", which the next run makes anew; how earlier runs ended is lost",
                         [] { return unlink(kStatusDatabase) == 0; }});

@@ -25,8 +25,8 @@ void inspectHeaders(const char *path, Inspection &inspection) {
     const int count =
         PLATCFileCheckSections && faults ? PLATCFileCheckSections(path, faults.address()) : 0;
     for (int i = 0; i < count; ++i) {
-        inspection.add({std::string(kWorkingCopy) + ": " + PLATCSzListGet(faults.get(), i),
-                        kByHand});
+        inspection.add(
+            {std::string(kWorkingCopy) + ": " + PLATCSzListGet(faults.get(), i), kByHand});
     }
 }
 
@@ -60,17 +60,17 @@ void inspectSection(const char *path, const std::string &name, Inspection &inspe
     const std::string faults = faultsOf(form.get(), readable);
     const char *const id = PLATCSzHashGetValue(form.get(), "id");
     if (!faults.empty()) {
-        inspection.add({section +
-                            (readable ? " is not read as it is written: "
-                                      : " is no task that can be read: ") +
-                            faults,
-                        std::string(kByHand) + ", or remove it there"});
+        inspection.add(
+            {section +
+                 (readable ? " is not read as it is written: " : " is no task that can be read: ") +
+                 faults,
+             std::string(kByHand) + ", or remove it there"});
     } else if (name != (id ? id : "")) {
         inspection.add({section + " says that its task has the id " + (id ? id : ""),
                         "give both the same number in both task files"});
     } else if (name.starts_with('-') || name == "0") {
-        inspection.add({section + " has a number below 1",
-                        "give it another one in both task files"});
+        inspection.add(
+            {section + " has a number below 1", "give it another one in both task files"});
     }
 }
 
@@ -99,11 +99,11 @@ void inspectTask(const TAVI_SCHED_TASK &task, Inspection &inspection) {
     TAVI_SCHED_FAULT fault{};
     if (TAVISchedTaskCheck(&task, &fault) == 1) {
         const bool isLine = fault.key[0] == '\0';
-        inspection.add({called(task) + ": " +
-                            (isLine ? std::string("its line")
-                                    : "its \"" + std::string(fault.key) + "\"") +
-                            " is wrong: " + fault.reason,
-                        "mend it with tavisched edit " + id + ", or where the task was made"});
+        inspection.add(
+            {called(task) + ": " +
+                 (isLine ? std::string("its line") : "its \"" + std::string(fault.key) + "\"") +
+                 " is wrong: " + fault.reason,
+             "mend it with tavisched edit " + id + ", or where the task was made"});
     } else if (startsLater(task)) {
         inspection.add({called(task) + " does not run before its first day, whatever is shown as "
                                        "its next run",

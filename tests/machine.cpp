@@ -51,6 +51,7 @@ std::vector<std::string> leftovers() {
     for (const char *const folder : {"/tmp", "/usr/tavi/etc", "/etc"}) {
         for (const std::string &path : entriesOf(folder)) {
             const bool isKnown = path == kWorking || path == kPersistent || path == kPower ||
+                                 path == "/tmp/tavischedtask" ||
                                  path == std::string(kPersistent) + ".lock" ||
                                  path == std::string(kPersistent) + ".reading";
             const bool isMine = folder != std::string("/etc") || path.starts_with("/etc/crontab.");

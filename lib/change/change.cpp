@@ -165,10 +165,11 @@ sched::Reading::Reading() : path_(kWorkingCopy) {
     }
 }
 
-// No change goes on, and none was cut off.
+// None was cut off: a change that goes on waits with overwriting it.
 bool sched::Reading::isWhole() {
-    return recordState() != RecordState::Present && !ReadingLock::isUnfinished() &&
-           !ChangeLock::isMarked();
+    return !ReadingLock::isUnfinished() &&
+           ((recordState() != RecordState::Present && !ChangeLock::isMarked()) ||
+            changeLockHolder() != 0);
 }
 
 // While this process has the lock of reading, a working copy that is finished stays whole, and one

@@ -3,6 +3,7 @@
 #include "sched_error.h"
 #include "sched_paths.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -21,9 +22,10 @@ namespace {
 // Of a fixed width: one in another's place leaves nothing of it.
 constexpr const char *kHolderFormat = "%10d %20lld.%09ld\n";
 
-constexpr long kPatience = 30;        // seconds
-constexpr long kPause = 5'000'000;    // nanoseconds
-constexpr long kShortPause = 200'000; // nanoseconds
+constexpr long kPatience = 30;             // seconds
+constexpr long kPause = 1'000'000;         // nanoseconds, at first
+constexpr long kLongestPause = 16'000'000; // when many wait, each of them looks less often
+constexpr long kShortPause = 200'000;
 
 base::Descriptor openLockFile(const char *path) {
     return base::Descriptor(open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600));
@@ -52,8 +54,8 @@ int failToOpen(const char *path) {
     return -1;
 }
 
-// Tries until it works or patience ends.
-template <typename Try> bool retry(long pause, Try &&tryOnce) {
+// Tries until it works or patience ends, with longer and longer pauses.
+template <typename Try> bool retry(long pause, long longest, Try &&tryOnce) {
     timespec start{};
     clock_gettime(CLOCK_MONOTONIC, &start);
     for (;;) {
@@ -67,6 +69,7 @@ template <typename Try> bool retry(long pause, Try &&tryOnce) {
         }
         const timespec length{.tv_sec = 0, .tv_nsec = pause};
         nanosleep(&length, nullptr);
+        pause = std::min(2 * pause, longest);
     }
 }
 
@@ -156,7 +159,7 @@ Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
     }
     bool below = false;
     pid_t known = 0;
-    const bool locked = retry(kPause, [&] {
+    const bool locked = retry(kPause, kLongestPause, [&] {
         const pid_t holder = writtenProcess(fd);
         below = holder != std::exchange(known, holder) && isBelow(holder);
         return below || flock(fd, LOCK_EX | LOCK_NB) == 0;
@@ -253,24 +256,39 @@ pid_t sched::changeLockHolder() {
 
 // ---- Reading and writing ----
 
-// Two bytes of one file: readers pass the gate one by one and then share the room; a writer keeps
-// the gate shut while it waits for those inside.
+// Two bytes of one file: readers share the room, and a writer that waits for it shuts the gate, at
+// which readers look before they enter. So a writer waits only for those who are inside.
 namespace {
 
 enum Place : off_t { Gate, Room };
 
-bool setLock(int fd, Place place, short type) {
+struct flock lockOf(Place place, short type) {
     struct flock lock {};
     lock.l_type = type;
     lock.l_whence = SEEK_SET;
     lock.l_start = place;
     lock.l_len = 1;
+    return lock;
+}
+
+bool setLock(int fd, Place place, short type) {
+    struct flock lock = lockOf(place, type);
     return fcntl(fd, F_OFD_SETLK, &lock) == 0;
 }
 
-bool enter(int fd, short type) {
-    return retry(kShortPause, [&] { return setLock(fd, Gate, type); }) &&
-           retry(kShortPause, [&] { return setLock(fd, Room, type); });
+bool isGateOpen(int fd) {
+    struct flock lock = lockOf(Gate, F_RDLCK);
+    return fcntl(fd, F_OFD_GETLK, &lock) != 0 || lock.l_type == F_UNLCK;
+}
+
+bool enterToRead(int fd) {
+    return retry(kShortPause, kShortPause,
+                 [&] { return isGateOpen(fd) && setLock(fd, Room, F_RDLCK); });
+}
+
+bool enterToWrite(int fd) {
+    return retry(kShortPause, kShortPause, [&] { return setLock(fd, Gate, F_WRLCK); }) &&
+           retry(kShortPause, kShortPause, [&] { return setLock(fd, Room, F_WRLCK); });
 }
 
 bool failToEnter(const char *what) {
@@ -308,10 +326,7 @@ sched::ReadingLock::~ReadingLock() {
 }
 
 void sched::ReadingLock::acquire() {
-    held_ = !own.file || enter(own.file.get(), F_RDLCK) || failToEnter("overwritten");
-    if (own.file) {
-        setLock(own.file.get(), Gate, F_UNLCK);
-    }
+    held_ = !own.file || enterToRead(own.file.get()) || failToEnter("overwritten");
 }
 
 void sched::ReadingLock::release() {
@@ -331,7 +346,7 @@ bool sched::ReadingLock::isUnfinished() {
 }
 
 bool sched::ReadingLock::waitUntil(const std::function<bool()> &tryOnce) {
-    return retry(kShortPause, tryOnce);
+    return retry(kShortPause, kShortPause, tryOnce);
 }
 
 sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
@@ -342,7 +357,7 @@ sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
     if (own.file) {
         setLock(own.file.get(), Room, F_UNLCK);
     }
-    held_ = (enter(file_.get(), F_WRLCK) || failToEnter("read")) &&
+    held_ = (enterToWrite(file_.get()) || failToEnter("read")) &&
             (ftruncate(file_.get(), 1) == 0 || failToOpen(kReadingLock) == 0);
     if (held_) {
         fcntl(file_.get(), F_SETFD, 0); // a program that overwrites tasks keeps readers away

@@ -2,9 +2,11 @@
 #include "change_lock.h"
 #include "sched_error.h"
 #include "sched_paths.h"
+#include "tavischeduler.h"
 
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
@@ -19,6 +21,8 @@ namespace {
 constexpr long kPatience = 30;        // seconds
 constexpr long kPause = 5'000'000;    // nanoseconds
 constexpr long kShortPause = 200'000; // nanoseconds
+
+volatile std::sig_atomic_t waitedFor = 0; // a process
 
 base::Descriptor openLockFile(const char *path) {
     return base::Descriptor(open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600));
@@ -99,9 +103,11 @@ Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
     }
     bool below = false;
     const bool locked = retry(kPause, [&] {
-        below = isBelow(writtenHolder(fd));
+        waitedFor = writtenHolder(fd);
+        below = isBelow(waitedFor);
         return below || flock(fd, LOCK_EX | LOCK_NB) == 0;
     });
+    waitedFor = below || !locked ? waitedFor : 0;
     return below ? Outcome::Below : locked ? Outcome::Held : Outcome::Busy;
 }
 
@@ -117,6 +123,7 @@ void writeHolder(int fd, pid_t holder) {
 } // namespace
 
 sched::ChangeLock::ChangeLock(Wait wait) {
+    waitedFor = 0;
     if (held.depth > 0) {
         ++held.depth;
         held_ = true;
@@ -203,9 +210,23 @@ bool setLock(int fd, Place place, short type) {
     return fcntl(fd, F_OFD_SETLK, &lock) == 0;
 }
 
+bool tryToEnter(int fd, Place place, short type) {
+    if (setLock(fd, place, type)) {
+        return true;
+    }
+    if (waitedFor == 0) {
+        const base::Descriptor changes(open(sched::kChangeLock, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+        waitedFor = writtenHolder(changes.get());
+    }
+    return false;
+}
+
 bool enter(int fd, short type) {
-    return retry(kShortPause, [&] { return setLock(fd, Gate, type); }) &&
-           retry(kShortPause, [&] { return setLock(fd, Room, type); });
+    waitedFor = 0;
+    const bool entered = retry(kShortPause, [&] { return tryToEnter(fd, Gate, type); }) &&
+                         retry(kShortPause, [&] { return tryToEnter(fd, Room, type); });
+    waitedFor = entered ? 0 : waitedFor;
+    return entered;
 }
 
 bool failToEnter(const char *what) {
@@ -246,4 +267,8 @@ sched::WritingLock::~WritingLock() {
         setLock(file_.get(), Room, F_UNLCK);
         setLock(file_.get(), Gate, F_UNLCK);
     }
+}
+
+int32_t TAVISchedWaitedFor() {
+    return waitedFor;
 }

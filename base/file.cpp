@@ -134,6 +134,16 @@ pid_t makerOf(std::string_view behind) {
     return isTemporary ? pid : 0;
 }
 
+// Nobody else can put another one in the place of a folder of ours.
+void removeOwnFolder(const std::string &path) {
+    struct stat status {};
+    std::error_code ignored;
+    if (lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode) &&
+        status.st_uid == geteuid()) {
+        std::filesystem::remove_all(path, ignored);
+    }
+}
+
 } // namespace
 
 void removeLeftovers(const std::string &path) {
@@ -149,8 +159,8 @@ void removeLeftovers(const std::string &path) {
             continue;
         }
         const pid_t maker = makerOf(found.substr(name.size()));
-        if (maker > 0 && !isAlive(maker)) {
-            unlinkat(dirfd(entries.get()), entry->d_name, 0);
+        if (maker > 0 && !isAlive(maker) && unlinkat(dirfd(entries.get()), entry->d_name, 0) != 0) {
+            removeOwnFolder(folder + entry->d_name);
         }
     }
 }
@@ -231,7 +241,7 @@ bool exchange(const char *made, const char *path) {
            (errno == ENOENT && renameat2(AT_FDCWD, made, AT_FDCWD, path, RENAME_NOREPLACE) == 0);
 }
 
-PrivateFolder::PrivateFolder(const std::string &besides) : path_(besides + ".XXXXXX") {
+PrivateFolder::PrivateFolder(const std::string &besides) : path_(besides + processTemporary()) {
     if (!mkdtemp(path_.data())) {
         path_.clear();
     }

@@ -34,7 +34,8 @@ bool makeEmpty(const char *path);
 inline constexpr std::string_view kTemporary = ".XXXXXX";
 // The same with this process's id, so that what a dead one left can be told: ".123.XXXXXX".
 std::string processTemporary();
-// Removes the files beside the path that are named so by processes which are no longer there.
+// Removes the files and private folders beside the path that are named so by processes which are no
+// longer there.
 void removeLeftovers(const std::string &path);
 
 // A new file that takes an old one's place by rename; until then it has a name of its own in the

@@ -1,17 +1,11 @@
 /*
  * The task scheduler of the storage appliance: tasks are stored, started by cron and run as their
- * owner. This header is usable from C and C++.
+ * owner. This header is usable from C and C++ and needs no other library's.
  *
  * Unless a declaration says otherwise, functions return 0 on success and -1 on failure. A failure
  * sets the process's error state (PLATCErrGet, PLATCErrorGetFile and PLATCErrorGetLine of platc.h)
- * and logs one line with syslog at LOG_ERR. A NULL pointer or a zero size is error 0x0D00
- * everywhere.
- *
- *   0x0100, 0x0200  out of memory             0x2000  no backend, no such value or name
- *   0x0400, 0x0500  run lock                  0x2700  a file's status could not be read
- *   0x0900          cannot open or create     0x2800  a file could not be moved into place
- *   0x0B00          read, write or look-up    0x2A00  a system call failed
- *   0x0D00          invalid argument          0x4000  bad format
+ * to one of TAVI_SCHED_ERR_*, or to what the platform found, and logs one line with syslog at
+ * LOG_ERR. A NULL pointer or a zero size is error 0x0D00 everywhere.
  *
  * The library is made for single-threaded processes: some functions return static buffers.
  */
@@ -27,6 +21,21 @@ extern "C" {
 #endif
 
 #define TAVI_SCHED_API __attribute__((visibility("default")))
+
+/* ---- Error codes ---- */
+
+#define TAVI_SCHED_ERR_SORT_MEMORY 0x0100      /* out of memory while sorting a list */
+#define TAVI_SCHED_ERR_MEMORY 0x0200           /* out of memory */
+#define TAVI_SCHED_ERR_LOCK 0x0400             /* a lock cannot be had, or not in time */
+#define TAVI_SCHED_ERR_UNLOCK 0x0500           /* the run lock cannot be released */
+#define TAVI_SCHED_ERR_OPEN 0x0900             /* a file cannot be opened, created or trusted */
+#define TAVI_SCHED_ERR_READ_WRITE 0x0B00       /* a read, write or look-up failed */
+#define TAVI_SCHED_ERR_INVALID_ARGUMENT 0x0D00 /* an argument that is not accepted */
+#define TAVI_SCHED_ERR_NOT_FOUND 0x2000        /* no such task, backend, value or name */
+#define TAVI_SCHED_ERR_FILE_STATUS 0x2700      /* a file's status cannot be read */
+#define TAVI_SCHED_ERR_RENAME 0x2800           /* a file cannot be moved into place */
+#define TAVI_SCHED_ERR_SYSTEM_CALL 0x2A00      /* a system call failed */
+#define TAVI_SCHED_ERR_BAD_FORMAT 0x4000       /* a text is not of the form that is due */
 
 /* ---- Task record ---- */
 
@@ -51,14 +60,21 @@ extern "C" {
 #define TAVI_SCHED_WEEK_DAYS 7
 
 /* One scheduled task. It holds no pointer but `next`, so a byte-wise copy is a full copy. Flags
- * hold 0 or 1. */
+ * hold 0 or 1.
+ *
+ * A new task (TAVISchedTaskAlloc, TAVISchedTaskGetDefault) is enabled and runs daily at 00:00 as
+ * root, without a command: id -1, `week` "1111111", first day 0/0/0, no repetition, an application
+ * and other texts that are empty but for `name` ("Task 7" after the next free id; "Power" in the
+ * power backend, whose `appName` is "#schedule:power_on_off#") and `editDialog`. All flags are 1
+ * but `canRunTaskSameTime` and `simpleEditForm`. */
 typedef struct TAVI_SCHED_TASK {
     struct TAVI_SCHED_TASK *next; /* next task of a list, or NULL */
     int32_t backend;              /* id of the backend that keeps the task */
     int32_t id;                   /* id within its backend; -1 = new, kept nowhere yet */
     uint32_t owner;               /* user id that the command runs as */
     char name[4096];
-    char nextTriggerTime[1024]; /* "YYYY-MM-DD hh:mm" or "N/A"; computed, never stored */
+    char nextTriggerTime[1024]; /* "YYYY-MM-DD hh:mm" or "N/A"; never stored: get by id and list
+                                 * compute it, saving leaves it as it is */
     int32_t state;              /* TAVI_SCHED_STATE_* */
     int32_t type;               /* TAVI_SCHED_TYPE_* */
     char week[8];               /* seven characters, Sunday first: '0' = not on that day */
@@ -212,6 +228,15 @@ TAVI_SCHED_API int TAVISchedRandInit(void);
  * when the date cannot be had; the text is then left as it was. */
 TAVI_SCHED_API int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask);
 
+/* The moments from `from` until before `until` (seconds since the epoch) at which an enabled task
+ * will really be started: those at which cron takes its line and the task is then due, in the
+ * process's time zone. Of an hour that daylight saving time skips there is none, of one that it
+ * repeats the first. For a power schedule the moments at which the machine goes on or off. Writes
+ * the first `cMax` of them, in rising order, and returns how many it wrote, or -1. Nothing is
+ * allocated; the time it takes is linear in the days. */
+TAVI_SCHED_API int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t until,
+                                       int64_t *rgStarts, size_t cMax);
+
 /* ---- Backends ---- */
 
 /* 1 when the task is to be kept. */
@@ -248,20 +273,21 @@ TAVI_SCHED_API int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_REC
 
 /* ---- Task operations ---- */
 
-/* A new task with the schedule backend's defaults, or NULL with error 0x0200 or the failing
- * operation's. Freed with TAVISchedTaskFree. */
+/* A new task with the schedule backend's defaults (see the record), or NULL with error 0x0200 or
+ * the failing operation's. Freed with TAVISchedTaskFree. */
 TAVI_SCHED_API TAVI_SCHED_TASK *TAVISchedTaskAlloc(void);
 /* Frees the one task, not what follows in a list. */
 TAVI_SCHED_API int TAVISchedTaskFree(TAVI_SCHED_TASK *pTask);
-/* Fills the task with the defaults of the backend in its `backend` field, which the caller sets. */
+/* Fills the task with the defaults of the backend in its `backend` field, which the caller sets;
+ * the fields that are not stored keep their values. */
 TAVI_SCHED_API int TAVISchedTaskGetDefault(TAVI_SCHED_TASK *pTask);
-/* Reads a stored task. 0x2000 when no backend keeps it. */
+/* Reads a stored task and computes its next trigger time. 0x2000 when no backend keeps it. */
 TAVI_SCHED_API int TAVISchedTaskGetByID(int32_t id, TAVI_SCHED_TASK *pTask);
 /* Id -1: as TAVISchedTaskGetDefault (the caller sets `backend`); any other as TAVISchedTaskGetByID.
  */
 TAVI_SCHED_API int TAVISchedTaskLoad(int32_t id, TAVI_SCHED_TASK *pTask);
-/* Stores a new task in its backend, which sets the task's id. The task must not be NULL. 0x2000
- * when no backend serves it. */
+/* Stores a new task in its backend, which sets the task's id, and its name when that is empty; its
+ * next trigger time is not computed. 0x2000 when no backend serves it. */
 TAVI_SCHED_API int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask);
 /* Replaces the stored task of the same id. Returns the backend's result. */
 TAVI_SCHED_API int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask);
@@ -310,8 +336,10 @@ TAVI_SCHED_API int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTa
                                           TAVI_SCHED_FILTER filter);
 
 /* Makes the machine ready after its start, with root's rights: takes back what a change that was
- * cut off left, makes the working copy where there is none, the lock folder and the runner's link,
- * and synchronises. May be called at any time. */
+ * cut off left, fills a working copy that is missing, empty or another user's from what is stored,
+ * makes the lock folder and the runner's link, and synchronises, but for lines whose tasks are in
+ * neither file. What fails does not keep it from the rest. "tavischedtask --start" calls it at
+ * boot; it may be called at any time. 0x0D00 for anybody but root. */
 TAVI_SCHED_API int TAVISchedStart(void);
 
 /* ---- Several changes as one ---- */
@@ -352,15 +380,19 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
 
 /* ---- Running ---- */
 
-/* Runs a stored task in a detached child, which waits for conflicting runs, runs the command as the
- * task's owner and records the result. Mode 1: only when it is due in this minute; mode 0: at once;
- * any other: nothing. `enabledOnly` 1 skips a disabled task. Returns 0 when the task was skipped or
- * the child was started; -1 when the task cannot be read or is marked not existing (0x2000), or the
- * date or the fork fails (0x2A00). */
+/* Runs a stored task in a detached child, which waits for conflicting runs, records the run, runs
+ * the command as the task's owner and records the result. All of that happens after this has
+ * returned: the run is not in the status database yet, and one that gives up waiting never is. Who
+ * wants to know more calls TAVISchedTaskRunFollowed. Mode 1: only when it is due in this minute;
+ * mode 0: at once; any other: nothing. `enabledOnly` 1 skips a disabled task. Returns 0 when the
+ * task was skipped or the child was started; -1 when the task cannot be read or is marked not
+ * existing (0x2000), or the date or the fork fails (0x2A00). */
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
 /* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
  * row bears, and `pEnd` a descriptor that reads end-of-file once the child has ended, also when it
- * recorded nothing; the caller closes it. Both are -1 when the task was skipped. */
+ * recorded nothing; the caller waits for it with read or poll and closes it. Then the newest row of
+ * the task with that process id (TAVISchedDBListStatus) tells how the command ended. Both are -1
+ * when the task was skipped. */
 TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
                                             int32_t *pPid, int *pEnd);
 
@@ -389,11 +421,11 @@ typedef struct TAVI_SCHED_STATUS {
     char comment[1024];
 } TAVI_SCHED_STATUS;
 
-struct sqlite3;
+struct sqlite3; /* the functions below do with a handle all that is due; sqlite3.h is not needed */
 
-/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose or
- * sqlite3_close. NULL with error 0x0900, or without one when the table cannot be made. A statement
- * that meets a locked database is tried up to 101 times with a pause of up to a second between. */
+/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose. NULL
+ * with error 0x0900, or without one when the table cannot be made. A statement that meets a locked
+ * database is tried up to 101 times with a pause of up to a second between. */
 TAVI_SCHED_API struct sqlite3 *TAVISchedDBInit(void);
 /* Opens it to read what is there and makes nothing: 1 with the handle, 0 with NULL when there were
  * no runs yet, -1 with NULL and error 0x0900. */

@@ -17,6 +17,7 @@ inline constexpr const char *kChangeLock = "/usr/tavi/etc/scheduled_tasks.lock";
 inline constexpr const char *kReadingLock = "/usr/tavi/etc/scheduled_tasks.reading";
 inline constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
 inline constexpr const char *kRestoring = "/usr/tavi/etc/scheduled_tasks.journal.restoring";
+inline constexpr const char *kFinished = "/usr/tavi/etc/scheduled_tasks.journal.finished";
 inline constexpr const char *kRecordPersistent = "/usr/tavi/etc/scheduled_tasks.journal.persistent";
 
 // cron: its table, its process id, and what the tasks' lines start.

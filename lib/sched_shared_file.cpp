@@ -101,3 +101,20 @@ int sched::claimSharedFolder(const char *path) {
     return found == base::Found::Trusted || (found == base::Found::Strange && setRight(path)) ? 0
                                                                                               : -1;
 }
+
+int sched::ensureSharedFolder(const char *path) {
+    if (claimSharedFolder(path) == 0) {
+        return 0;
+    }
+    try {
+        const base::PrivateFolder folder(path);
+        const std::string made = folder.path() + "/folder";
+        return folder && mkdir(made.c_str(), 0755) == 0 && chmod(made.c_str(), 0755) == 0 &&
+                       base::exchange(made.c_str(), path)
+                   ? 0
+                   : -1;
+    } catch (const std::bad_alloc &) {
+        errno = ENOMEM;
+        return -1;
+    }
+}

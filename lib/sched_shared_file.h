@@ -18,4 +18,7 @@ int claimSharedFile(const char *path);
 // 0 or -1.
 int claimSharedFolder(const char *path);
 
+// The same, but anything else is exchanged for an empty folder in one step.
+int ensureSharedFolder(const char *path);
+
 } // namespace sched

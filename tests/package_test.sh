@@ -10,6 +10,8 @@ later=99.0.0
 crontab=/etc/crontab
 check=/usr/tavi/bin/tavi_poweroff_feasible_check
 tasks=/usr/tavi/etc/scheduled_tasks
+working=/tmp/scheduled_tasks
+unit=/usr/lib/systemd/system/tavischeduler.service
 log=${2:-$debs}/log
 
 step() { printf 'package_test: %s\n' "$*"; }
@@ -26,6 +28,21 @@ expect_own_crontab() { # as it was before the installation
 expect_only_cron_missing() {
     local found; found=$(tavisched check | sed -n 's/^problem: //p') || true
     expect "check complains: $found" [ "${found%%,*}, $(wc -l <<< "$found")" = "cron is not running, 1" ]
+}
+expect_working_copy() { # as the stored tasks are, of root's alone
+    expect "$1 left $working $(stat -c %a:%U:%h $working)" [ "$(stat -c %a:%U:%h $working)" = 600:root:1 ]
+    expect "$1 left other tasks in $working" cmp $working "$2"
+}
+boot() { # what tmpfiles.d and the unit do; of /tmp nothing is left, or what is there stays
+    [ "$1" = stays ] || rm -rf $working* /tmp/lock /tmp/tavischedtask /tmp/sched_status.sqlite*
+    quietly systemd-tmpfiles --boot --remove --create tavischeduler.conf
+    expect "the name of the working copy is free before the unit runs" [ -f $working ]
+    # shellcheck disable=SC2046 # a list of words
+    quietly $(sed -n 's/^ExecStart=//p' $unit)
+}
+spoil() { # FILE as the loss of power left it
+    case $2 in torn) truncate -s "$(($(stat -c %s "$1") / 2))" "$1" ;; empty) truncate -s 0 "$1" ;; gone) rm "$1" ;;
+        as-before) cp "/mnt/${1##*/}" "$1" ;; esac
 }
 expect_files() {
     local wrong package=$1; shift
@@ -78,22 +95,29 @@ for package in 'cron | cron-daemon' procps libc6 libjsoncpp libsodium libsqlite3
 done
 lib=/usr/lib/$(cc -print-multiarch)
 expect_files tavischeduler /usr/sbin/tavisched{,task} "$lib"/lib{tavischeduler.so.4,taviplatform.so.1} \
-    /usr/lib/tmpfiles.d/tavischeduler.conf /usr/share/man/man{1/tavisched.1,8/tavischedtask.8}.gz \
+    /usr/lib/tmpfiles.d/tavischeduler.conf $unit /usr/share/man/man8/tavisched{,task}.8.gz \
     /usr/share/{bash-completion/completions/tavisched,zsh/vendor-completions/_tavisched} \
     /usr/share/fish/vendor_completions.d/tavisched.fish /usr/tavi/etc/plugins/task_scheduler \
-    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,changelog.Debian.gz}
+    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,{changelog.Debian,README.md}.gz}
 expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavischedsetter}.h \
     /usr/include/{platc,platplugin,tavisdk}.h "$lib"/lib{tavischeduler,taviplatform}.so \
     "$lib"/{pkgconfig/tavischeduler.pc,cmake/tavischeduler/tavischeduler-config.cmake} \
-    /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/copyright
+    /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/{copyright,examples/task.c}
 expect "programs look for libraries elsewhere" \
     [ -z "$(readelf -d /usr/sbin/tavisched{,task} "$lib"/libtavi*.so | grep -E 'R(UN)?PATH')" ]
 expect_only_cron_missing
+expect_working_copy installation /dev/null
+expect "the unit is not enabled" [ -L /etc/systemd/system/multi-user.target.wants/${unit##*/} ]
+quietly systemd-analyze verify --man=no $unit
+rm -rf /run/systemd # where it notes what it looked at
 
 step "programs built over the installed package"
-# shellcheck disable=SC2046 # a list of words
-quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler)
-quietly cmake -S "$source/examples" -B /mnt/example
+flags=$(pkg-config --cflags --libs tavischeduler | xargs)
+expect "pkg-config says: $flags" [ "$flags" = "-ltavischeduler -ltaviplatform" ]
+examples=/usr/share/doc/tavischeduler-dev/examples
+# shellcheck disable=SC2086 # a list of words
+quietly cc $examples/task.c -o /mnt/task $flags
+quietly cmake -S $examples -B /mnt/example
 quietly cmake --build /mnt/example
 
 step "tasks"
@@ -117,6 +141,47 @@ cp $check $tasks $crontab /mnt
 quietly systemd-tmpfiles --create tavischeduler.conf
 expect_same boot $check
 expect "boot changed the mode of $check" [ "$(stat -c %a $check)" = 700 ]
+
+step "boot: what was cut off comes back whole"
+# Copies one half and is killed with its caller where it is to write what CUT names.
+mv /usr/bin/cp /mnt/cp
+cat > /usr/bin/cp << 'END'
+#!/bin/sh
+[ "$3" = "${CUT:-nothing}" ] || exec /mnt/cp "$@"
+head -c 400 "$2" > "$3"
+kill -9 $PPID
+END
+chmod 755 /usr/bin/cp
+printf '{"id": "\\"-1\\""%s}' "$(printf ', "%s": "\\"%s\\""' 'run hour' 5 'run min' 0 name New app '' 'app name' '' \
+    action '' cmd dHJ1ZQ== state enabled type daily)" > /mnt/new.json
+while read -r CUT stored record tmp; do
+    row="a change cut off at $CUT with $stored tasks, $record record and /tmp that $tmp"
+    CUT=$CUT bash -c '/mnt/task save /mnt/new.json; true' &>"$log"
+    expect "$row: nothing was recorded" [ -s $tasks.journal ]
+    spoil $tasks "$stored"
+    spoil $tasks.journal "$record"
+    boot "$tmp"
+    for file in $tasks $crontab; do expect_same "$row" "$file"; done
+    expect_working_copy "$row" $tasks
+    expect "$row: the record is still there" [ -z "$(compgen -G "$tasks.journal*")" ]
+done << END
+$tasks torn whole is-lost
+$tasks empty whole is-lost
+$tasks gone whole stays
+$tasks as-before torn is-lost
+$tasks as-before empty is-lost
+$working whole whole is-lost
+$working torn whole stays
+$working empty whole is-lost
+END
+quietly /mnt/task save /mnt/new.json
+mv /mnt/cp /usr/bin/cp
+expect "no change is possible afterwards" grep -q '^name=New$' $tasks
+quietly tavisched remove --yes 2
+expect_same "a task that came and went" $tasks
+install -o nobody /mnt/new.json $working # and a user's file at the name is not believed
+boot stays
+expect_working_copy boot $tasks
 
 step "upgrade"
 manage -i "$debs"/later/*.deb

@@ -1,6 +1,7 @@
 // Running tasks, with real processes.
 #include "support.h"
 
+#include <array>
 #include <csignal>
 #include <fcntl.h>
 #include <grp.h>
@@ -25,6 +26,11 @@ class Run : public SchedTest {
         return query("SELECT task_id || ':' || status_code || ':' || ifnull(comment, '') "
                      "FROM task_status ORDER BY status_id");
     }
+    // A set of signals as the kernel tells it: "SigBlk", "SigIgn".
+    static unsigned long long signals(const std::string &process, const std::string &set) {
+        const std::string status = readFile("/proc/" + process + "/status");
+        return std::stoull(status.substr(status.find(set + ":") + set.size() + 1), nullptr, 16);
+    }
     // The row of a run of task 1 that goes on.
     static void addRunning() {
         query("INSERT INTO task_status (pid, timestamp, app, task_id, status_code) VALUES (" +
@@ -46,29 +52,35 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
         setenv(name, "C", 1);
     }
     setenv("TZ", "UTC", 1);
-    Task task = newTask("{ grep -E '^(Uid|Gid|Groups|CapPrm):' /proc/self/status; "
+    Task task = newTask("{ grep -E '^(Uid|Gid|Groups|CapPrm|SigIgn):' /proc/self/status; "
                         "readlink /proc/$$/exe; pwd; ls -l /proc/$$/fd | grep -c passwd; "
                         "env | grep -v ^_= | sort; } > /tmp/home/seen");
     task->owner = 4242;
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    std::array<char, 32> ignored{}; // by this program, so by the command too
+    snprintf(ignored.data(), ignored.size(), "%016llx", signals("self", "SigIgn"));
     const int leaked = open("/etc/passwd", O_RDONLY); // not close-on-exec
+    const int high = fcntl(leaked, F_DUPFD, 1000);
     signal(SIGCHLD, SIG_IGN);
     EXPECT_EQ(run(1), 0);
     signal(SIGCHLD, SIG_DFL);
     close(leaked);
+    close(high);
     EXPECT_EQ(readFile("/tmp/home/seen"),
               "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
-              "Groups:\t4242 4343 \nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
-              "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
-              "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTZ=UTC\n"
-              "USER=tavitest\n");
+              "Groups:\t4242 4343 \nSigIgn:\t" +
+                  std::string(ignored.data()) +
+                  "\nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
+                  "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
+                  "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTZ=UTC\n"
+                  "USER=tavitest\n");
     EXPECT_EQ(rows(), "1:3: ");
     EXPECT_EQ(statusOf("/tmp/sched_status.sqlite").st_uid, 0U);
     EXPECT_THAT(logs(), IsEmpty());
 
     // Root's own groups too, whatever the caller had.
-    const gid_t strange[] = {33, 44};
-    setgroups(2, strange);
+    const gid_t strange = 33;
+    setgroups(1, &strange);
     task->owner = 0;
     TAVISchedTaskEdit(task.get());
     EXPECT_EQ(run(1), 0);
@@ -156,6 +168,34 @@ TEST_F(Run, DueInThisMinute) {
     }
 }
 
+// What cron starts runs what is enabled and due.
+TEST_F(Run, RunnerLooksAtStateAndTime) {
+    const struct {
+        uint32_t minutesFromNow;
+        int state;
+        const char *rows;
+    } cases[] = {{0, 1, "1:3: "}, {1, 1, ""}, {0, 0, ""}};
+    Task task = storedTask();
+    TAVISchedCTaskSetRepeatHour(task.get(), 1);
+    TAVISchedCTaskSetLastWorkHour(task.get(), 23);
+    for (const auto &row : cases) {
+        TAVI_SCHED_DATE before{}, after{};
+        std::string seen;
+        do { // all of it within one minute
+            query("DELETE FROM task_status");
+            TAVISchedDateGet(&before);
+            task->runMin = (before.minute + row.minutesFromNow) % 60;
+            task->state = row.state;
+            TAVISchedTaskEdit(task.get());
+            EXPECT_EQ(shell(RUNNER " --run id=1"), 0);
+            waitForChildren();
+            seen = rows();
+            TAVISchedDateGet(&after);
+        } while (before.minute != after.minute);
+        EXPECT_EQ(seen, row.rows) << row.minutesFromNow << row.state;
+    }
+}
+
 // Two runners of one task, and two tasks of one application, never have live commands at once.
 TEST_F(Run, ConflictingRunsFollowEachOther) {
     for (int i = 0; i < 2; ++i) {
@@ -180,7 +220,7 @@ TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     storedTask();
     shell("mkdir -m 1777 /tmp/lock"); // root's own, but anybody's to write: it is set right
     const int other = open("/tmp/lock/lock_sched_run", O_CREAT | O_RDWR, 0600);
-    flock(other, LOCK_EX);
+    flock(other, LOCK_SH);
     EXPECT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
     shell("sleep 0.2");
     EXPECT_EQ(rows(), "");
@@ -203,6 +243,11 @@ TEST_F(Run, FollowedToItsEnd) {
     EXPECT_EQ(query("SELECT pid, status_code FROM task_status"), std::to_string(pid) + " 2 ");
     char byte = 0;
     EXPECT_EQ(recv(end, &byte, 1, MSG_DONTWAIT), -1);
+    // While it waits: the lock is free, SIGCHLD is held back, SIGINT and SIGQUIT are the command's.
+    EXPECT_EQ(shell("flock -n /tmp/lock/lock_sched_run true"), 0);
+    EXPECT_EQ(signals(std::to_string(pid), "SigBlk"), 1ULL << (SIGCHLD - 1));
+    EXPECT_EQ(signals(std::to_string(pid), "SigIgn"),
+              signals("self", "SigIgn") | 1ULL << (SIGINT - 1) | 1ULL << (SIGQUIT - 1));
     close(fifo);
     EXPECT_EQ(read(end, &byte, 1), 0);
     EXPECT_EQ(rows(), "1:7:1 ");

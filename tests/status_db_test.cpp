@@ -210,6 +210,7 @@ TEST_F(StatusDatabase, WhatOthersPutThereIsNotFollowed) {
 TEST_F(StatusDatabase, ManyMayOpenItFirst) {
     sqlite3_close(db_);
     db_ = nullptr;
+    fakes.pauseMicroseconds = 10000; // a process that is not on the CPU holds its lock for longer
     for (int round = 0; round < 20; ++round) {
         shell("rm -f /tmp/sched_status.sqlite*");
         for (int i = 0; i < 8; ++i) {

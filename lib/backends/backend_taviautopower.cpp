@@ -1,6 +1,8 @@
 // The power backend: shows the machine's power-on and power-off schedules as tasks. It stores
 // nothing of its own: the auto-power configuration is the only store, and a task's id is computed
 // from the entry that it stands for, so that an edit changes the id.
+#include "base/file.h"
+#include "base/trust.h"
 #include "change/batch.h"
 #include "change/change.h"
 #include "platc.h"
@@ -399,7 +401,35 @@ int addCrontabLine(const Entry &entry) {
     return 0;
 }
 
-int setPowerOffLines(std::span<const Entry> entries) {
+// The crontab as it is when this is made, for a failure between the removal of lines and the last
+// of the new ones: what is due meanwhile must not be missing.
+class CrontabBefore {
+  public:
+    CrontabBefore() : opened_(base::openTrusted(kCrontab, base::kOrdinaryFile)) {
+        if (opened_.found == base::Found::Trusted) {
+            content_ = base::readAll(opened_.file.get());
+        }
+    }
+    // The error stays that of the failure.
+    void putBack() const {
+        const sched::KeptError error;
+        const auto now = CrontabBefore().content_;
+        if (!content_ || now == content_) {
+            return;
+        }
+        base::Replacement crontab(kCrontab, base::processTemporary());
+        if (!crontab.open() || !crontab.write(*content_) ||
+            !crontab.commit({.like = &opened_.status, .later = true})) {
+            SCHED_LOG("%s cannot be put back: %m", kCrontab);
+        }
+    }
+
+  private:
+    base::Opened opened_;
+    std::optional<std::string> content_;
+};
+
+int replacePowerOffLines(std::span<const Entry> entries) {
     if (removeCrontabLines() < 0) {
         return -1;
     }
@@ -413,6 +443,15 @@ int setPowerOffLines(std::span<const Entry> entries) {
         }
     }
     return 0;
+}
+
+int setPowerOffLines(std::span<const Entry> entries) {
+    const CrontabBefore before;
+    const int result = replacePowerOffLines(entries);
+    if (result != 0) {
+        before.putBack();
+    }
+    return result;
 }
 
 int applyConfiguration() {

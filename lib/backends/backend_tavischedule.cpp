@@ -84,8 +84,9 @@ struct Synced {
     bool whole;
 };
 
-Synced syncCrontab() {
+Synced syncCrontab(unsigned int openFailure) {
     sched::RunnerLines lines;
+    lines.openFailure = openFailure;
     const int count = gatherLines(lines);
     if (count < 0) {
         SCHED_LOG_AT(272, "get task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
@@ -101,7 +102,7 @@ Synced syncCrontab() {
 // A failed rewrite answers the number of tasks, not -1: the change itself is stored, and the front
 // ends take only a negative answer for a change that is not. Only the log and the error state tell.
 int SyncCrontab() {
-    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false});
+    const Synced synced = sched::guarded(SCHED_SITE, [] { return syncCrontab(0); }, {-1, false});
     return synced.whole ? 0 : synced.count;
 }
 
@@ -194,7 +195,8 @@ int store() {
 // Unlike outside of a batch, a crontab that cannot be written is a failure.
 int apply() {
     sched::forgetStaged();
-    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false});
+    const Synced synced =
+        sched::guarded(SCHED_SITE, [] { return syncCrontab(sched::kOpenFailed); }, {-1, false});
     return synced.whole ? 0 : -1;
 }
 

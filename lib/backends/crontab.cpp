@@ -112,7 +112,7 @@ void signalCron() {
 int sched::rewriteCrontab(const RunnerLines &lines) {
     const File old(std::fopen(kCrontab, "re"));
     if (!old) {
-        return -1;
+        return lines.openFailure == 0 ? -1 : fail(lines.openFailure, __LINE__);
     }
     struct stat status {};
     if (fstat(fileno(old.get()), &status) != 0) {

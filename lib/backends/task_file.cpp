@@ -215,10 +215,14 @@ int copyFile(const char *from, const char *to, int line) {
     return PLATCExec("/bin/cp", arguments.data()) == 0 ? 0 : logCopyFailure(from, to, line);
 }
 
+// The persistent file may have further names: its folder is root's.
+constexpr base::TrustRule kPersistentRule{.oneName = false};
+
 // Whether the file is one that may be believed and has just this content; then it is flushed, too,
 // when it is to last.
 bool holds(const char *path, const std::string &content, bool durable) {
-    const base::Opened opened = base::openTrusted(path, base::kSharedFile);
+    const base::Opened opened =
+        base::openTrusted(path, durable ? kPersistentRule : base::kSharedFile);
     if (opened.found != base::Found::Trusted) {
         return false;
     }
@@ -349,7 +353,7 @@ bool readBefore(const char *path, const base::TrustRule &rule,
 
 bool readBefore(sched::Before::Tasks &before) {
     return readBefore(kWorkingCopy, base::kSharedFileToRead, before.working) &&
-           readBefore(kPersistent, {.groupMayWrite = true, .oneName = false}, before.persistent);
+           readBefore(kPersistent, kPersistentRule, before.persistent);
 }
 
 // Without a working copy, or with one that a failed copy left empty, a change starts from nothing
@@ -387,9 +391,12 @@ int publishWorking(const char *scratch, const std::string &content) {
         SCHED_SET_ERROR(sched::kOpenFailed);
         return logCopyFailure(scratch, kWorkingCopy, 424);
     }
-    return copyFile(scratch, kWorkingCopy, 424) != 0
-               ? -1
-               : verify(scratch, kWorkingCopy, content, false, 424);
+    if (copyFile(scratch, kWorkingCopy, 424) != 0 ||
+        verify(scratch, kWorkingCopy, content, false, 424) != 0) {
+        return -1;
+    }
+    sched::tellWorkingCopyIsWhole();
+    return 0;
 }
 
 // The persistent file first, the working copy second. What fails is taken back with the change.

@@ -5,6 +5,7 @@
 #include "sched_guard.h"
 
 #include <memory>
+#include <pthread.h>
 #include <vector>
 
 namespace {
@@ -26,6 +27,13 @@ void forgetStaged() {
     for (const sched::BatchPart &part : parts) {
         part.forget();
     }
+}
+
+// A child has no part in its parent's batch. What it holds is the parent's to end: it is left
+// alone.
+void leaveInChild() {
+    forgetStaged();
+    static_cast<void>(batch.release());
 }
 
 // What backends do from here on is done at once.
@@ -100,6 +108,8 @@ int TAVISchedChangeBegin() {
             if (!begun->change) {
                 return -1;
             }
+            static const int registered = pthread_atfork(nullptr, nullptr, leaveInChild);
+            static_cast<void>(registered);
             batch = std::move(begun);
             return 0;
         },

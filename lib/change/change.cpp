@@ -9,65 +9,96 @@
 #include "sched_paths.h"
 
 #include <cerrno>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace {
 
 bool recorded = false; // by the change of this process that goes on
 
-// Both backends bring the crontab in line with what their tasks are now. What fails is logged, and
-// the next change or sync tries again.
-void syncBackends(const sched::Before &before) {
+// Backends bring the crontab in line with what their tasks are now. What fails is logged, and the
+// next change or sync tries again.
+template <typename Concerned> void syncBackends(Concerned &&isConcerned) {
     if (TAVISchedBackendInit() != 0) {
         return;
     }
     for (const TAVI_SCHED_BACKEND_RECORD &backend : sched::registeredBackends()) {
-        const bool concerned = backend.id != TAVI_SCHED_BACKEND_AUTOPOWER || before.hasPower();
-        if (concerned && backend.sync) {
+        if (backend.sync && isConcerned(backend)) {
             backend.sync();
         }
     }
 }
 
-// What was recorded is there again; nothing when that failed, and then whoever comes next tries.
-std::optional<sched::Before> restoreRecorded() {
+// What was recorded is there again. 0, or -1, and then whoever comes next tries.
+int takeBack(const sched::Record &record, bool withCrontab) {
+    if (sched::restoreWhatIsRead(record) != 0) {
+        return -1;
+    }
+    if (withCrontab && !record.isInPlace) {
+        syncBackends([&](const TAVI_SCHED_BACKEND_RECORD &backend) {
+            return backend.id != TAVI_SCHED_BACKEND_AUTOPOWER || record.before.hasPower();
+        });
+    }
+    return sched::restorePersistent(record);
+}
+
+void takeBackOwn(bool withCrontab) {
     const sched::KeptError error;
-    return sched::guarded(
+    sched::guarded(
         SCHED_SITE,
-        []() -> std::optional<sched::Before> {
-            auto record = sched::readRecord();
-            const bool restored = record && sched::restore(*record) == 0;
-            return restored ? std::optional(std::move(record->before)) : std::nullopt;
+        [&] {
+            const auto record = sched::readRecord();
+            return record ? takeBack(*record, withCrontab) : -1;
         },
-        std::nullopt);
+        -1);
+}
+
+void logCutOff(pid_t process) {
+    SCHED_LOG("a change was cut off and is taken back, process %d", static_cast<int>(process));
+}
+
+timespec beginOf(const std::optional<sched::ChangeLock::CutOff> &left) {
+    struct stat record {};
+    return left ? left->since : stat(sched::kRecord, &record) == 0 ? record.st_mtim : timespec{};
+}
+
+int takeBackRecorded() {
+    const auto &left = sched::ChangeLock::leftBehind();
+    sched::removeLeftovers(beginOf(left));
+    const auto record = sched::readRecord();
+    if (!record || takeBack(*record, true) != 0) {
+        return -1;
+    }
+    logCutOff(record->process != 0 ? record->process : left ? left->process : 0);
+    return 0;
+}
+
+// Nothing that is recorded was overwritten: a sync was cut off, or a change before or after that.
+// The power schedules' lines alone are not written in one step.
+int finishUnrecorded() {
+    sched::tellWorkingCopyIsWhole();
+    if (const auto &left = sched::ChangeLock::leftBehind()) {
+        sched::removeLeftovers(left->since);
+        syncBackends([](const TAVI_SCHED_BACKEND_RECORD &backend) {
+            return backend.id == TAVI_SCHED_BACKEND_AUTOPOWER;
+        });
+        logCutOff(left->process);
+    }
+    return 0;
 }
 
 } // namespace
 
 int sched::takeBackCutOffChange() {
-    switch (recordState()) {
-    case RecordState::None:
-        return 0;
-    case RecordState::Unreadable:
+    const auto state = recordState();
+    if (state == RecordState::Unreadable) {
         SCHED_LOG("%s cannot be looked at: %m", kRecord);
         SCHED_SET_ERROR(kOpenFailed);
         return -1;
-    case RecordState::Present:
-        break;
     }
     return guarded(
         SCHED_SITE,
-        [] {
-            removeLeftovers();
-            const auto record = readRecord();
-            if (!record || restore(*record) != 0) {
-                return -1;
-            }
-            syncBackends(record->before);
-            SCHED_LOG("a change was cut off and is taken back, process %d",
-                      static_cast<int>(record->process));
-            return 0;
-        },
+        [&] { return state == RecordState::Present ? takeBackRecorded() : finishUnrecorded(); },
         -1);
 }
 
@@ -84,7 +115,7 @@ sched::Change::Change() {
 sched::Change::~Change() {
     if (isOutermost_ && recorded) {
         recorded = false;
-        restoreRecorded();
+        takeBackOwn(false);
     }
 }
 
@@ -93,10 +124,7 @@ void sched::Change::rollBack() {
         return;
     }
     recorded = false;
-    const KeptError error;
-    if (const auto before = restoreRecorded()) {
-        syncBackends(*before);
-    }
+    takeBackOwn(true);
 }
 
 int sched::Change::record(const Before &before) {
@@ -132,22 +160,53 @@ int sched::Change::discard() {
 // ---- Reading ----
 
 sched::Reading::Reading() : path_(kWorkingCopy) {
-    if (lock_ && recordState() == RecordState::Present && !ChangeLock::isHeldHere()) {
-        lock_.release();
-        path_ = choosePath();
-        lock_.acquire();
+    if (lock_ && lock_.isOutermost() && !ChangeLock::isHeldHere()) {
+        settle();
     }
 }
 
-// A change that goes on has the lock, and the working copy is whole whenever it can be read at all.
-// Else the change was cut off, and who has the rights takes it back.
-const char *sched::Reading::choosePath() {
-    const ChangeLock lock(ChangeLock::Wait::No);
-    if (!lock || !ChangeLock::isUsable() || takeBackCutOffChange() == 0) {
-        return kWorkingCopy;
+// No change goes on, and none was cut off.
+bool sched::Reading::isWhole() {
+    return recordState() != RecordState::Present && !ReadingLock::isUnfinished() &&
+           !ChangeLock::isMarked();
+}
+
+// While this process has the lock of reading, a working copy that is finished stays whole, and one
+// that is not was left so by a change that takes it back itself, or by one that was cut off.
+void sched::Reading::settle() {
+    if (isWhole()) {
+        return;
     }
-    return guarded(
-               SCHED_SITE, [] { return recordHasTasks(); }, false)
-               ? kRecord
-               : kWorkingCopy;
+    const bool settled = ReadingLock::waitUntil([&] {
+        lock_.release();
+        const bool isBlocked = takeBack() == Turn::Failed;
+        lock_.acquire();
+        return !lock_ || isBlocked || !ReadingLock::isUnfinished();
+    });
+    const bool isTorn = path_ == kWorkingCopy && ReadingLock::isUnfinished();
+    if (lock_ && (!settled || isTorn)) {
+        SCHED_SET_ERROR(kReadWriteFailed);
+        SCHED_LOG("%s is not whole", kWorkingCopy);
+        lock_.release();
+    }
+}
+
+// Whoever has the rights takes back what was cut off; else what was before it is read.
+sched::Reading::Turn sched::Reading::takeBack() {
+    changeLock_.emplace(ChangeLock::Wait::No);
+    if (!*changeLock_) {
+        changeLock_.reset();
+        return Turn::Others;
+    }
+    if (ChangeLock::isUsable() && takeBackCutOffChange() == 0) {
+        changeLock_.reset();
+        return Turn::Done;
+    }
+    if (guarded(
+            SCHED_SITE, [] { return recordHasTasks(); }, false)) {
+        path_ = kRecord;
+    } else {
+        changeLock_.reset();
+    }
+    return Turn::Failed;
 }

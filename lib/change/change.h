@@ -4,6 +4,8 @@
 #include "change_lock.h"
 #include "change_record.h"
 
+#include <optional>
+
 namespace sched {
 
 // One change, from before the allocation of an id to after the signal to cron. What an earlier one
@@ -48,9 +50,14 @@ class Reading {
     const char *path() const { return path_; }
 
   private:
-    static const char *choosePath();
+    enum class Turn { Done, Others, Failed };
+
+    static bool isWhole();
+    void settle();
+    Turn takeBack();
 
     ReadingLock lock_;
+    std::optional<ChangeLock> changeLock_; // while the record is read: nobody else removes it
     const char *path_;
 };
 

@@ -14,9 +14,14 @@
 #include <pthread.h>
 #include <string>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 namespace {
+
+// Of a fixed width: one in another's place leaves nothing of it.
+constexpr const char *kHolderFormat = "%10d %20lld.%09ld\n";
 
 constexpr long kPatience = 30;        // seconds
 constexpr long kPause = 5'000'000;    // nanoseconds
@@ -26,6 +31,29 @@ volatile std::sig_atomic_t waitedFor = 0; // a process
 
 base::Descriptor openLockFile(const char *path) {
     return base::Descriptor(open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600));
+}
+
+// Whether a lock's file is missing because there is no place for it, which is as good as no lock;
+// any other failure of opening it is one.
+bool isWithoutPlace(int error) {
+    switch (error) {
+    case ENOENT:
+    case ENOTDIR:
+    case EACCES:
+    case EPERM:
+    case EROFS:
+    case ENOSPC:
+    case EDQUOT:
+        return true;
+    default:
+        return false;
+    }
+}
+
+int failToOpen(const char *path) {
+    SCHED_LOG("%s cannot be opened: %m", path);
+    SCHED_SET_ERROR(sched::kLockFailed);
+    return -1;
 }
 
 // Tries until it works or patience ends.
@@ -51,6 +79,7 @@ template <typename Try> bool retry(long pause, Try &&tryOnce) {
 struct HeldLock {
     base::Descriptor file;
     int depth = 0;
+    std::optional<sched::ChangeLock::CutOff> leftBehind;
 };
 HeldLock held;
 
@@ -65,9 +94,37 @@ void forgetInChildren() {
     static_cast<void>(registered);
 }
 
-pid_t writtenHolder(int fd) {
-    std::array<char, 16> text{};
-    return pread(fd, text.data(), text.size() - 1, 0) > 0 ? std::atoi(text.data()) : 0;
+using Holder = sched::ChangeLock::CutOff;
+
+std::optional<Holder> writtenHolder(int fd) {
+    std::array<char, 64> text{};
+    int process = 0;
+    long long seconds = 0;
+    long nanoseconds = 0;
+    const bool read =
+        pread(fd, text.data(), text.size() - 1, 0) > 0 &&
+        std::sscanf(text.data(), kHolderFormat, &process, &seconds, &nanoseconds) >= 1;
+    return read && process > 0
+               ? std::optional(Holder{process, {static_cast<time_t>(seconds), nanoseconds}})
+               : std::nullopt;
+}
+
+pid_t writtenProcess(int fd) {
+    const auto holder = writtenHolder(fd);
+    return holder ? holder->process : 0;
+}
+
+// For those who wait to tell of, for the processes below, and for whoever comes after one that was
+// cut off: in one step, and with the time since when there is something to be taken back.
+void writeHolder(int fd, const std::optional<Holder> &leftBehind) {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME_COARSE, &now);
+    const timespec &since = leftBehind ? leftBehind->since : now;
+    std::array<char, 64> text{};
+    const int length =
+        std::snprintf(text.data(), text.size(), kHolderFormat, static_cast<int>(getpid()),
+                      static_cast<long long>(since.tv_sec), since.tv_nsec);
+    (void)!pwrite(fd, text.data(), static_cast<size_t>(length), 0);
 }
 
 pid_t parentOf(pid_t pid) {
@@ -102,22 +159,15 @@ Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
         return Outcome::Busy;
     }
     bool below = false;
+    pid_t known = 0;
     const bool locked = retry(kPause, [&] {
-        waitedFor = writtenHolder(fd);
-        below = isBelow(waitedFor);
+        const pid_t holder = writtenProcess(fd);
+        waitedFor = holder;
+        below = holder != std::exchange(known, holder) && isBelow(holder);
         return below || flock(fd, LOCK_EX | LOCK_NB) == 0;
     });
     waitedFor = below || !locked ? waitedFor : 0;
     return below ? Outcome::Below : locked ? Outcome::Held : Outcome::Busy;
-}
-
-// For those who wait to tell of, and for the processes below. What stays there counts for nothing
-// while nobody holds the lock.
-void writeHolder(int fd, pid_t holder) {
-    const std::string text = holder == 0 ? "" : std::to_string(holder);
-    if (ftruncate(fd, 0) == 0) {
-        (void)!pwrite(fd, text.data(), text.size(), 0);
-    }
 }
 
 } // namespace
@@ -130,6 +180,10 @@ sched::ChangeLock::ChangeLock(Wait wait) {
         return;
     }
     base::Descriptor file = openLockFile(kChangeLock);
+    if (!file && !isWithoutPlace(errno)) {
+        failToOpen(kChangeLock);
+        return;
+    }
     const Outcome outcome = file ? acquire(file.get(), wait) : Outcome::Held;
     if (outcome != Outcome::Held) {
         if (wait == Wait::HalfAMinute) {
@@ -138,13 +192,15 @@ sched::ChangeLock::ChangeLock(Wait wait) {
                       outcome == Outcome::Below
                           ? "a change waits for this process, which cannot make another one"
                           : "another change has not ended within half a minute",
-                      static_cast<int>(writtenHolder(file.get())));
+                      static_cast<int>(writtenProcess(file.get())));
         }
         return;
     }
     forgetInChildren();
+    held.leftBehind.reset();
     if (file) {
-        writeHolder(file.get(), getpid());
+        held.leftBehind = writtenHolder(file.get());
+        writeHolder(file.get(), held.leftBehind);
     }
     held.file = std::move(file);
     held.depth = 1;
@@ -156,7 +212,7 @@ sched::ChangeLock::~ChangeLock() {
         return;
     }
     if (held.file) {
-        writeHolder(held.file.get(), 0);
+        (void)!ftruncate(held.file.get(), 0);
         flock(held.file.get(), LOCK_UN);
     }
     held.file.close();
@@ -175,6 +231,15 @@ bool sched::ChangeLock::isHeldHere() {
     return held.depth > 0;
 }
 
+const std::optional<sched::ChangeLock::CutOff> &sched::ChangeLock::leftBehind() {
+    return held.leftBehind;
+}
+
+bool sched::ChangeLock::isMarked() {
+    const base::Descriptor file(open(kChangeLock, O_RDONLY | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC));
+    return file && writtenHolder(file.get());
+}
+
 sched::ChangeLock::Inherited::Inherited() {
     if (held.file) {
         fcntl(held.file.get(), F_SETFD, 0);
@@ -190,7 +255,7 @@ sched::ChangeLock::Inherited::~Inherited() {
 pid_t sched::changeLockHolder() {
     const base::Descriptor file(open(kChangeLock, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
     const bool busy = file && flock(file.get(), LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
-    return busy ? writtenHolder(file.get()) : 0;
+    return busy ? writtenProcess(file.get()) : 0;
 }
 
 // ---- Reading and writing ----
@@ -216,7 +281,7 @@ bool tryToEnter(int fd, Place place, short type) {
     }
     if (waitedFor == 0) {
         const base::Descriptor changes(open(sched::kChangeLock, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
-        waitedFor = writtenHolder(changes.get());
+        waitedFor = writtenProcess(changes.get());
     }
     return false;
 }
@@ -235,29 +300,72 @@ bool failToEnter(const char *what) {
     return false;
 }
 
+// What this process reads: a function that is handed a task may read, and change, tasks itself.
+struct OwnReading {
+    base::Descriptor file;
+    int depth = 0;
+};
+OwnReading own;
+
 } // namespace
 
-sched::ReadingLock::ReadingLock() : file_(openLockFile(kReadingLock)) {
-    acquire();
+sched::ReadingLock::ReadingLock() {
+    if (++own.depth > 1) {
+        held_ = true;
+        return;
+    }
+    own.file = openLockFile(kReadingLock);
+    if (own.file || isWithoutPlace(errno)) {
+        acquire();
+    } else {
+        failToOpen(kReadingLock);
+    }
+}
+
+sched::ReadingLock::~ReadingLock() {
+    if (--own.depth == 0) {
+        own.file.close();
+    }
 }
 
 void sched::ReadingLock::acquire() {
-    held_ = !file_ || enter(file_.get(), F_RDLCK) || failToEnter("overwritten");
-    if (file_) {
-        setLock(file_.get(), Gate, F_UNLCK);
+    held_ = !own.file || enter(own.file.get(), F_RDLCK) || failToEnter("overwritten");
+    if (own.file) {
+        setLock(own.file.get(), Gate, F_UNLCK);
     }
 }
 
 void sched::ReadingLock::release() {
-    if (file_) {
-        setLock(file_.get(), Room, F_UNLCK);
+    if (own.file) {
+        setLock(own.file.get(), Room, F_UNLCK);
     }
     held_ = false;
 }
 
+bool sched::ReadingLock::isOutermost() const {
+    return own.depth == 1;
+}
+
+bool sched::ReadingLock::isUnfinished() {
+    struct stat status {};
+    return own.file && fstat(own.file.get(), &status) == 0 && status.st_size > 0;
+}
+
+bool sched::ReadingLock::waitUntil(const std::function<bool()> &tryOnce) {
+    return retry(kShortPause, tryOnce);
+}
+
 sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
-    held_ = !file_ || enter(file_.get(), F_WRLCK) || failToEnter("read");
-    if (file_ && held_) {
+    if (!file_) {
+        held_ = isWithoutPlace(errno) || failToOpen(kReadingLock) == 0;
+        return;
+    }
+    if (own.file) {
+        setLock(own.file.get(), Room, F_UNLCK);
+    }
+    held_ = (enter(file_.get(), F_WRLCK) || failToEnter("read")) &&
+            (ftruncate(file_.get(), 1) == 0 || failToOpen(kReadingLock) == 0);
+    if (held_) {
         fcntl(file_.get(), F_SETFD, 0); // a program that overwrites tasks keeps readers away
     }
 }
@@ -266,6 +374,17 @@ sched::WritingLock::~WritingLock() {
     if (file_) {
         setLock(file_.get(), Room, F_UNLCK);
         setLock(file_.get(), Gate, F_UNLCK);
+    }
+    if (own.file) {
+        setLock(own.file.get(), Room, F_RDLCK);
+    }
+}
+
+void sched::tellWorkingCopyIsWhole() {
+    const base::Descriptor file = openLockFile(kReadingLock);
+    struct stat status {};
+    if (file && fstat(file.get(), &status) == 0 && status.st_size > 0) {
+        (void)!ftruncate(file.get(), 0);
     }
 }
 

@@ -1,11 +1,17 @@
 // The locks of a change. One lock makes changes follow one another, through whatever process they
 // come; another keeps readers away for the moment in which the working copy is overwritten.
 //
-// Where a lock's file cannot be made (no such folder, no rights) everything goes on without it.
+// Where a lock's file cannot be made (no such folder, no rights, no room) everything goes on
+// without it. What the lock files say tells whoever comes next of a change that was cut off: that
+// of changes names its holder until it is released, and that of reading is not empty until the
+// working copy is whole again.
 #pragma once
 
 #include "base/descriptor.h"
 
+#include <ctime>
+#include <functional>
+#include <optional>
 #include <sys/types.h>
 
 namespace sched {
@@ -29,6 +35,16 @@ class ChangeLock {
     // Held by this process already.
     static bool isHeldHere();
 
+    // A holder that ended without releasing it, and when it had taken it.
+    struct CutOff {
+        pid_t process;
+        timespec since;
+    };
+    // The one before this process, which holds the lock.
+    static const std::optional<CutOff> &leftBehind();
+    // Some process holds it, or was cut off while it did.
+    static bool isMarked();
+
     // While it lives, a program that is started keeps the lock beyond the end of this process: one
     // that overwrites tasks must have ended before anybody looks at them.
     class Inherited {
@@ -46,19 +62,28 @@ class ChangeLock {
 // The process that holds the lock of changes, or 0.
 pid_t changeLockHolder();
 
-// Held while the working copy is read: it is not overwritten meanwhile.
+// Held while the working copy is read: it is not overwritten meanwhile but by this process itself.
+// One within another of the same process counts as the same.
 class ReadingLock {
   public:
     ReadingLock();
+    ~ReadingLock();
+    ReadingLock(const ReadingLock &) = delete;
+    ReadingLock &operator=(const ReadingLock &) = delete;
+
     void release();
     void acquire();
 
     // False when the working copy has been in the making for half a minute; that has been logged
     // and is an error.
     explicit operator bool() const { return held_; }
+    bool isOutermost() const;
+    // The working copy was being overwritten by a process that has ended, or by a copy that failed.
+    static bool isUnfinished();
+    // Tries until it works: false after half a minute.
+    static bool waitUntil(const std::function<bool()> &tryOnce);
 
   private:
-    base::Descriptor file_;
     bool held_ = false;
 };
 
@@ -77,5 +102,8 @@ class WritingLock {
     base::Descriptor file_;
     bool held_ = false;
 };
+
+// The working copy is whole. To be called with the lock of changes.
+void tellWorkingCopyIsWhole();
 
 } // namespace sched

@@ -166,7 +166,7 @@ int putInPlace(size_t size) {
     return 0;
 }
 
-int restorePersistent(const Before::Tasks &tasks) {
+int restorePersistentFile(const Before::Tasks &tasks) {
     if (isLike(kPersistent, tasks.persistent)) {
         return 0;
     }
@@ -256,7 +256,10 @@ RecordState recordState() {
             break;
         case base::Found::Trusted:
             return RecordState::Present;
-        default:
+        case base::Found::Strange:
+            errno = EPERM;
+            return RecordState::Unreadable;
+        case base::Found::Unreadable:
             // A folder that this user may not look into has no record to obey.
             if (errno != ENOTDIR && errno != EACCES) {
                 return RecordState::Unreadable;
@@ -278,12 +281,19 @@ int writeRecord(const Before &before) {
     return result;
 }
 
+// A record whose going cannot be made durable is there again: the change is taken back then.
 int removeRecord() {
-    // The record goes first: what is beside it means nothing without it.
-    return removeFile(kRecord) == 0 && (unlink(kRecordPersistent) == 0 || errno == ENOENT) &&
-                   base::syncFolderOf(kRecord)
-               ? 0
-               : -1;
+    if (rename(kRecord, kFinished) != 0 && errno != ENOENT) {
+        return fail(kRenameFailed, "cannot go", kRecord);
+    }
+    if (!base::syncFolderOf(kRecord)) {
+        const int result = fail(kReadWriteFailed, "cannot go for good", kRecord);
+        rename(kFinished, kRecord);
+        return result;
+    }
+    unlink(kFinished);
+    unlink(kRecordPersistent);
+    return 0;
 }
 
 std::optional<Record> readRecord() {
@@ -302,17 +312,23 @@ std::optional<Record> readRecord() {
     return record;
 }
 
-int restore(const Record &record) {
-    if (record.isInPlace) {
-        return putInPlace(record.size) == 0 ? removeRecord() : -1;
-    }
+int restoreWhatIsRead(const Record &record) {
     const Before &before = record.before;
-    if (record.isWhole && ((before.tasks && restoreWorking(before.tasks->working) != 0) ||
-                           restorePower(before.power) != 0 ||
-                           (before.tasks && restorePersistent(*before.tasks) != 0))) {
+    if (record.isWhole && !record.isInPlace &&
+        ((before.tasks && restoreWorking(before.tasks->working) != 0) ||
+         restorePower(before.power) != 0)) {
         return -1;
     }
-    return removeRecord();
+    tellWorkingCopyIsWhole();
+    return 0;
+}
+
+int restorePersistent(const Record &record) {
+    const Before &before = record.before;
+    const int restored = record.isInPlace                 ? putInPlace(record.size)
+                         : record.isWhole && before.tasks ? restorePersistentFile(*before.tasks)
+                                                          : 0;
+    return restored == 0 ? removeRecord() : -1;
 }
 
 bool recordHasTasks() {

@@ -50,9 +50,11 @@ struct Record {
 // Nothing when it cannot be read, which is logged.
 std::optional<Record> readRecord();
 
-// Makes task files and power schedules what they were, and removes the record. 0, or -1 with the
-// record still there. The crontab is the caller's.
-int restore(const Record &record);
+// What was recorded is there again in two steps, between which the crontab is the caller's: first
+// the working copy and the power schedules, then the persistent file, and with it the record goes.
+// Each answers 0, or -1 with the record still there.
+int restoreWhatIsRead(const Record &record);
+int restorePersistent(const Record &record);
 
 // Puts a new working copy in the place of whatever is there, in one step. False with errno set.
 bool replaceWorkingCopy(const std::string &content);

@@ -1,7 +1,7 @@
 // What changes that were cut off leave.
 #include "leftovers.h"
 #include "base/file.h"
-#include "base/trust.h"
+#include "change_record.h"
 #include "platc.h"
 #include "sched_paths.h"
 
@@ -60,17 +60,20 @@ std::vector<std::string> sched::findScratchFiles() {
     return paths;
 }
 
-void sched::removeLeftovers() {
+void sched::removeLeftovers(const timespec &since) {
     for (const std::string &path : findScratchFiles()) {
         unlink(path.c_str());
     }
     base::removeLeftovers(kWorkingCopy);
-    struct stat record {};
-    if (stat(kRecord, &record) == 0) {
-        forEachEntry("/etc", [&](const fs::path &path) {
-            if (isTemporaryCrontab(path, record.st_mtim)) {
-                unlink(path.c_str());
-            }
-        });
+    base::removeLeftovers(kRunner);
+    base::removeLeftovers(kCrontab);
+    forEachEntry("/etc", [&](const fs::path &path) {
+        if (isTemporaryCrontab(path, since)) {
+            unlink(path.c_str());
+        }
+    });
+    unlink(kFinished);
+    if (recordState() == RecordState::None) {
+        unlink(kRecordPersistent);
     }
 }

@@ -74,11 +74,13 @@ std::string sched::findRunnerProgram() {
 
 int sched::makeRunnerLink() {
     const std::string program = findRunnerProgram();
-    const base::PrivateFolder folder(kRunner);
-    const std::string made = folder.path() + "/link";
-    if (!program.empty() && folder && symlink(program.c_str(), made.c_str()) == 0 &&
-        base::exchange(made.c_str(), kRunner)) {
-        return 0;
+    if (!program.empty()) {
+        const base::PrivateFolder folder(kRunner);
+        const std::string made = folder.path() + "/link";
+        if (folder && symlink(program.c_str(), made.c_str()) == 0 &&
+            base::exchange(made.c_str(), kRunner)) {
+            return 0;
+        }
     }
     SCHED_SET_ERROR(kOpenFailed);
     return -1;

@@ -73,15 +73,8 @@ bool makePersistent() {
            file.commit({});
 }
 
-// Exchanged in one step: the name is never free for others.
 bool makeLockFolder() {
-    if (claimSharedFolder(kRunLockFolder) == 0) {
-        return true;
-    }
-    const base::PrivateFolder folder(kRunLockFolder);
-    const std::string made = folder.path() + "/lock";
-    return folder && mkdir(made.c_str(), 0755) == 0 && chmod(made.c_str(), 0755) == 0 &&
-           base::exchange(made.c_str(), kRunLockFolder);
+    return ensureSharedFolder(kRunLockFolder) == 0;
 }
 
 // A change and a run need another copy of the largest file that they write there.
@@ -211,7 +204,9 @@ void inspectLeftovers(Inspection &inspection) {
                  " left by a change whose process is gone",
              "remove it",
              [] {
-                 removeLeftovers();
+                 for (const std::string &path : findScratchFiles()) {
+                     unlink(path.c_str());
+                 }
                  return findScratchFiles().empty();
              },
              "what was left was removed"});

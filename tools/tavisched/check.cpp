@@ -1,14 +1,12 @@
 // What is wrong with this machine. Each function looks at one thing and adds what it finds; those
 // that others build on come first, so that mending in this order leads to a machine in order.
 #include "check.h"
-#include "crontab.h"
 #include "failure.h"
 #include "files.h"
 #include "paths.h"
 #include "runs.h"
 #include "stored_form.h"
 #include "task_lines.h"
-#include "task_rules.h"
 #include "tasks.h"
 #include "text.h"
 
@@ -209,17 +207,31 @@ void inspectHeaders(Findings &findings) {
     }
 }
 
-void inspectSection(const std::string &name, const StoredForm &rules, Findings &findings) {
+// What is wrong with the values of a section; keys that no task has are passed over by readers.
+std::string faultsInWords(const std::vector<TAVI_SCHED_FAULT> &faults) {
+    std::vector<std::string> words;
+    bool isReadable = true;
+    for (const TAVI_SCHED_FAULT &fault : faults) {
+        const std::string key = "\"" + std::string(fault.key) + "\"";
+        if (fault.kind != TAVI_SCHED_FAULT_UNKNOWN_KEY) {
+            const bool isMissing = fault.kind == TAVI_SCHED_FAULT_MISSING;
+            words.push_back(isMissing ? key + " is missing" : key + ": " + fault.reason);
+            isReadable = isReadable && fault.kind == TAVI_SCHED_FAULT_VALUE;
+        }
+    }
+    return words.empty()
+               ? ""
+               : (isReadable ? "is not read as it is written: " : "is no task that can be read: ") +
+                     join(words, "; ");
+}
+
+void inspectSection(const std::string &name, Findings &findings) {
     const std::string section = "the section [" + printable(name) + "] of " + kWorkingCopy;
     Hash form;
     PLATCFileGetSection(kWorkingCopy, name.c_str(), form.address());
-    if (const auto faults = rules.faultsOf(form)) {
-        findings.push_back({section +
-                                (faults->readable ? " is not read as it is written: "
-                                                  : " is no task that can be read: ") +
-                                faults->what,
-                            "mend it in both task files by hand, or remove it there",
-                            {}});
+    if (const std::string faults = faultsInWords(form.faults()); !faults.empty()) {
+        findings.push_back(
+            {section + " " + faults, "mend it in both task files by hand, or remove it there", {}});
     } else if (form.value("id") != name) {
         findings.push_back({section + " says that its task has the id " + form.value("id"),
                             "give both the same number in both task files",
@@ -235,11 +247,10 @@ void inspectSections(Findings &findings) {
         return;
     }
     inspectHeaders(findings);
-    const StoredForm rules;
     PLATCSZLIST *names = PLATCSzListAlloc(1);
     const int count = PLATCFileEnumSection(kWorkingCopy, &names);
     for (int i = 0; i < count; ++i) {
-        inspectSection(PLATCSzListGet(names, i), rules, findings);
+        inspectSection(PLATCSzListGet(names, i), findings);
     }
     PLATCSzListFree(names);
 }
@@ -267,8 +278,7 @@ void inspectTasks(const Tasks &tasks, Findings &findings) {
                  {}});
         } else if (const auto fault = findFault(*task)) {
             findings.push_back(
-                {called(*task) + ": its \"" + std::string(fault->key) +
-                     "\" is wrong: " + fault->what,
+                {called(*task) + ": " + inWords(*fault),
                  "mend it with tavisched edit " + id + ", or where the task was made",
                  {}});
         } else if (startsLater(*task)) {
@@ -306,11 +316,10 @@ void inspectCrontabFile(const Crontab &crontab, Findings &findings) {
                             {}});
     }
     for (size_t i = 0; i < crontab.lines.size(); ++i) {
-        const CrontabLine line = parseCrontabLine(crontab.lines[i]);
-        if (line.kind == CrontabLine::Kind::Rejected &&
-            crontab.lines[i].find(kRunner) == std::string::npos) {
+        const auto why = whyCronRejects(crontab.lines[i]);
+        if (why && crontab.lines[i].find(kRunner) == std::string::npos) {
             findings.push_back({"cron ignores all of " + std::string(kCrontab) + " for its line " +
-                                    std::to_string(i + 1) + ": " + printable(line.reason),
+                                    std::to_string(i + 1) + ": " + *why,
                                 "mend the line by hand",
                                 {}});
         }

@@ -114,8 +114,7 @@ Lines reportOf(const TAVI_SCHED_TASK &stored, bool quiet) {
 void warnOfRejectedLines() {
     const auto crontab = readCrontab();
     for (size_t i = 0; crontab && i < crontab->lines.size(); ++i) {
-        const CrontabLine line = parseCrontabLine(crontab->lines[i]);
-        if (line.kind == CrontabLine::Kind::Rejected) {
+        if (whyCronRejects(crontab->lines[i])) {
             std::cerr << "tavisched: warning: cron ignores all of /etc/crontab for its line "
                       << i + 1 << "; \"tavisched check\" tells more\n";
             return;

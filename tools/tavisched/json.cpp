@@ -2,7 +2,6 @@
 #include "json.h"
 #include "failure.h"
 #include "stored_form.h"
-#include "task_rules.h"
 #include "text.h"
 #include "words.h"
 
@@ -53,13 +52,20 @@ class Import {
         }
         const size_t faultsBefore = faults_.size();
         const std::map<std::string, std::string> members = readMembers(element);
-        for (const std::string &key : form_.requiredKeys()) {
-            if (!element.isMember(key)) {
-                addFault(key, "it is missing");
+        Hash form;
+        for (const auto &[key, value] : members) {
+            if (key != kBackend) {
+                form.set(key, value);
+            }
+        }
+        for (const TAVI_SCHED_FAULT &fault : form.faults()) {
+            // A member that is there but could not be taken has been told already.
+            if (fault.kind != TAVI_SCHED_FAULT_MISSING || !element.isMember(fault.key)) {
+                addFault(fault.key, fault.reason);
             }
         }
         if (faults_.size() == faultsBefore) {
-            addTask(members);
+            addTask(members, form);
         }
     }
 
@@ -80,31 +86,24 @@ class Import {
         std::map<std::string, std::string> members;
         for (const std::string &key : element.getMemberNames()) {
             Json::Value inner;
-            if (key != kBackend && !form_.holds(key)) {
-                addFault(key, "no task has it; accepted: " + join(form_.keys(), ", "));
-            } else if (!element[key].isString() ||
-                       parseJson(element[key].asString(), true, inner) || !inner.isString()) {
+            if (!element[key].isString() || parseJson(element[key].asString(), true, inner) ||
+                !inner.isString()) {
                 addFault(key, "accepted: a string whose text is a JSON string, such as "
                               "\"\\\"daily\\\"\"");
+            } else if ((key + inner.asString()).find('\0') != std::string::npos) {
+                addFault(key, "it holds a NUL; accepted: text without one");
+            } else if (key == kBackend && !isBackend(inner.asString())) {
+                addFault(key, "accepted: -2, a task, or -3, a power schedule");
             } else {
                 members[key] = inner.asString();
-                checkMember(key, members[key]);
             }
         }
         return members;
     }
 
-    void checkMember(const std::string &key, const std::string &value) {
-        if (key == kBackend) {
-            if (value != std::to_string(TAVI_SCHED_BACKEND_SCHEDULE) &&
-                value != std::to_string(TAVI_SCHED_BACKEND_AUTOPOWER)) {
-                addFault(key, "accepted: -2, a task, or -3, a power schedule");
-            }
-            return;
-        }
-        if (const auto fault = form_.faultOf(key, value)) {
-            addFault(key, *fault);
-        }
+    static bool isBackend(const std::string &value) {
+        return value == std::to_string(TAVI_SCHED_BACKEND_SCHEDULE) ||
+               value == std::to_string(TAVI_SCHED_BACKEND_AUTOPOWER);
     }
 
     // The member "backend" tells; a text of the web back end has none, and there a power schedule
@@ -127,36 +126,22 @@ class Import {
     }
 
     // All members are good; the task as a whole may not be.
-    void addTask(const std::map<std::string, std::string> &members) {
+    void addTask(const std::map<std::string, std::string> &members, const Hash &form) {
         const bool power = isPowerSchedule(members);
         Task task = newTask(power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
-        Hash form;
-        for (const auto &[key, value] : members) {
-            form.set(key, value);
-        }
         if (TAVISchedInitTaskFromHash(form.get(), task.get()) != 0) {
             addFault("", "it cannot be read: " + libraryError());
-        } else if (const auto fault = findFault(*task)) {
-            addFault(std::string(fault->key), fault->what);
-        } else if (power) {
-            checkPower(*task);
+            return;
+        }
+        if (power && task->type == TAVI_SCHED_TYPE_DAILY) {
+            TAVISchedCTaskSetWeek(task.get(), "1111111"); // the backend looks at the days alone
+        }
+        if (const auto fault = findFault(*task)) {
+            addFault(fault->key, fault->reason);
         }
         tasks_.push_back(std::move(task));
     }
 
-    void checkPower(TAVI_SCHED_TASK &task) {
-        const std::string_view arguments(task.appArgs);
-        if (arguments != kPowerOn && arguments != kPowerOff) {
-            addFault("app args", "accepted for a power schedule: poweron, poweroff");
-        }
-        if (task.type == TAVI_SCHED_TYPE_DAILY) {
-            TAVISchedCTaskSetWeek(&task, "1111111"); // the backend looks at the days alone
-        } else if (task.type != TAVI_SCHED_TYPE_WEEKLY) {
-            addFault("type", "accepted for a power schedule: daily, weekly");
-        }
-    }
-
-    const StoredForm form_;
     int number_ = 0;
     std::vector<std::string> faults_;
     std::vector<Task> tasks_;

@@ -4,13 +4,12 @@
 #include "platc.h"
 #include "tasks.h"
 
-#include <optional>
 #include <string>
 #include <vector>
 
 namespace tavisched {
 
-// Owner of a platform hash.
+// Owner of a platform hash with a stored form.
 class Hash {
   public:
     Hash();
@@ -23,37 +22,12 @@ class Hash {
     PLATCSZHASH **address() { return &hash_; }
     void set(const std::string &key, const std::string &value);
     std::string value(const std::string &key) const; // "" for a missing key
-    bool has(const std::string &key) const;
     std::vector<std::string> keys() const;
+    // Everything that is wrong with the form.
+    std::vector<TAVI_SCHED_FAULT> faults() const;
 
   private:
     PLATCSZHASH *hash_;
-};
-
-// What a stored form may hold. The library itself is asked: a value is good when the library reads
-// it and would write the same text.
-class StoredForm {
-  public:
-    StoredForm();
-
-    const std::vector<std::string> &keys() const { return keys_; }
-    bool holds(const std::string &key) const;
-    // Those without which no task is read.
-    const std::vector<std::string> &requiredKeys() const { return required_; }
-    // What is wrong with a value of a key, or nothing.
-    std::optional<std::string> faultOf(const std::string &key, const std::string &value) const;
-    // What is wrong with a whole form, or nothing; one that the library reads may still have values
-    // that it would not write so.
-    struct Faults {
-        bool readable;
-        std::string what;
-    };
-    std::optional<Faults> faultsOf(const Hash &form) const;
-
-  private:
-    Task example_;
-    std::vector<std::string> keys_;
-    std::vector<std::string> required_;
 };
 
 } // namespace tavisched

@@ -6,11 +6,34 @@
 
 #include <algorithm>
 #include <array>
+#include <cstring>
+#include <fstream>
 #include <iterator>
+#include <sstream>
 
 namespace tavisched {
 
 namespace {
+
+struct Judgement {
+    std::optional<std::string> whyRejected;
+    TAVI_SCHED_CRON_TIMES times;
+};
+
+Judgement judge(const std::string &line) {
+    std::array<char, 512> reason{};
+    TAVI_SCHED_CRON_TIMES times{};
+    const int result =
+        TAVISchedCrontabLineCheck(line.c_str(), &times, reason.data(), reason.size());
+    if (result < 0) {
+        throw Failure("a line of the crontab cannot be judged: " + libraryError());
+    }
+    return {result > 0 ? std::optional<std::string>(reason.data()) : std::nullopt, times};
+}
+
+bool isSameTime(const TAVI_SCHED_CRON_TIMES &one, const TAVI_SCHED_CRON_TIMES &other) {
+    return std::memcmp(&one, &other, sizeof one) == 0;
+}
 
 Crontab requireCrontab() {
     auto crontab = readCrontab();
@@ -33,6 +56,24 @@ std::string idsOfRejected(const Tasks &tasks) {
 
 } // namespace
 
+std::optional<Crontab> readCrontab() {
+    std::ifstream file(kCrontab, std::ios::binary);
+    std::stringstream content;
+    if (!file || (file.peek() != EOF && !(content << file.rdbuf()))) {
+        return std::nullopt;
+    }
+    Crontab crontab;
+    for (std::string line; std::getline(content, line);) {
+        crontab.endsWithLineFeed = !content.eof();
+        crontab.lines.push_back(line);
+    }
+    return crontab;
+}
+
+std::optional<std::string> whyCronRejects(const std::string &line) {
+    return judge(line).whyRejected;
+}
+
 std::string crontabLine(const TAVI_SCHED_TASK &task) {
     std::array<char, 512> line{};
     if (TAVISchedCrontabLine(&task, line.data(), line.size()) != 0) {
@@ -42,11 +83,8 @@ std::string crontabLine(const TAVI_SCHED_TASK &task) {
 }
 
 std::optional<std::string> whyCronRejects(const TAVI_SCHED_TASK &task) {
-    if (isPower(task) || task.state != TAVI_SCHED_STATE_ENABLED) {
-        return std::nullopt;
-    }
-    const CrontabLine line = parseCrontabLine(crontabLine(task));
-    return line.kind == CrontabLine::Kind::Rejected ? std::optional(line.reason) : std::nullopt;
+    const bool hasLine = !isPower(task) && task.state == TAVI_SCHED_STATE_ENABLED;
+    return hasLine ? whyCronRejects(crontabLine(task)) : std::nullopt;
 }
 
 bool anyRejected(const Tasks &tasks) {
@@ -94,17 +132,18 @@ CrontabDifference compareCrontab(const Tasks &tasks) {
 
 bool arePowerOffLinesRight(const Tasks &tasks) {
     const Crontab crontab = requireCrontab();
-    std::vector<CronTimes> expected;
+    std::vector<TAVI_SCHED_CRON_TIMES> expected;
     for (const TAVI_SCHED_TASK *const task : tasks.all()) {
-        const CrontabLine line = parseCrontabLine(crontabLine(*task));
-        if (isEnabledPower(*task, kPowerOff) && line.kind == CrontabLine::Kind::Entry) {
-            expected.push_back(line.times);
+        const Judgement judgement = judge(crontabLine(*task));
+        if (isEnabledPower(*task, kPowerOff) && !judgement.whyRejected) {
+            expected.push_back(judgement.times);
         }
     }
     for (const std::string &line : crontab.lines) {
         if (line.find(kPowerOffCheck) != std::string::npos) {
-            const auto found =
-                std::find(expected.begin(), expected.end(), parseCrontabLine(line).times);
+            const auto found = std::find_if(
+                expected.begin(), expected.end(),
+                [times = judge(line).times](const auto &each) { return isSameTime(each, times); });
             if (found == expected.end()) {
                 return false;
             }

@@ -3,7 +3,6 @@
 // change writes the lines of all tasks.
 #pragma once
 
-#include "crontab.h"
 #include "tasks.h"
 
 #include <optional>
@@ -11,6 +10,15 @@
 #include <vector>
 
 namespace tavisched {
+
+// The lines of /etc/crontab, without their line feeds; nothing when the file cannot be read.
+struct Crontab {
+    std::vector<std::string> lines;
+    bool endsWithLineFeed = true;
+};
+std::optional<Crontab> readCrontab();
+// Why cron rejects a line, or nothing.
+std::optional<std::string> whyCronRejects(const std::string &line);
 
 using TaskPointers = std::vector<const TAVI_SCHED_TASK *>;
 

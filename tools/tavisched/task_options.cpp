@@ -2,7 +2,6 @@
 // and what is accepted.
 #include "task_options.h"
 #include "failure.h"
-#include "task_rules.h"
 #include "tasks.h"
 #include "text.h"
 #include "words.h"
@@ -10,6 +9,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cstring>
 #include <pwd.h>
 #include <string_view>
 #include <strings.h>
@@ -19,6 +19,7 @@ namespace tavisched {
 namespace {
 
 constexpr uint32_t kLastHour = 23;
+constexpr uint32_t kAnyYear = 2012; // one in which every day of the year is there
 
 [[noreturn]] void refuse(const char *option, const std::string &what) {
     throw Refusal(std::string(option) + ": " + what);
@@ -112,13 +113,17 @@ void applyMonthDay(const std::string &text, TAVI_SCHED_TASK &task) {
     TAVISchedCTaskSetMonthly(&task);
 }
 
-bool isDay(uint32_t month, uint32_t day, std::optional<uint32_t> year = std::nullopt) {
-    return month >= 1 && month <= 12 && day >= 1 && day <= daysInMonth(month, year);
+// Sets the first day of a new task of the type and answers whether there is such a day.
+bool isDay(int type, uint32_t year, uint32_t month, uint32_t day) {
+    const Task task = newTask(TAVI_SCHED_BACKEND_SCHEDULE);
+    task->type = type;
+    setStart(*task, year, month, day);
+    return !findFault(*task);
 }
 
 void applyYearDay(const std::string &text, TAVI_SCHED_TASK &task) {
     const auto date = parseNumbers<2>(text, '-');
-    if (!date || !isDay((*date)[0], (*date)[1])) {
+    if (!date || !isDay(TAVI_SCHED_TYPE_YEARLY, kAnyYear, (*date)[0], (*date)[1])) {
         refuseText("--yearly", text, "MM-DD, a month and one of its days");
     }
     setStart(task, kAnyYear, (*date)[0], (*date)[1]);
@@ -127,7 +132,7 @@ void applyYearDay(const std::string &text, TAVI_SCHED_TASK &task) {
 
 void applyDate(const std::string &text, TAVI_SCHED_TASK &task) {
     const auto date = parseNumbers<3>(text, '-');
-    if (!date || (*date)[0] < 1970 || !isDay((*date)[1], (*date)[2], (*date)[0])) {
+    if (!date || !isDay(TAVI_SCHED_TYPE_ONCE, (*date)[0], (*date)[1], (*date)[2])) {
         refuseText("--once", text, "YYYY-MM-DD, a date of the calendar");
     }
     setStart(task, (*date)[0], (*date)[1], (*date)[2]);
@@ -195,9 +200,19 @@ void applyOwner(const std::string &owner, TAVI_SCHED_TASK &task) {
     TAVISchedCTaskSetOwner(&task, static_cast<int>(user->pw_uid));
 }
 
-void requireText(const char *option, const std::string &text, size_t fieldSize) {
-    if (const auto fault = faultOfText(text, fieldSize)) {
-        refuse(option, *fault);
+// A text that a person types for a field: what can be stored in it, and no more than one line of
+// it.
+void requireText(const char *option, const char *key, const std::string &text) {
+    TAVI_SCHED_FAULT fault{};
+    if (TAVISchedValueCheck(key, text.c_str(), &fault) != 0) {
+        refuse(option, fault.reason);
+    }
+    if (!isUtf8(text)) {
+        refuse(option, "it is not valid UTF-8; accepted: one line of UTF-8");
+    }
+    if (holdsControls(text)) {
+        refuse(option,
+               "it holds a line break or another control character; accepted: one line of text");
     }
 }
 
@@ -206,19 +221,21 @@ void applyTexts(const TaskOptions &options, TAVI_SCHED_TASK &task) {
         if (options.name->empty()) {
             refuse("--name", "it is empty; accepted: one line of text");
         }
-        requireText("--name", *options.name, sizeof task.name);
+        requireText("--name", "name", *options.name);
         TAVISchedCTaskSetName(&task, options.name->c_str());
     }
     if (options.app) {
-        requireText("--app", *options.app, sizeof task.app);
+        requireText("--app", "app", *options.app);
         TAVISchedCTaskSetApp(&task, options.app->c_str());
     }
     if (options.command) {
         if (options.command->find_first_not_of(" \t\n") == std::string::npos) {
             refuse("--command", "it is empty; accepted: a command for the shell");
         }
-        if (const auto fault = faultOfCommand(*options.command)) {
-            refuse("--command", *fault);
+        if (options.command->size() > TAVI_SCHED_MAX_COMMAND) {
+            refuse("--command",
+                   std::to_string(options.command->size()) + " bytes; accepted: at most " +
+                       std::to_string(TAVI_SCHED_MAX_COMMAND) + "; put a longer one into a script");
         }
         TAVISchedCTaskSetCommand(&task, options.command->c_str());
     }
@@ -306,8 +323,8 @@ void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
     }
     // A fault that was there before cannot be helped here and must not stand in the way.
     const auto fault = findFault(task);
-    if (fault && (!faultBefore || faultBefore->what != fault->what)) {
-        throw Refusal("the task's \"" + std::string(fault->key) + "\": " + fault->what);
+    if (fault && (!faultBefore || std::strcmp(faultBefore->reason, fault->reason) != 0)) {
+        throw Refusal(called(task) + ": " + inWords(*fault));
     }
     if (options.schedule() || options.enabled) {
         refusePast(task);

@@ -64,6 +64,21 @@ Task copyOf(const TAVI_SCHED_TASK &task) {
     return copy;
 }
 
+std::optional<TAVI_SCHED_FAULT> findFault(const TAVI_SCHED_TASK &task) {
+    TAVI_SCHED_FAULT fault{};
+    const int found = TAVISchedTaskCheck(&task, &fault);
+    if (found < 0) {
+        throw Failure(called(task) + " cannot be checked: " + libraryError());
+    }
+    return found > 0 ? std::optional(fault) : std::nullopt;
+}
+
+std::string inWords(const TAVI_SCHED_FAULT &fault) {
+    return fault.key[0] == '\0'
+               ? fault.reason
+               : "its \"" + std::string(fault.key) + "\" is wrong: " + fault.reason;
+}
+
 bool isEnabledPower(const TAVI_SCHED_TASK &task, std::string_view arguments) {
     return isPower(task) && task.state == TAVI_SCHED_STATE_ENABLED && task.appArgs == arguments;
 }

@@ -4,6 +4,7 @@
 #include "tavischeduler.h"
 
 #include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -18,6 +19,9 @@ std::span<const TAVI_SCHED_BACKEND_RECORD> registeredBackends();
 // A new task with the defaults of a backend (TAVI_SCHED_BACKEND_*).
 Task newTask(int32_t backend);
 Task copyOf(const TAVI_SCHED_TASK &task);
+// What is wrong with a task, or nothing.
+std::optional<TAVI_SCHED_FAULT> findFault(const TAVI_SCHED_TASK &task);
+std::string inWords(const TAVI_SCHED_FAULT &fault);
 
 // A power-on or power-off schedule of the machine.
 inline bool isPower(const TAVI_SCHED_TASK &task) {

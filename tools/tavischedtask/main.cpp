@@ -1,8 +1,9 @@
 // The task runner that cron starts as "/tmp/tavischedtask --run id=N". It starts the task in the
-// background when it is enabled and due in this minute.
+// background when it is enabled and due in this minute. At boot "--start" makes the machine ready.
 #include "platc.h"
 #include "tavischeduler.h"
 
+#include <array>
 #include <charconv>
 #include <cstdint>
 #include <cstdio>
@@ -26,20 +27,38 @@ std::optional<int32_t> parseId(std::string_view argument) {
     return error == std::errc() && parsed == end ? std::optional(id) : std::nullopt;
 }
 
+int fail(const char *what) {
+    std::fprintf(stderr, "tavischedtask: %s: error 0x%04X (%s:%d)\n", what, PLATCErrGet(),
+                 PLATCErrorGetFile(), PLATCErrorGetLine());
+    return kExitFailed;
+}
+
+int run(int32_t id) {
+    if (TAVISchedTaskRun(id, 1, 1) == 0) {
+        return 0;
+    }
+    std::array<char, 64> what{};
+    std::snprintf(what.data(), what.size(), "task %ld could not be started", static_cast<long>(id));
+    return fail(what.data());
+}
+
+int start() {
+    return TAVISchedStart() == 0 ? 0
+                                 : fail("the machine is not ready for tasks; the system log has "
+                                        "more");
+}
+
 } // namespace
 
 int main(int argc, char **argv) {
-    const bool hasForm = argc == 3 && std::string_view(argv[1]) == "--run";
-    const std::optional<int32_t> id = hasForm ? parseId(argv[2]) : std::nullopt;
+    const std::string_view form = argc > 1 ? argv[1] : "";
+    if (argc == 2 && form == "--start") {
+        return start();
+    }
+    const auto id = argc == 3 && form == "--run" ? parseId(argv[2]) : std::nullopt;
     if (!id) {
-        std::fputs("usage: tavischedtask --run id=N\n", stderr);
+        std::fputs("usage: tavischedtask --run id=N | --start\n", stderr);
         return kExitUsage;
     }
-    if (TAVISchedTaskRun(*id, 1, 1) != 0) {
-        std::fprintf(stderr, "tavischedtask: task %ld could not be started: error 0x%04X (%s:%d)\n",
-                     static_cast<long>(*id), PLATCErrGet(), PLATCErrorGetFile(),
-                     PLATCErrorGetLine());
-        return kExitFailed;
-    }
-    return 0;
+    return run(*id);
 }

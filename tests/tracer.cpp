@@ -1,0 +1,361 @@
+// Following system calls: a filter in the traced processes stops them at the calls that count.
+#include "tracer.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <climits>
+#include <csignal>
+#include <cstddef>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <elf.h>
+#include <fcntl.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <set>
+#include <sys/prctl.h>
+#include <sys/ptrace.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/uio.h>
+#include <sys/user.h>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <vector>
+
+namespace tracer {
+
+namespace {
+
+constexpr int kNone = -1;
+
+struct Kind {
+    const char *name;
+    long number;
+    int path = kNone;       // the argument that is a path
+    int descriptor = kNone; // or a descriptor
+    int length = kNone;     // the argument that says how much is written
+    int flags = kNone;      // an open's flags
+    bool fails = true;      // with a full or broken disk
+    bool onlyFailing = false;
+};
+
+// Not every machine has the older ones.
+const std::vector<Kind> kKinds = {
+#ifdef __NR_open
+    {.name = "open", .number = __NR_open, .path = 0, .flags = 1},
+    {.name = "creat", .number = __NR_creat, .path = 0},
+    {.name = "rename", .number = __NR_rename, .path = 0},
+    {.name = "link", .number = __NR_link, .path = 0},
+    {.name = "symlink", .number = __NR_symlink, .path = 1},
+    {.name = "unlink", .number = __NR_unlink, .path = 0},
+    {.name = "mkdir", .number = __NR_mkdir, .path = 0},
+    {.name = "rmdir", .number = __NR_rmdir, .path = 0},
+    {.name = "chmod", .number = __NR_chmod, .path = 0},
+    {.name = "chown", .number = __NR_chown, .path = 0},
+    {.name = "fork", .number = __NR_fork, .onlyFailing = true},
+    {.name = "vfork", .number = __NR_vfork, .onlyFailing = true},
+#endif
+#ifdef __NR_renameat
+    {.name = "renameat", .number = __NR_renameat, .path = 1},
+#endif
+    {.name = "openat", .number = __NR_openat, .path = 1, .flags = 2},
+    {.name = "write", .number = __NR_write, .descriptor = 0, .length = 2},
+    {.name = "pwrite", .number = __NR_pwrite64, .descriptor = 0, .length = 2},
+    {.name = "writev", .number = __NR_writev, .descriptor = 0},
+    {.name = "copy_file_range", .number = __NR_copy_file_range, .descriptor = 2, .length = 4},
+    {.name = "sendfile", .number = __NR_sendfile, .descriptor = 0, .length = 3},
+    {.name = "fallocate", .number = __NR_fallocate, .descriptor = 0},
+    {.name = "renameat2", .number = __NR_renameat2, .path = 1},
+    {.name = "linkat", .number = __NR_linkat, .path = 1},
+    {.name = "symlinkat", .number = __NR_symlinkat, .path = 2},
+    {.name = "unlinkat", .number = __NR_unlinkat, .path = 1},
+    {.name = "mkdirat", .number = __NR_mkdirat, .path = 1},
+    {.name = "truncate", .number = __NR_truncate, .path = 0},
+    {.name = "ftruncate", .number = __NR_ftruncate, .descriptor = 0},
+    {.name = "fchmod", .number = __NR_fchmod, .descriptor = 0},
+    {.name = "fchmodat", .number = __NR_fchmodat, .path = 1},
+    {.name = "fchown", .number = __NR_fchown, .descriptor = 0},
+    {.name = "fchownat", .number = __NR_fchownat, .path = 1},
+    {.name = "utimensat", .number = __NR_utimensat, .descriptor = 0},
+    {.name = "fsync", .number = __NR_fsync, .descriptor = 0},
+    {.name = "fdatasync", .number = __NR_fdatasync, .descriptor = 0},
+    {.name = "read", .number = __NR_read, .descriptor = 0, .onlyFailing = true},
+    {.name = "pread", .number = __NR_pread64, .descriptor = 0, .onlyFailing = true},
+    {.name = "fstat", .number = __NR_fstat, .descriptor = 0, .onlyFailing = true},
+    {.name = "newfstatat", .number = __NR_newfstatat, .path = 1, .onlyFailing = true},
+    {.name = "flock", .number = __NR_flock, .descriptor = 0, .onlyFailing = true},
+    {.name = "clone", .number = __NR_clone, .onlyFailing = true},
+    {.name = "clone3", .number = __NR_clone3, .onlyFailing = true},
+};
+
+// ---- The filter ----
+
+void installFilter() {
+    std::vector<sock_filter> program = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr))};
+    for (const Kind &kind : kKinds) {
+        program.push_back(
+            BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(kind.number), 0, 1));
+        program.push_back(BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRACE));
+    }
+    program.push_back(BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW));
+    const sock_fprog filter{.len = static_cast<unsigned short>(program.size()),
+                            .filter = program.data()};
+    if (prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &filter) != 0) {
+        _exit(99);
+    }
+}
+
+// ---- A stopped process ----
+
+using Info = __ptrace_syscall_info;
+
+bool getInfo(pid_t pid, Info &info) {
+    return ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid, sizeof info, &info) >
+           0;
+}
+
+std::string readText(pid_t pid, uint64_t address) {
+    std::array<char, PATH_MAX> text{};
+    iovec local{text.data(), text.size() - 1};
+    // A page at a time: what follows the text need not be there.
+    constexpr uint64_t kPage = 4096;
+    local.iov_len = kPage - address % kPage;
+    const iovec remote{reinterpret_cast<void *>(address), local.iov_len};
+    if (process_vm_readv(pid, &local, 1, &remote, 1, 0) <= 0) {
+        return "?";
+    }
+    return text.data();
+}
+
+std::string pathOfDescriptor(pid_t pid, uint64_t number) {
+    std::array<char, PATH_MAX> target{};
+    const std::string name =
+        "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(static_cast<int>(number));
+    return readlink(name.c_str(), target.data(), target.size() - 1) > 0 ? target.data() : "?";
+}
+
+#if defined(__x86_64__)
+bool setArgument(pid_t pid, int argument, uint64_t value) {
+    constexpr std::array<size_t, 6> kOffsets = {offsetof(user, regs.rdi), offsetof(user, regs.rsi),
+                                                offsetof(user, regs.rdx), offsetof(user, regs.r10),
+                                                offsetof(user, regs.r8),  offsetof(user, regs.r9)};
+    return ptrace(PTRACE_POKEUSER, pid, kOffsets[static_cast<size_t>(argument)], value) == 0;
+}
+bool failCall(pid_t pid, int error) {
+    return ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.orig_rax), -1L) == 0 &&
+           ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.rax), -static_cast<long>(error)) == 0;
+}
+#elif defined(__aarch64__)
+bool setRegister(pid_t pid, int number, uint64_t value) {
+    user_regs_struct registers{};
+    iovec all{&registers, sizeof registers};
+    if (ptrace(PTRACE_GETREGSET, pid, NT_PRSTATUS, &all) != 0) {
+        return false;
+    }
+    registers.regs[number] = value;
+    return ptrace(PTRACE_SETREGSET, pid, NT_PRSTATUS, &all) == 0;
+}
+bool setArgument(pid_t pid, int argument, uint64_t value) {
+    return setRegister(pid, argument, value);
+}
+bool failCall(pid_t pid, int error) {
+    int none = -1;
+    iovec number{&none, sizeof none};
+    return ptrace(PTRACE_SETREGSET, pid, NT_ARM_SYSTEM_CALL, &number) == 0 &&
+           setRegister(pid, 0, static_cast<uint64_t>(-static_cast<int64_t>(error)));
+}
+#else
+bool setArgument(pid_t, int, uint64_t) {
+    return false;
+}
+bool failCall(pid_t, int) {
+    return false;
+}
+#endif
+
+// ---- Following ----
+
+class Following {
+  public:
+    Following(pid_t caller, const Plan &plan, const std::function<void(const Call &)> &onCall)
+        : caller_(caller), plan_(plan), onCall_(onCall), processes_{caller} {}
+
+    Run follow() {
+        int status = 0;
+        pid_t pid = 0;
+        while (!processes_.empty() && (pid = waitpid(-1, &status, __WALL)) > 0) {
+            if (!WIFSTOPPED(status)) {
+                processes_.erase(pid);
+                run_.status = pid == caller_ ? status : run_.status;
+            } else {
+                resume(pid, onStop(pid, status));
+            }
+        }
+        return run_;
+    }
+
+  private:
+    // The signal to go on with.
+    int onStop(pid_t pid, int status) {
+        const bool isNew = processes_.insert(pid).second;
+        const int signal = WSTOPSIG(status);
+        switch (status >> 16) {
+        case 0:
+            break;
+        case PTRACE_EVENT_SECCOMP:
+            onCall(pid);
+            return 0;
+        case PTRACE_EVENT_FORK:
+        case PTRACE_EVENT_VFORK:
+        case PTRACE_EVENT_CLONE: {
+            unsigned long child = 0;
+            ptrace(PTRACE_GETEVENTMSG, pid, nullptr, &child);
+            fresh_.insert(static_cast<pid_t>(child));
+            return 0;
+        }
+        default:
+            return 0;
+        }
+        if (signal == (SIGTRAP | 0x80)) {
+            cut_ = 0; // the shortened write has been done
+            kill(processes_);
+            return 0;
+        }
+        // A new process begins with a stop of the tracer's.
+        const bool first = fresh_.erase(pid) > 0 || isNew;
+        return signal == SIGSTOP && first ? 0 : signal;
+    }
+
+    void onCall(pid_t pid) {
+        Info info{};
+        const bool known = getInfo(pid, info);
+        const auto kind = std::find_if(kKinds.begin(), kKinds.end(), [&](const Kind &one) {
+            return static_cast<uint64_t>(one.number) == info.seccomp.nr;
+        });
+        if (!known || kind == kKinds.end() || !counts(*kind, pid, info)) {
+            return;
+        }
+        const Call call = describe(*kind, pid, info);
+        if (plan_.calls == Calls::Failing && call.path.starts_with("/dev/")) {
+            return;
+        }
+        ++run_.points;
+        if (onCall_) {
+            onCall_(call);
+        }
+        if (run_.points == plan_.point) {
+            run_.call = call;
+            act(*kind, pid, info);
+        }
+    }
+
+    bool counts(const Kind &kind, pid_t pid, const Info &info) const {
+        const bool failing = plan_.calls == Calls::Failing;
+        const uint64_t *const arguments = info.seccomp.args;
+        const bool changes =
+            kind.flags == kNone || (arguments[kind.flags] & (O_CREAT | O_TRUNC)) != 0;
+        if (kind.onlyFailing || !changes) {
+            return failing && pid == caller_;
+        }
+        return true;
+    }
+
+    Call describe(const Kind &kind, pid_t pid, const Info &info) const {
+        const uint64_t *const arguments = info.seccomp.args;
+        std::string path = kind.path != kNone ? readText(pid, arguments[kind.path])
+                           : kind.descriptor != kNone
+                               ? pathOfDescriptor(pid, arguments[kind.descriptor])
+                               : "";
+        return {.name = kind.name,
+                .path = std::move(path),
+                .isPrograms = pid != caller_,
+                .isWrite = kind.length != kNone};
+    }
+
+    void act(const Kind &kind, pid_t pid, const Info &info) {
+        run_.acted = true;
+        switch (plan_.act) {
+        case Act::Nothing:
+            break;
+        case Act::KillAll:
+            kill(processes_);
+            break;
+        case Act::KillCaller:
+            kill({caller_});
+            break;
+        case Act::KillProgram:
+            kill({pid});
+            break;
+        case Act::HalfThenKillAll:
+            run_.acted = setArgument(pid, kind.length, halfOf(kind, pid, info));
+            cut_ = run_.acted ? pid : 0;
+            break;
+        case Act::Fail:
+            run_.acted = failCall(pid, plan_.error);
+            break;
+        }
+    }
+
+    // Programs ask for more than there is.
+    static uint64_t halfOf(const Kind &kind, pid_t pid, const Info &info) {
+        const uint64_t length = info.seccomp.args[kind.length];
+        struct stat source {};
+        const uint64_t from = info.seccomp.args[kind.number == __NR_copy_file_range ? 0 : 1];
+        const std::string path = "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(from);
+        const bool copies = kind.length > 2 && stat(path.c_str(), &source) == 0;
+        return (copies ? std::min(length, static_cast<uint64_t>(source.st_size)) : length) / 2;
+    }
+
+    static void kill(const std::set<pid_t> &processes) {
+        for (const pid_t pid : processes) {
+            ::kill(pid, SIGKILL);
+        }
+    }
+
+    void resume(pid_t pid, int signal) const {
+        ptrace(pid == cut_ ? PTRACE_SYSCALL : PTRACE_CONT, pid, nullptr, static_cast<long>(signal));
+    }
+
+    pid_t caller_;
+    const Plan &plan_;
+    const std::function<void(const Call &)> &onCall_;
+    std::set<pid_t> processes_;
+    std::set<pid_t> fresh_;
+    pid_t cut_ = 0; // the process whose shortened write is being done
+    Run run_;
+};
+
+} // namespace
+
+#if defined(__x86_64__) || defined(__aarch64__)
+const bool kCanChangeCalls = true;
+#else
+const bool kCanChangeCalls = false;
+#endif
+
+Run run(const std::function<int()> &operation, const Plan &plan,
+        const std::function<void(const Call &)> &onCall) {
+    const pid_t caller = fork();
+    if (caller == 0) {
+        ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
+        raise(SIGSTOP);
+        installFilter();
+        _exit(operation());
+    }
+    int status = 0;
+    if (waitpid(caller, &status, 0) != caller || !WIFSTOPPED(status)) {
+        std::abort();
+    }
+    ptrace(PTRACE_SETOPTIONS, caller, nullptr,
+           static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
+                             PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP | PTRACE_O_TRACESYSGOOD |
+                             PTRACE_O_EXITKILL));
+    ptrace(PTRACE_CONT, caller, nullptr, nullptr);
+    return Following(caller, plan, onCall).follow();
+}
+
+} // namespace tracer

@@ -1,0 +1,49 @@
+// Runs an operation in a child process, follows every process that it starts, and acts at its n-th
+// system call of a kind: kills, cuts a write short, or makes the call fail.
+#pragma once
+
+#include <functional>
+#include <string>
+#include <sys/types.h>
+
+namespace tracer {
+
+// False where the tracer cannot change a system call's numbers: kills alone work there.
+extern const bool kCanChangeCalls;
+
+// Which calls count.
+enum class Calls {
+    Changing, // those that change files, folders or their attributes, and flushes
+    Failing,  // of those the ones that a machine in trouble fails, and of the operation's own
+              // process also opens, reads and the start of programs
+};
+
+enum class Act { Nothing, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
+
+struct Plan {
+    Calls calls = Calls::Changing;
+    size_t point = 0; // from 1 on; 0 is never reached
+    Act act = Act::Nothing;
+    int error = 0; // for Fail
+};
+
+struct Call {
+    std::string name;
+    std::string path; // the first that it names, or that of its descriptor
+    bool isPrograms = false;
+    bool isWrite = false; // of a length that can be cut short
+};
+
+struct Run {
+    size_t points = 0; // calls that counted
+    bool acted = false;
+    Call call;      // the one at the point
+    int status = 0; // wait status of the operation's process
+};
+
+// The operation's result is its process's exit status. `onCall` sees every call that counts before
+// it is made. Returns when all processes have ended.
+Run run(const std::function<int()> &operation, const Plan &plan,
+        const std::function<void(const Call &)> &onCall = {});
+
+} // namespace tracer

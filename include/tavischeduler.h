@@ -287,7 +287,8 @@ TAVI_SCHED_API int TAVISchedTaskGetByID(int32_t id, TAVI_SCHED_TASK *pTask);
  */
 TAVI_SCHED_API int TAVISchedTaskLoad(int32_t id, TAVI_SCHED_TASK *pTask);
 /* Stores a new task in its backend, which sets the task's id, and its name when that is empty; its
- * next trigger time is not computed. 0x2000 when no backend serves it. */
+ * next trigger time is not computed. The task must not be NULL. 0x2000 when no backend serves it.
+ */
 TAVI_SCHED_API int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask);
 /* Replaces the stored task of the same id. Returns the backend's result. */
 TAVI_SCHED_API int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask);

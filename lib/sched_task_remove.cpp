@@ -37,7 +37,7 @@ int TAVISchedTaskRemove(int32_t id) {
     sched::ChangeHook hook(SCHED_SITE, "task_remove", &oldTask, nullptr);
     const int result = hook.initialised() ? removeBetweenHooks(hook, id, oldTask.backend) : -1;
     if (sched::isBatchOpen()) {
-        sched::deferHook(std::move(hook), result);
+        sched::deferHook(hook, result);
     } else {
         hook.after(result);
     }

@@ -50,8 +50,8 @@ std::vector<std::string> leftovers() {
     std::vector<std::string> found;
     for (const char *const folder : {"/tmp", "/usr/tavi/etc", "/etc"}) {
         for (const std::string &path : entriesOf(folder)) {
-            const bool isKnown = path == kWorking || path == kPersistent || path == kPower ||
-                                 path == std::string(kPersistent) + ".lock" ||
+            const bool isKnown = path == kRunner || path == kWorking || path == kPersistent ||
+                                 path == kPower || path == std::string(kPersistent) + ".lock" ||
                                  path == std::string(kPersistent) + ".reading";
             const bool isMine = folder != std::string("/etc") || path.starts_with("/etc/crontab.");
             if (!isKnown && isMine) {

@@ -247,10 +247,11 @@ int rename(const char *from, const char *to) noexcept {
 }
 
 int fsync(int fd) {
-    const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd));
+    std::error_code error;
+    const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd), error);
     support::calledOnFiles.push_back("fsync " + path.string());
     const bool fails =
-        fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path));
+        fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path, error));
     errno = EIO;
     return fails ? -1 : support::next<int (*)(int)>("fsync")(fd);
 }

@@ -26,6 +26,7 @@ using testing::IsEmpty;
 
 constexpr const char *kWorking = "/tmp/scheduled_tasks";
 constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+constexpr const char *kRunner = "/tmp/tavischedtask";
 constexpr const char *kCrontab = "/etc/crontab";
 constexpr const char *kForeignCrontab = "SHELL=/bin/sh\n17 *\t* * *\troot\ttrue\n";
 // The line of a task with id 1 that has the default schedule.

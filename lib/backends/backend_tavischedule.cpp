@@ -10,6 +10,7 @@
 #include "sched_field.h"
 #include "sched_guard.h"
 #include "sched_handle.h"
+#include "staged_tasks.h"
 #include "task_file.h"
 #include "tavischeduler.h"
 
@@ -17,6 +18,7 @@
 #include <array>
 #include <cstdio>
 #include <cstring>
+#include <functional>
 #include <string_view>
 #include <sys/wait.h>
 
@@ -42,7 +44,7 @@ int ListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
         }
         return true;
     };
-    if (sched::forEachStoredTask({.fresh = true, .onTask = keep}) != 0) {
+    if (sched::forEachStoredTask({.fresh = true, .onTask = std::ref(keep)}) != 0) {
         return -1;
     }
     tasks.appendTo(pTaskList);
@@ -64,7 +66,7 @@ int GetNextId(int32_t *pID) {
 // ---- Crontab ----
 
 // The lines stand in the order in which the tasks were read, which is that of their records.
-int gatherLines(sched::RunnerLines &lines) {
+int gatherLines(sched::RunnerLines &lines, int &unreadable) {
     int count = 0;
     const auto add = [&](const char *, TAVI_SCHED_TASK *task) {
         ++count;
@@ -75,35 +77,43 @@ int gatherLines(sched::RunnerLines &lines) {
         }
         return true;
     };
-    const auto keep = [&](const char *section) { lines.unreadable.emplace_back(section); };
+    const auto keep = [&](const char *section) {
+        if (sched::idOfSection(section)) {
+            lines.unreadable.emplace_back(section);
+        }
+        ++unreadable;
+    };
     return sched::forEachStoredTask({.onTask = add, .onUnreadable = keep}) == 0 ? count : -1;
 }
 
 struct Synced {
     int count; // of tasks, or -1
-    bool whole;
+    bool isWritten;
+    int unreadable; // sections whose lines stayed as they were
 };
 
 Synced syncCrontab(unsigned int openFailure) {
     sched::RunnerLines lines;
     lines.openFailure = openFailure;
-    const int count = gatherLines(lines);
+    int unreadable = 0;
+    const int count = gatherLines(lines, unreadable);
     if (count < 0) {
         SCHED_LOG_AT(272, "get task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
-        return {count, false};
+        return {count, false, unreadable};
     }
-    const bool whole = sched::rewriteCrontab(lines) == 0 && lines.unreadable.empty();
-    if (!whole) {
+    const bool isWritten =
+        sched::guarded(SCHED_SITE, [&] { return sched::rewriteCrontab(lines); }) == 0;
+    if (!isWritten || unreadable > 0) {
         SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
     }
-    return {count, whole};
+    return {count, isWritten, unreadable};
 }
 
 // A failed rewrite answers the number of tasks, not -1: the change itself is stored, and the front
 // ends take only a negative answer for a change that is not. Only the log and the error state tell.
 int SyncCrontab() {
-    const Synced synced = sched::guarded(SCHED_SITE, [] { return syncCrontab(0); }, {-1, false});
-    return synced.whole ? 0 : synced.count;
+    const Synced synced = sched::guarded(SCHED_SITE, [] { return syncCrontab(0); }, {-1, false, 0});
+    return synced.isWritten && synced.unreadable == 0 ? 0 : synced.count;
 }
 
 bool crontabIsStaged = false; // a batch asks for the crontab at its end
@@ -173,7 +183,7 @@ int Remove(int32_t id) {
         return -1;
     }
     if (removed == 0) {
-        return change.discard();
+        return 0;
     }
     return finishChange(change, 502) == 0 ? 1 : -1;
 }
@@ -184,8 +194,21 @@ bool isTouched() {
     return crontabIsStaged || sched::isAnyTaskStaged();
 }
 
+int unreadableBefore = 0; // sections that no batch can be blamed for
+
+int countUnreadable() {
+    int count = 0;
+    return sched::forEachStoredTask({.onTask = [](const char *, TAVI_SCHED_TASK *) { return true; },
+                                     .onUnreadable = [&](const char *) { ++count; }}) == 0
+               ? count
+               : -1;
+}
+
 int describe(sched::Before &before) {
-    return sched::isAnyTaskStaged() ? sched::describeStaged(before) : 0;
+    unreadableBefore = countUnreadable();
+    return unreadableBefore < 0 || (sched::isAnyTaskStaged() && sched::describeStaged(before) != 0)
+               ? -1
+               : 0;
 }
 
 int store() {
@@ -196,8 +219,8 @@ int store() {
 int apply() {
     sched::forgetStaged();
     const Synced synced =
-        sched::guarded(SCHED_SITE, [] { return syncCrontab(sched::kOpenFailed); }, {-1, false});
-    return synced.whole ? 0 : -1;
+        sched::guarded(SCHED_SITE, [] { return syncCrontab(sched::kOpenFailed); }, {-1, false, 0});
+    return synced.isWritten && synced.unreadable <= unreadableBefore ? 0 : -1;
 }
 
 void forget() {

@@ -24,6 +24,6 @@ bool isBatchOpen();
 
 // Keeps a hook until the batch ends: its POST phase runs then, with the result of its operation, or
 // with -1 when the batch is rolled back.
-void deferHook(ChangeHook hook, int result);
+void deferHook(ChangeHook &hook, int result);
 
 } // namespace sched

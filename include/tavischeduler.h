@@ -359,6 +359,14 @@ TAVI_SCHED_API int TAVISchedStart(void);
 TAVI_SCHED_API int TAVISchedChangeBegin(void);
 TAVI_SCHED_API int TAVISchedChangeCommit(void);
 TAVI_SCHED_API int TAVISchedChangeRollback(void);
+/* The process whose change this one waits for at this moment, or waited for in vain in the last
+ * call that failed with 0x0400; else 0. May be called in a signal handler, so that a program can
+ * say what it waits for. */
+TAVI_SCHED_API int32_t TAVISchedWaitedFor(void);
+
+/* Whether the machine has a clock that can switch it on, which an enabled power-on schedule needs:
+ * 0 it has, 1 it has none, and the buffer tells why, -1. */
+TAVI_SCHED_API int TAVISchedPowerOnCheck(char *szReason, size_t cbReason);
 
 /* Sorts a list by a row of the field table, 0 to 30 (not checked). Direction 1 is ascending, any
  * other the exact reverse. Text fields order by their bytes. Number fields order by where the tasks
@@ -458,21 +466,34 @@ TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
 /* The same for the newest run of every task that has one, in the order of their ids. */
 TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
                                              void *pContext);
+/* When the run of a row ended (seconds since the epoch): 1 known, 0 it goes on or that is not
+ * known, -1. */
+TAVI_SCHED_API int TAVISchedDBGetEnd(struct sqlite3 *db, int32_t statusId, int32_t *pTimestamp);
 
 /* ---- What is wrong with the machine ---- */
 
 typedef struct TAVI_SCHED_FINDING {
     struct TAVI_SCHED_FINDING *next;
-    char name[32];     /* what was looked at, a stable word: "runner", "task files", ... */
-    char what[2048];   /* what is wrong; texts of tasks stand in it as they are */
-    char advice[1024]; /* what to do about it */
-    int32_t canRepair; /* 1 = TAVISchedFindingRepair can do it without a person */
-    int32_t isNote;    /* 1 = nothing is wrong yet */
+    char name[32];       /* what was looked at, a stable word; see TAVISchedMachineCheckOf */
+    char what[2048];     /* what is wrong; texts of tasks stand in it as they are */
+    char advice[1024];   /* what to do about it */
+    char repaired[1024]; /* what a repair has done about it; "" when it is for a person */
+    int32_t canRepair;   /* 1 = TAVISchedFindingRepair can do it without a person */
+    int32_t isNote;      /* 1 = nothing is wrong yet */
 } TAVI_SCHED_FINDING;
 
-/* Looks at everything that scheduled tasks need, with root's rights. Returns how many findings
- * there are; the head is overwritten with a list of them, those first on which others build. */
+/* Looks at everything that scheduled tasks need, with root's rights, when no change goes on.
+ * Returns how many findings there are; the head is overwritten with a list of them, those first on
+ * which others build. */
 TAVI_SCHED_API int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings);
+/* The same, but looks only at what is named, the names ended by NULL, and waits for no change:
+ *   "room" on the file systems, "folders", "task files" that are not the tasks, "missing files",
+ *   "put aside" tasks, "leftovers" of dead processes, "runner", "cron", "crontab" as a file,
+ *   "sections" of the working copy, "tasks", "power" schedules, "lines" of the crontab,
+ *   "status database", "plug-ins".
+ * 0x0D00 for another name. */
+TAVI_SCHED_API int TAVISchedMachineCheckOf(const char *const *rgszNames,
+                                           TAVI_SCHED_FINDING **ppFindings);
 /* Repairs one: 0 when it is not found any more, else -1. Others may be gone or new afterwards. */
 TAVI_SCHED_API int TAVISchedFindingRepair(const TAVI_SCHED_FINDING *pFinding);
 /* Frees all findings of a list and empties the head. */

@@ -54,12 +54,20 @@ bool isTemporaryCrontab(const fs::path &path, const timespec &since) {
 
 } // namespace
 
-void sched::removeLeftovers(const timespec &since) {
-    forEachEntry("/tmp", [](const fs::path &path) {
+std::vector<std::string> sched::findScratchFiles() {
+    std::vector<std::string> paths;
+    forEachEntry("/tmp", [&](const fs::path &path) {
         if (isScratchOfTheDead(path.native())) {
-            unlink(path.c_str());
+            paths.push_back(path.native());
         }
     });
+    return paths;
+}
+
+void sched::removeLeftovers(const timespec &since) {
+    for (const std::string &path : findScratchFiles()) {
+        unlink(path.c_str());
+    }
     base::removeLeftovers(kWorkingCopy);
     base::removeLeftovers(kRunner);
     base::removeLeftovers(kCrontab);

@@ -12,17 +12,18 @@ later=99.0.0
 crontab=/etc/crontab
 check=/usr/tavi/bin/tavi_poweroff_feasible_check
 tasks=/usr/tavi/etc/scheduled_tasks
-log=${2:-$debs}/log
+own=/home/package_test # what the test itself keeps, in the sandbox
+log=$own/log
 
 step() { printf 'package_test: %s\n' "$*"; }
 fail() { printf 'package_test: FAILED: %s\n' "$*" >&2; exit 1; }
 expect() { local what=$1; shift; "$@" || fail "$what"; }
 quietly() { "$@" >"$log" 2>&1 </dev/null || { cat "$log" >&2; fail "$*"; }; }
 manage() { quietly dpkg --force-confdef --force-confold "$@"; }
-files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T /mnt; }
-expect_same() { expect "$1 changed $2" cmp "$2" "/mnt/${2##*/}"; }
+files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T $own; }
+expect_same() { expect "$1 changed $2" cmp "$2" "$own/${2##*/}"; }
 expect_own_crontab() { # as it was before the installation
-    expect "after $1 $crontab is not the machine's own" cmp $crontab /mnt/crontab.own
+    expect "after $1 $crontab is not the machine's own" cmp $crontab $own/crontab.own
     expect "$1 changed mode or owner of $crontab" [ "$(stat -c %a:%U:%G $crontab)" = 640:root:adm ]
 }
 expect_only_cron_missing() {
@@ -43,6 +44,7 @@ if [ $# -eq 1 ]; then
     expect "$1 is not configured with the prefix /usr" [ -f "$1/CPackConfig.cmake" ]
     sudo=; [ "$(id -u)" -eq 0 ] || sudo="sudo -n"
     $sudo true || { step "skipped: needs root or sudo"; exit 77; }
+    log=$debs/log
     rm -rf "$debs"
     mkdir "$debs"
     cd "$1"
@@ -51,17 +53,17 @@ if [ $# -eq 1 ]; then
     quietly cpack -G DEB -B packages/now
     quietly cpack -G DEB -B packages/later -D CPACK_PACKAGE_VERSION=$later
     umask 022
-    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" /mnt
+    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" inside
 fi
 
 # What lies in /usr/local on the machine is not tested, and nothing of the environment counts.
 export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive
 unset LD_LIBRARY_PATH LIBRARY_PATH CPATH PKG_CONFIG_PATH CMAKE_PREFIX_PATH
 rm -rf /usr/tavi
-mount -t tmpfs layers /mnt
+mkdir $own
 for folder in /usr/*/ /var/; do
-    mkdir -p "/mnt$folder"{upper,work}
-    mount -t overlay overlay -o "lowerdir=$folder,upperdir=/mnt${folder}upper,workdir=/mnt${folder}work" "$folder"
+    mkdir -p "$own$folder"{upper,work}
+    mount -t overlay overlay -o "lowerdir=$folder,upperdir=$own${folder}upper,workdir=$own${folder}work" "$folder"
 done
 mount -t tmpfs local /usr/local
 manage --purge tavischeduler-dev tavischeduler # where the machine has them
@@ -71,8 +73,8 @@ touch /usr/tavi/bin/of-the-machine
 printf '%s\n' 'SHELL=/bin/sh' '# tavischedtask' '0 5 * * * root /opt/tavischedtask' > $crontab
 chown root:adm $crontab
 chmod 640 $crontab
-cp $crontab /mnt/crontab.own
-files > /mnt/files
+cp $crontab $own/crontab.own
+files > $own/files
 
 step "installation"
 manage -i "$debs"/now/*.deb
@@ -95,15 +97,15 @@ expect_only_cron_missing
 
 step "programs built over the installed package"
 # shellcheck disable=SC2046 # a list of words
-quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler sqlite3)
-quietly cmake -S "$source/examples" -B /mnt/example
-quietly cmake --build /mnt/example
+quietly cc "$source/examples/task.c" -o $own/task $(pkg-config --cflags --libs tavischeduler sqlite3)
+quietly cmake -S "$source/examples" -B $own/example
+quietly cmake --build $own/example
 
 step "tasks"
 id=$(tavisched add -q --name Nightly --command 'id -un > /tmp/ran' --daily --at 03:00 --owner nobody)
 quietly tavisched add --power off --weekly Mon --at 04:00
 expect "the task is not listed" grep -q Nightly <(tavisched list)
-expect "a program built over the package does not find the task" grep -q Nightly <(/mnt/task show "$id")
+expect "a program built over the package does not find the task" grep -q Nightly <($own/task show "$id")
 quietly tavisched run "$id" --wait
 expect "the task did not run as its owner" grep -qx nobody /tmp/ran
 rm /tmp/ran
@@ -116,7 +118,7 @@ quietly systemd-tmpfiles --create tavischeduler.conf
 expect "the power-off check is not made" cmp $check /usr/share/tavischeduler/${check##*/}
 echo '# changed on this machine' >> $check
 chmod 700 $check
-cp $check $tasks $crontab /mnt
+cp $check $tasks $crontab $own
 quietly systemd-tmpfiles --create tavischeduler.conf
 expect_same boot $check
 expect "boot changed the mode of $check" [ "$(stat -c %a $check)" = 700 ]
@@ -135,12 +137,12 @@ expect "removal left the runner's link" [ ! -L /tmp/tavischedtask ]
 
 step "re-installation"
 manage -i "$debs"/later/*.deb
-expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort /mnt/crontab)
+expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort $own/crontab)
 expect_same re-installation $check
 expect_only_cron_missing
 
 step "purge"
 manage --purge tavischeduler-dev tavischeduler
 expect_own_crontab purge
-expect "purge left or took files" diff /mnt/files <(files)
+expect "purge left or took files" diff $own/files <(files)
 step "passed"

@@ -64,6 +64,8 @@ void writeFile(const std::string &path, const std::string &content);
 struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Waits until a shell command succeeds, for two minutes at most.
+bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.
 std::string query(const std::string &sql);
 // Waits until all detached children of this process have ended.

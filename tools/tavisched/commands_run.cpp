@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <string>
+#include <sys/prctl.h>
 #include <unistd.h>
 
 namespace tavisched {
@@ -61,6 +62,11 @@ Tasks readTasks() {
 
 int run(const Ids &ids, bool wait) {
     const Tasks tasks = readTasks();
+    // What is waited for stays below us: when a plug-in handler waits for a task that reads tasks,
+    // the task knows that the change which it would wait for waits for it.
+    if (wait && prctl(PR_SET_CHILD_SUBREAPER, 1) != 0) {
+        throw Failure("no task was started: " + systemReason());
+    }
     std::vector<Started> runs;
     for (const TAVI_SCHED_TASK *const task : tasks.select(ids)) {
         runs.push_back(start(*task));

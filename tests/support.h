@@ -49,6 +49,8 @@ extern Fakes fakes;
 std::vector<std::string> logs(bool stable = false);
 // The last of them, or "".
 std::string lastLog(bool stable = false);
+// The same for lines at LOG_INFO, which tell of no failure.
+std::vector<std::string> notices();
 // The arguments of all calls of sleep() and usleep() since the last call, in microseconds.
 std::vector<long> pauses();
 

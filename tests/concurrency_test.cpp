@@ -1,6 +1,7 @@
 // Several processes at once: writers and readers through the library, the tool and the runner,
 // plug-in handlers that use the library themselves, and another user who interferes in /tmp.
 #include "machine.h"
+#include "tracer.h"
 
 #include <array>
 #include <atomic>
@@ -154,12 +155,49 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
         shared().errors.load(), shared().missing.load());
     EXPECT_EQ(failed, 0) << testing::PrintToString(logs());
     EXPECT_EQ(ours, kWriters);
-    EXPECT_GE(tools, added);
+    EXPECT_EQ(tools, kWriters) << readFile("/run/output");
+    EXPECT_EQ(tools, added);
     EXPECT_EQ(std::set<int>(ids.begin(), ids.end()).size(), ours + tools + 1);
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
     EXPECT_EQ(linesOf(kCrontab, "--run id=").size(), ids.size());
     EXPECT_GT(shared().looks, kReaders);
     EXPECT_EQ(shared().fewer + shared().errors + shared().missing, 0);
+}
+
+// A copy that dies in the middle leaves the working copy torn until the change has taken it back.
+TEST_F(Concurrency, ReadersBesideCopiesThatAreKilled) {
+    for (const char *const name : {"one", "two", "three"}) {
+        ASSERT_EQ(created(name), 0);
+    }
+    std::vector<pid_t> watchers;
+    for (int i = 0; i < 4; ++i) {
+        watchers.push_back(start(readInALoop));
+    }
+    constexpr int kRounds = 12;
+    int killed = 0;
+    for (int round = 0; round < kRounds; ++round) {
+        size_t point = 0;
+        size_t torn = 0;
+        const auto create = [] { return created("four"); };
+        const auto isTearing = [&](const tracer::Call &call) {
+            ++point;
+            const bool opens = call.isPrograms && call.path == kWorking;
+            torn = opens ? point : torn; // the last of them: it is open, and empty
+        };
+        tracer::run(create, {}, isTearing);
+        EXPECT_EQ(inChild([] { return TAVISchedTaskRemove(4) == 0 ? 0 : 1; }), 0);
+        killed += tracer::run(create, {.point = torn, .act = tracer::Act::KillProgram}).acted;
+    }
+    shared().stop = true;
+    for (const pid_t watcher : watchers) {
+        EXPECT_EQ(resultOf(watcher), 0);
+    }
+    std::printf("concurrency: %d copies killed; %ld looks: %ld errors, %ld missed a task\n", killed,
+                shared().looks.load(), shared().errors.load(), shared().missing.load());
+    EXPECT_GT(killed, kRounds / 2);
+    EXPECT_GT(shared().looks, kRounds);
+    EXPECT_EQ(shared().errors + shared().missing, 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
 }
 
 // ---- Plug-in handlers ----

@@ -164,39 +164,47 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
     EXPECT_EQ(shared().fewer + shared().errors + shared().missing, 0);
 }
 
-// A copy that dies in the middle leaves the working copy torn until the change has taken it back.
-TEST_F(Concurrency, ReadersBesideCopiesThatAreKilled) {
+// A copy that dies in the middle leaves the working copy torn until the change has taken it back:
+// at every step of that somebody begins to read.
+TEST_F(Concurrency, ReadersBesideACopyThatIsKilled) {
     for (const char *const name : {"one", "two", "three"}) {
         ASSERT_EQ(created(name), 0);
     }
-    std::vector<pid_t> watchers;
-    for (int i = 0; i < 4; ++i) {
-        watchers.push_back(start(readInALoop));
-    }
-    constexpr int kRounds = 12;
-    int killed = 0;
-    for (int round = 0; round < kRounds; ++round) {
-        size_t point = 0;
-        size_t torn = 0;
-        const auto create = [] { return created("four"); };
-        const auto isTearing = [&](const tracer::Call &call) {
-            ++point;
-            const bool opens = call.isPrograms && call.path == kWorking;
-            torn = opens ? point : torn; // the last of them: it is open, and empty
-        };
-        tracer::run(create, {}, isTearing);
-        EXPECT_EQ(inChild([] { return TAVISchedTaskRemove(4) == 0 ? 0 : 1; }), 0);
-        killed += tracer::run(create, {.point = torn, .act = tracer::Act::KillProgram}).acted;
-    }
-    shared().stop = true;
-    for (const pid_t watcher : watchers) {
-        EXPECT_EQ(resultOf(watcher), 0);
-    }
-    std::printf("concurrency: %d copies killed; %ld looks: %ld errors, %ld missed a task\n", killed,
-                shared().looks.load(), shared().errors.load(), shared().missing.load());
-    EXPECT_GT(killed, kRounds / 2);
-    EXPECT_GT(shared().looks, kRounds);
-    EXPECT_EQ(shared().errors + shared().missing, 0);
+    const auto create = [] { return created("four"); };
+    size_t torn = 0;
+    size_t point = 0;
+    tracer::run(create, {}, [&](const tracer::Call &call) {
+        ++point;
+        const bool fills = call.isPrograms && call.isWrite && call.path == kWorking;
+        torn = torn == 0 && fills ? point : torn; // it is open, and empty
+    });
+    ASSERT_EQ(TAVISchedTaskRemove(4), 0);
+    const auto look = [] {
+        TAVI_SCHED_TASK *list = nullptr;
+        const int count = TAVISchedTaskListGet(&list, nullptr);
+        shared().fewer += count >= 0 && count < 3 ? 1 : 0;
+        shared().errors += count < 0 ? 1 : 0;
+        ++shared().looks;
+        return 0;
+    };
+    point = 0;
+    long started = 0;
+    const auto run = tracer::run(create, {.point = torn, .act = tracer::Act::KillProgram},
+                                 [&](const tracer::Call &) {
+                                     if (++point > torn) {
+                                         start(look);
+                                         ++started;
+                                         const timespec moment{.tv_sec = 0, .tv_nsec = 3'000'000};
+                                         nanosleep(&moment, nullptr);
+                                     }
+                                 });
+    EXPECT_TRUE(run.acted);
+    waitForChildren();
+    std::printf("concurrency: a copy killed: %ld looks meanwhile: %ld saw fewer, %ld errors\n",
+                shared().looks.load(), shared().fewer.load(), shared().errors.load());
+    EXPECT_GT(started, 5);
+    EXPECT_EQ(shared().looks, started);
+    EXPECT_EQ(shared().fewer + shared().errors, 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
 }
 

@@ -305,11 +305,7 @@ int tavischedule_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) {
                      LogText(szName).c_str());
         return -1;
     }
-    static const bool joined = [] {
-        sched::joinBatches({isTouched, describe, store, apply, forget});
-        return true;
-    }();
-    static_cast<void>(joined);
+    sched::joinBatches({isTouched, describe, store, apply, forget});
     // There is no owns_id: every look-up by id asks this backend.
     *pBackend = {.id = pBackend->id,
                  .name = szName,

@@ -686,6 +686,9 @@ TEST_F(CommandLine, TellsWhenNothingRuns) {
             const bool reports = c.listStatus != 0 || std::string(command) == "sync";
             EXPECT_EQ(status_, reports ? 1 : 0) << command << said;
         }
+        // What only one of the files has is not taken out of the crontab.
+        run("check --repair");
+        EXPECT_THAT(readFile(kCrontab), HasSubstr("id=2\n")) << c.harm;
     }
 }
 

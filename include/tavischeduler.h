@@ -391,8 +391,9 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
 /* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
  * row bears, and `pEnd` a descriptor that reads end-of-file once the run has ended and its result
- * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes it.
- * What the command left behind may keep the child longer. Both are -1 when the task was skipped. */
+ * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes
+ * it. What the command left behind may keep the child longer. Both are -1 when the task was
+ * skipped. */
 TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
                                             int32_t *pPid, int *pEnd);
 

@@ -66,14 +66,15 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
     signal(SIGCHLD, SIG_DFL);
     close(leaked);
     close(high);
-    EXPECT_EQ(readFile("/tmp/home/seen"),
-              "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
-              "Groups:\t4242 4343 \nSigIgn:\t" +
-                  std::string(ignored.data()) +
-                  "\nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
-                  "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
-                  "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTAVI_RUN_ID=1\n"
-                  "TAVI_TASK_ID=1\nTAVI_TASK_NAME=Task 1\nTZ=UTC\nUSER=tavitest\n");
+    EXPECT_EQ(
+        readFile("/tmp/home/seen"),
+        "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
+        "Groups:\t4242 4343 \nSigIgn:\t" +
+            std::string(ignored.data()) +
+            "\nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
+            "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
+            "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTAVI_RUN_ID=1\n"
+            "TAVI_TASK_ID=1\nTAVI_TASK_NAME=Task 1\nTZ=UTC\nUSER=tavitest\n");
     EXPECT_EQ(rows(), "1:3: ");
     EXPECT_EQ(statusOf("/tmp/sched_status.sqlite").st_uid, 0U);
     EXPECT_THAT(logs(), IsEmpty());

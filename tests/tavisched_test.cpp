@@ -282,8 +282,9 @@ TEST_F(CommandLine, ChangesFollowOneAnother) {
     EXPECT_THAT(readFile("/tmp/inner"),
                 AllOf(HasSubstr("a change is going on in process"), HasSubstr("daily 0")));
     EXPECT_EQ(
-        shell("rm /tmp/sent /tmp/inner; /usr/tavi/bin/tavisched edit 1 --at 06:00 > /tmp/out & "
-              "until [ -s /tmp/inner ]; do sleep 0.01; done; kill -TERM $!; touch /tmp/sent; wait $!"),
+        shell(
+            "rm /tmp/sent /tmp/inner; /usr/tavi/bin/tavisched edit 1 --at 06:00 > /tmp/out & "
+            "until [ -s /tmp/inner ]; do sleep 0.01; done; kill -TERM $!; touch /tmp/sent; wait $!"),
         128 + SIGTERM);
     EXPECT_THAT(done("list"), HasSubstr("daily 05:00"));
     // A reader that goes away ends nothing half done.
@@ -536,8 +537,9 @@ TEST_F(CommandLine, FitsTheTerminal) {
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     const auto widest = [&](int columns) {
         const std::string width = std::to_string(columns);
-        shell("script -qec 'stty cols " + width +
-              "; TERM=dumb /usr/tavi/bin/tavisched list' /dev/null | tr -d '\\r' | sed 's/…/./g' > /tmp/out");
+        shell(
+            "script -qec 'stty cols " + width +
+            "; TERM=dumb /usr/tavi/bin/tavisched list' /dev/null | tr -d '\\r' | sed 's/…/./g' > /tmp/out");
         return shell("awk 'length > " + width + "' /tmp/out | grep -q .") == 1;
     };
     Task hidden = newTask();

@@ -100,7 +100,7 @@ std::vector<Operation> operations(const std::vector<std::string> &names = {}) {
          }},
         {"tool_disable",
          [] {
-             return tool({"disable", "3"});
+             return tool({"disable", "1", "3"});
          }},
     };
     std::erase_if(all, [&](const Operation &operation) {

@@ -473,7 +473,7 @@ TEST_F(CommandLine, RunsNowAndFollows) {
     done("add --command 'exit 3'");
     done("add --command 'kill -9 $$'");
     // What it leaves behind is not waited for, nor taken for it.
-    done("add --command 'sleep 1000 & /usr/tavi/bin/tavisched run 5' --disabled");
+    done("add --command 'sleep 1000 & /usr/tavi/bin/tavisched run 5; sleep 1.5' --disabled");
     done("add --command true --disabled");
     done("add --command true");
     EXPECT_EQ(run("run 1 2 3 4 --wait"),

@@ -108,4 +108,9 @@ void tellOfWaiting() {
     }
 }
 
+void tellNoMoreOfWaiting() {
+    const itimerval none{};
+    setitimer(ITIMER_REAL, &none, nullptr);
+}
+
 } // namespace tavisched

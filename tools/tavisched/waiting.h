@@ -7,5 +7,7 @@ namespace tavisched {
 // another process whose change goes on, or a program that it started itself, such as a plug-in
 // handler.
 void tellOfWaiting();
+// What is waited for from now on was asked for.
+void tellNoMoreOfWaiting();
 
 } // namespace tavisched

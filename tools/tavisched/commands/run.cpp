@@ -5,11 +5,14 @@
 #include "tasks/runs.h"
 #include "tasks/tasks.h"
 #include "text/words.h"
+#include "waiting.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <cstring>
 #include <iterator>
+#include <sys/prctl.h>
 #include <unistd.h>
 
 namespace tavisched {
@@ -67,6 +70,11 @@ std::vector<Task> readTasks(const Ids &ids) {
 
 int run(const Ids &ids, bool wait) {
     const std::vector<Task> tasks = readTasks(ids);
+    // What is waited for stays below us: when a plug-in handler waits for a task that reads tasks,
+    // the task knows that the change which it would wait for waits for it.
+    if (wait && prctl(PR_SET_CHILD_SUBREAPER, 1) != 0) {
+        throw Failure(std::string("no task was started: ") + std::strerror(errno));
+    }
     std::vector<Started> runs;
     std::transform(tasks.begin(), tasks.end(), std::back_inserter(runs),
                    [](const Task &task) { return start(*task); });
@@ -75,6 +83,7 @@ int run(const Ids &ids, bool wait) {
         std::printf("%s: started\n", called(*started.task).c_str());
     }
     std::fflush(stdout);
+    tellNoMoreOfWaiting();
     int status = 0;
     for (const Started &started : wait ? runs : std::vector<Started>()) {
         waitForEnd(started);

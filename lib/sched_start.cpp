@@ -5,6 +5,7 @@
 #include "change/change.h"
 #include "change/leftovers.h"
 #include "cron/runner.h"
+#include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_guard.h"
@@ -100,7 +101,9 @@ int makeReady() {
     const int lockFolder = sched::ensureSharedFolder(sched::kRunLockFolder) == 0
                                ? 0
                                : fail("made", sched::kRunLockFolder);
-    return makeFolder() == 0 && makeTasksReady() == 0 ? lockFolder : -1;
+    const int ready = makeFolder() == 0 && makeTasksReady() == 0 ? lockFolder : -1;
+    sched::beginRecording();
+    return ready;
 }
 
 } // namespace

@@ -1,5 +1,7 @@
 // Storing a new task.
+#include "change/batch.h"
 #include "change/change.h"
+#include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -9,8 +11,14 @@ int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask) {
     if (sched::initBackends(SCHED_SITE) != 0) {
         return -1;
     }
+    if (!sched::isBatchOpen()) {
+        sched::recordMissedRuns();
+    }
     const auto result =
         sched::dispatch(SCHED_SITE, "create", pTask, &TAVI_SCHED_BACKEND_RECORD::create);
+    if (result == 0) {
+        sched::whenStored([id = pTask->id] { sched::separateFromNewTask(id); });
+    }
     if (result) {
         return *result;
     }
@@ -49,7 +57,14 @@ int TAVISchedTaskCreateWithId(TAVI_SCHED_TASK *pTask) {
     }
     SCHED_REQUIRE(pTask->backend == TAVI_SCHED_BACKEND_SCHEDULE && isFree(pTask->id), "id is free",
                   -1);
+    if (!sched::isBatchOpen()) {
+        sched::recordMissedRuns();
+    }
     const int result =
         sched::dispatch(SCHED_SITE, "edit", pTask, &TAVI_SCHED_BACKEND_RECORD::edit).value_or(-1);
-    return result == 0 ? change.finish() : -1;
+    if (result != 0 || change.finish() != 0) {
+        return -1;
+    }
+    sched::whenStored([id = pTask->id] { sched::separateFromNewTask(id); });
+    return 0;
 }

@@ -1,5 +1,6 @@
 // Replacing a stored task, between the plug-in hooks.
 #include "change/batch.h"
+#include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -24,6 +25,9 @@ int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
         SCHED_LOG("get task failed. id:[%ld] [0x%04X %s:%d]", static_cast<long>(pTask->id),
                   SCHED_LAST_ERROR);
         return -1;
+    }
+    if (!sched::isBatchOpen()) {
+        sched::recordMissedRuns();
     }
     sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
     const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;

@@ -1,5 +1,6 @@
 // Removing a stored task, between the plug-in hooks.
 #include "change/batch.h"
+#include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_error.h"
 #include "sched_hook.h"
@@ -34,8 +35,14 @@ int TAVISchedTaskRemove(int32_t id) {
                   SCHED_LAST_ERROR);
         return -1;
     }
+    if (!sched::isBatchOpen()) {
+        sched::recordMissedRuns();
+    }
     sched::ChangeHook hook(SCHED_SITE, "task_remove", &oldTask, nullptr);
     const int result = hook.initialised() ? removeBetweenHooks(hook, id, oldTask.backend) : -1;
+    if (result == 0) {
+        sched::whenStored([id] { sched::separateFromRemovedTask(id); });
+    }
     if (sched::isBatchOpen()) {
         sched::deferHook(hook, result);
     } else {

@@ -43,7 +43,7 @@ TAVI_SCHED_RUN newest(int32_t id = 1) {
 }
 
 // "result:number", the newest first.
-[[maybe_unused]] std::string results(TAVI_SCHED_RUN_FILTER filter = ofTask(1)) {
+std::string results(TAVI_SCHED_RUN_FILTER filter = ofTask(1)) {
     std::string text;
     for (const TAVI_SCHED_RUN &run : runs(filter)) {
         text += std::to_string(run.result) + ":" + std::to_string(run.number) + " ";
@@ -64,6 +64,17 @@ std::string outputOf(int64_t run, size_t room = 10000) {
     }
     EXPECT_EQ(length, 0);
     return text;
+}
+
+void recorded(const std::string &sql, const char *untilKilled = nullptr) {
+    sqlite3 *database = nullptr;
+    ASSERT_EQ(sqlite3_open(kDatabase, &database), SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK) << sql;
+    while (untilKilled) {
+        writeFile(untilKilled, "");
+        ::pause();
+    }
+    sqlite3_close(database);
 }
 
 void awaitThat(const std::function<bool()> &holds) {
@@ -259,6 +270,399 @@ TEST_F(Records, WaitingIsCheap) {
     close(fifo);
     close(end);
     waitForChildren();
+}
+
+// ---- Stopping ----
+
+TEST_F(Records, StopEndsWhatTheRunStarted) {
+    const struct {
+        const char *command;
+        int grace;
+    } cases[] = {
+        {"echo $$ > /tmp/deep; exec sleep 600", 60},
+        {"sh -c 'echo $$ > /tmp/deep; exec sleep 600' & wait", 60},
+        // Out of its session and deaf, and deaf as a whole.
+        {"setsid sh -c 'trap \"\" TERM; echo $$ > /tmp/deep; sleep 600; sleep 600' & wait", 0},
+        {"trap '' TERM; echo $$ > /tmp/deep; sleep 600; sleep 600", 0},
+    };
+    for (const auto &row : cases) {
+        unlink("/tmp/deep");
+        const Task task = storedTask(row.command);
+        ASSERT_EQ(TAVISchedTaskRun(task->id, 0, 0), 0);
+        awaitThat([] { return !readFile("/tmp/deep").empty(); });
+        awaitThat([&] { return newest(task->id).result == TAVI_SCHED_RUN_RUNNING; });
+        const pid_t deep = std::stoi(readFile("/tmp/deep"));
+        EXPECT_EQ(TAVISchedRunStop(newest(task->id).run, row.grace), 0);
+        waitForChildren();
+        EXPECT_EQ(PLATCProcAlive(deep), 0) << row.command;
+        EXPECT_EQ(newest(task->id).result, TAVI_SCHED_RUN_STOPPED_BY_USER) << row.command;
+    }
+}
+
+TEST_F(Records, StopMeetsOnlyItsOwnRun) {
+    storedTask("exec sleep 600");
+    int32_t pid = 0;
+    int end = -1;
+    ASSERT_EQ(TAVISchedTaskRunFollowed(1, 0, 0, &pid, &end), 0);
+    awaitThat([] { return newest().result == TAVI_SCHED_RUN_RUNNING; });
+    const int64_t run = newest().run;
+    for (const char *change : {"process_start=process_start-1", "boot='another'"}) {
+        recorded(std::string("UPDATE runs SET ") + change);
+        EXPECT_EQ(failure(TAVISchedRunStop(run, 0)), 0x2000U) << change;
+        EXPECT_EQ(newest().result, TAVI_SCHED_RUN_INTERRUPTED) << change;
+    }
+    EXPECT_EQ(failure(TAVISchedRunStop(run, -1)), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedRunStop(99, 0)), 0x2000U);
+    // A signal of anybody else's is no request.
+    EXPECT_EQ(sigqueue(pid, SIGRTMIN + 1, {.sival_int = 3}), 0);
+    EXPECT_EQ(PLATCProcAlive(pid), 1);
+    // A run whose process dies is interrupted.
+    kill(pid, SIGKILL);
+    shell("pkill -x -P 1 sleep; pkill -x -P " + std::to_string(getpid()) + " sleep");
+    close(end);
+    waitForChildren();
+    EXPECT_EQ(newest().result, TAVI_SCHED_RUN_INTERRUPTED);
+    EXPECT_EQ(newest().ended, 0);
+}
+
+// ---- Runs that come to nothing ----
+
+TEST_F(Records, WhileARunWaits) {
+    const struct {
+        const char *what;
+        std::function<void(Task &)> change;
+        int result;
+    } cases[] = {
+        {"nothing", [](Task &) {}, TAVI_SCHED_RUN_SUCCESS},
+        {"removed", [](Task &task) { TAVISchedTaskRemove(task->id); }, TAVI_SCHED_RUN_TASK_REMOVED},
+        {"another has its id",
+         [](Task &task) {
+             TAVISchedTaskRemove(task->id);
+             EXPECT_EQ(storedTask("echo wrong >> /tmp/out")->id, task->id);
+         },
+         TAVI_SCHED_RUN_TASK_REMOVED},
+        {"disabled",
+         [](Task &task) {
+             task->state = TAVI_SCHED_STATE_DISABLED;
+             TAVISchedTaskEdit(task.get());
+         },
+         TAVI_SCHED_RUN_TASK_DISABLED},
+        {"edited",
+         [](Task &task) {
+             TAVISchedCTaskSetCommand(task.get(), "exit 5");
+             TAVISchedTaskEdit(task.get());
+         },
+         TAVI_SCHED_RUN_EXIT_FAILED},
+        {"stopped", [](Task &task) { EXPECT_EQ(TAVISchedRunStop(newest(task->id).run, 1), 0); },
+         TAVI_SCHED_RUN_STOPPED_BY_USER},
+    };
+    fakes.pauseMicroseconds = 500000;
+    for (const auto &row : cases) {
+        Task task = storedTask("true");
+        const std::string id = std::to_string(task->id);
+        query("INSERT INTO task_status (pid, timestamp, app, task_id, status_code) VALUES (" +
+              std::to_string(getpid()) + ", 1, '', " + id + ", 2)");
+        ASSERT_EQ(TAVISchedTaskRun(task->id, 0, 0), 0);
+        awaitThat([&] { return newest(task->id).result == TAVI_SCHED_RUN_WAITING; });
+        const TAVI_SCHED_RUN waiting = newest(task->id);
+        EXPECT_TRUE(waiting.waitedFor == task->id && waiting.waitingSince >= waiting.asked);
+        EXPECT_EQ(waiting.began, 0);
+        row.change(task);
+        query("DELETE FROM task_status");
+        waitForChildren();
+        TAVI_SCHED_RUN ended{};
+        EXPECT_EQ(TAVISchedRunGet(waiting.run, &ended), 0);
+        EXPECT_EQ(ended.result, row.result) << row.what;
+        EXPECT_GE(ended.waited, 3);
+        const bool ran = row.result < TAVI_SCHED_RUN_WAITING;
+        EXPECT_EQ(ended.began != 0, ran) << row.what;
+        EXPECT_EQ(query("SELECT count(*) FROM task_status"), ran ? "1 " : "0 ") << row.what;
+        TAVISchedTaskRemove(task->id);
+    }
+    EXPECT_EQ(readFile("/tmp/out"), "");
+}
+
+TEST_F(Records, WhyATaskDidNotRun) {
+    Task task = storedTask("true");
+    task->owner = 4999;
+    TAVISchedTaskEdit(task.get());
+    run();
+    EXPECT_EQ(newest().result, TAVI_SCHED_RUN_OWNER_UNKNOWN);
+    EXPECT_THAT(notices(), testing::Contains(HasSubstr(": owner-unknown, run 1")));
+    task->owner = 0;
+    TAVISchedTaskEdit(task.get());
+    query("INSERT INTO task_status (pid, timestamp, app, task_id, status_code) VALUES (" +
+          std::to_string(getpid()) + ", 1, '', 1, 2)");
+    run();
+    EXPECT_EQ(newest().result, TAVI_SCHED_RUN_GIVEN_UP);
+    EXPECT_EQ(newest().waitedFor, 1);
+    EXPECT_GE(newest().waited, 60);
+    shell("rm -r /tmp/lock; ln -s /etc /tmp/lock");
+    run();
+    EXPECT_EQ(newest().result, TAVI_SCHED_RUN_LOCK_FAILED);
+    shell("rm /tmp/lock; echo no database, no database, no database > /tmp/sched_status.sqlite");
+    run();
+    EXPECT_EQ(newest().result, TAVI_SCHED_RUN_DATABASE_FAILED);
+    auto failed = ofTask(-1);
+    failed.failedOnly = 1;
+    EXPECT_EQ(results(failed), "36:0 35:0 34:0 37:0 ");
+    failed.limit = 2;
+    EXPECT_EQ(results(failed), "36:0 35:0 ");
+    failed.since = newest().asked;
+    EXPECT_EQ(results(failed), "36:0 ");
+}
+
+// ---- Whose runs they are ----
+
+TEST_F(Records, AnIdThatIsGivenAgain) {
+    storedTask("exit 1");
+    storedTask("exit 2");
+    run(1);
+    run(2);
+    // Taken back, a batch changes nothing.
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    TAVISchedTaskRemove(1);
+    EXPECT_EQ(storedTask()->id, 1);
+    EXPECT_EQ(TAVISchedChangeRollback(), 0);
+    EXPECT_EQ(results(), "7:1 ");
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    TAVISchedTaskRemove(1);
+    EXPECT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_EQ(results(), "");
+    storedTask("exit 3");
+    run(1);
+    EXPECT_EQ(results(), "7:3 ");
+    // The file was changed by hand, which nobody told us.
+    shell(": > /tmp/scheduled_tasks; : > /usr/tavi/etc/scheduled_tasks");
+    EXPECT_EQ(storedTask("exit 4")->id, 1);
+    EXPECT_EQ(results(), "");
+    // All runs of all tasks, and whose they were.
+    EXPECT_EQ(results(ofTask(-1)), "7:3 7:2 7:1 ");
+    EXPECT_EQ(runs(ofTask(-1)).back().isOfRemovedTask, 1);
+    auto present = ofTask(-1);
+    present.newestOnly = 1;
+    run(1);
+    run(1);
+    EXPECT_EQ(results(present), "7:4 7:2 ");
+}
+
+// ---- Missed times ----
+
+TEST_F(Records, MissedTimes) {
+    fakes.now = at("2024-05-08 07:00");
+    Task task = newTask("true");
+    task->type = TAVI_SCHED_TYPE_DAILY;
+    task->runHour = 8;
+    task->repeatHour = 2;
+    task->lastWorkHour = 12;
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    ASSERT_EQ(TAVISchedStart(), 0);
+    const auto missed = [] {
+        std::string times;
+        for (const TAVI_SCHED_RUN &run : runs(ofTask(1))) {
+            const time_t due = run.due / 1000;
+            std::array<char, 32> text{};
+            strftime(text.data(), text.size(), "%d %H:%M", localtime(&due));
+            times += run.result == TAVI_SCHED_RUN_MISSED ? std::string(text.data()) + " " : "";
+        }
+        return times;
+    };
+    // cron starts it at 8, and not at 10.
+    fakes.now = at("2024-05-08 08:00");
+    ASSERT_EQ(TAVISchedTaskRun(1, 1, 1), 0);
+    waitForChildren();
+    fakes.now = at("2024-05-08 10:02"); // it may be on its way
+    ASSERT_EQ(TAVISchedStart(), 0);
+    EXPECT_EQ(missed(), "");
+    fakes.now = at("2024-05-08 10:10");
+    ASSERT_EQ(TAVISchedStart(), 0);
+    EXPECT_EQ(missed(), "08 10:00 ");
+    ASSERT_EQ(TAVISchedStart(), 0); // once
+    EXPECT_EQ(missed(), "08 10:00 ");
+    // Found by the next change, which makes it another schedule from then on.
+    fakes.now = at("2024-05-08 12:30");
+    task->runHour = 7;
+    TAVISchedTaskEdit(task.get());
+    fakes.now = at("2024-05-08 12:40");
+    ASSERT_EQ(TAVISchedStart(), 0);
+    EXPECT_EQ(missed(), "08 12:00 08 10:00 ");
+    // The machine was off for weeks: the latest ten times. Nothing of a disabled task.
+    fakes.now = at("2024-07-01 08:00");
+    ASSERT_EQ(TAVISchedStart(), 0);
+    EXPECT_THAT(missed(), AllOf(StartsWith("01 07:00 30 11:00 30 09:00 30 07:00 29 11:00 "),
+                                testing::EndsWith("28 09:00 28 07:00 08 12:00 08 10:00 ")));
+    task->state = TAVI_SCHED_STATE_DISABLED;
+    TAVISchedTaskEdit(task.get());
+    fakes.now = at("2024-07-03 08:00");
+    ASSERT_EQ(TAVISchedStart(), 0);
+    EXPECT_THAT(missed(), StartsWith("01 07:00 "));
+    EXPECT_THAT(logs(), IsEmpty());
+}
+
+// Records that went were no missed runs.
+TEST_F(Records, LimitsAndPruning) {
+    writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=2\nruns=5\n");
+    TAVI_SCHED_RUN_LIMITS limits{};
+    EXPECT_EQ(TAVISchedRunLimitsGet(&limits), 0);
+    EXPECT_TRUE(limits.runsPerTask == 2 && limits.runs == 5);
+    for (int id = 1; id <= 4; ++id) {
+        storedTask(("exit " + std::to_string(id)).c_str());
+    }
+    for (const int id : {1, 1, 1, 2, 2, 3}) {
+        run(id);
+    }
+    waitForChildren();
+    EXPECT_EQ(results(ofTask(-1)), "7:3 7:2 7:2 7:1 7:1 ");
+    EXPECT_EQ(shell("test \"$(ls /var/lib/tavischeduler/output | tr '\n' ' ')\" = '2 3 4 5 6 '"),
+              0);
+    run(4);
+    EXPECT_EQ(results(ofTask(-1)), "7:4 7:3 7:2 7:2 7:1 ");
+    std::array<char, 8> buffer{};
+    int64_t offset = 0;
+    EXPECT_EQ(
+        failure(static_cast<int>(TAVISchedRunOutputRead(1, &offset, buffer.data(), 8, nullptr))),
+        0x2000U);
+    offset = -1;
+    EXPECT_EQ(
+        failure(static_cast<int>(TAVISchedRunOutputRead(5, &offset, buffer.data(), 8, nullptr))),
+        0x0D00U);
+    logs();
+    writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=-2\nruns=x\n");
+    EXPECT_EQ(TAVISchedRunLimitsGet(&limits), 0);
+    EXPECT_TRUE(limits.runsPerTask == 50 && limits.runs == 10000);
+    EXPECT_EQ(logs().size(), 2U);
+}
+
+// ---- Trouble ----
+
+// Whatever is wrong with the records, the command runs and its result is stored.
+TEST_F(Records, NothingKeepsARunFromRunning) {
+    const Task task = storedTask("echo ran >> /tmp/out; head -c 300000 /dev/zero");
+    const struct {
+        const char *what, *before, *after;
+        int recorded; // how many records there are then
+        const char *log;
+    } cases[] = {
+        {"damaged",
+         "rm -f /var/lib/tavischeduler/runs.sqlite-*; "
+         "echo this is no database, by no means > /var/lib/tavischeduler/runs.sqlite",
+         "test -s /var/lib/tavischeduler/runs.sqlite.damaged", 1, "is damaged and put aside"},
+        {"newer",
+         "rm -f /var/lib/tavischeduler/runs.sqlite*; python3 -c \"import sqlite3; "
+         "sqlite3.connect('/var/lib/tavischeduler/runs.sqlite').execute('PRAGMA "
+         "user_version=99')\"",
+         "rm /var/lib/tavischeduler/runs.sqlite*", -1, "cannot be opened"},
+        {"full", "head -c 100M /dev/zero > /var/lib/tavischeduler/fill 2>/dev/null",
+         "rm /var/lib/tavischeduler/fill", 0, "/var/lib/tavischeduler/"},
+        {"no place for outputs",
+         "rm -r /var/lib/tavischeduler/output; touch "
+         "/var/lib/tavischeduler/output",
+         "rm /var/lib/tavischeduler/output", 1, "cannot be made"},
+    };
+    ASSERT_EQ(mount("small", kFolder, "tmpfs", 0, "size=256k,mode=700"), 0);
+    for (const auto &row : cases) {
+        unlink("/tmp/out");
+        query("DELETE FROM task_status");
+        shell(row.before);
+        logs();
+        run();
+        waitForChildren();
+        EXPECT_EQ(readFile("/tmp/out"), "ran\n") << row.what;
+        EXPECT_EQ(query("SELECT status_code FROM task_status"), "3 ") << row.what;
+        EXPECT_THAT(logs(), testing::Contains(HasSubstr(row.log))) << row.what;
+        if (row.recorded >= 0) {
+            EXPECT_EQ(runs(ofTask(1)).size(), static_cast<size_t>(row.recorded)) << row.what;
+        }
+        EXPECT_EQ(shell(row.after), 0) << row.what;
+    }
+    EXPECT_EQ(umount(kFolder), 0);
+}
+
+TEST_F(Records, ALockedDatabaseIsNotWaitedForLong) {
+    runNew("true");
+    waitForChildren();
+    const pid_t other = fork();
+    if (other == 0) { // SQLite takes what this process itself holds for held in its children too
+        recorded("BEGIN IMMEDIATE; CREATE TABLE other(value)", "/tmp/locked");
+    }
+    awaitThat([] { return access("/tmp/locked", F_OK) == 0; });
+    // More than a pipe holds is printed while the record is waited for.
+    storedTask("head -c 300000 /dev/zero; touch /tmp/printed");
+    ASSERT_EQ(TAVISchedTaskRun(2, 0, 0), 0);
+    awaitThat([] { return access("/tmp/printed", F_OK) == 0; });
+    EXPECT_THAT(logs(), IsEmpty());
+    awaitThat([] { return !lastLog().empty(); });
+    EXPECT_EQ(query("SELECT task_id, status_code FROM task_status"), "1 3 2 3 ");
+    // One that is let go in time is waited for.
+    storedTask("true");
+    logs();
+    ASSERT_EQ(TAVISchedTaskRun(3, 0, 0), 0);
+    awaitThat([] {
+        return query("SELECT count(*) FROM task_status WHERE task_id=3 AND "
+                     "status_code=3") == "1 ";
+    });
+    kill(other, SIGKILL);
+    waitForChildren();
+    EXPECT_THAT(logs(), IsEmpty());
+    EXPECT_EQ(results(ofTask(-1)), "3:0 3:0 ");
+}
+
+TEST_F(Records, ManyAtOnce) {
+#ifdef __SANITIZE_ADDRESS__
+    constexpr int kMany = 30;
+#else
+    constexpr int kMany = 200;
+#endif
+    Task task = newTask("echo $TAVI_RUN_ID");
+    TAVISchedCTaskSetCanRunTaskSameTime(task.get(), 1);
+    writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=1000\n");
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    for (int i = 0; i < kMany; ++i) {
+        ASSERT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
+    }
+    waitForChildren();
+    const auto found = runs(ofTask(1));
+    EXPECT_EQ(found.size(), static_cast<size_t>(kMany));
+    for (const TAVI_SCHED_RUN &run : found) {
+        EXPECT_EQ(run.result, TAVI_SCHED_RUN_SUCCESS);
+        EXPECT_EQ(outputOf(run.run), std::to_string(run.run) + "\n");
+    }
+    EXPECT_THAT(logs(), IsEmpty());
+    EXPECT_EQ(notices().size(), static_cast<size_t>(2 * kMany));
+}
+
+// ---- Handlers ----
+
+void addHandler(const char *name, const std::string &script) {
+    const std::string path = std::string("/usr/tavi/etc/plugins/task_scheduler_run/") + name;
+    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler_run");
+    writeFile(path, "#!/bin/sh\n" + script);
+    chmod(path.c_str(), 0755);
+}
+
+TEST_F(Records, HandlersAreTold) {
+    addHandler("a", "echo $1 $2 $TASK_ID $TASK_NAME $RUN_ID $RUN_RESULT $RUN_NUMBER >> /tmp/told\n"
+                    "cat $RUN_OUTPUT >> /tmp/told; echo $RUN_BEGAN >> /tmp/told; "
+                    "grep SigBlk: /proc/self/status >> /tmp/told");
+    runNew("echo printed; exit 3");
+    waitForChildren();
+    EXPECT_THAT(readFile("/tmp/told"),
+                MatchesRegex("task_run post 1 Task 1 1 exit 3\nprinted\n"
+                             "20..-..-..T..:..:..\\+00:00\nSigBlk:.0000000000000000\n"));
+}
+
+// The clock is taken to tick so fast that every process is old.
+TEST_F(Records, HandlersThatHangAreEnded) {
+    addHandler("a", "sleep 600 & echo $! > /tmp/hangs; wait");
+    addHandler("b", "echo told > /tmp/told");
+    fakes.clockTicks = 1000000;
+    const TAVI_SCHED_RUN seen = runNew("(sleep 1; head -c 200000 /dev/zero; echo on > /tmp/on) &");
+    EXPECT_EQ(seen.result, TAVI_SCHED_RUN_SUCCESS); // nobody waited
+    waitForChildren();
+    EXPECT_EQ(readFile("/tmp/told"), "told\n");
+    EXPECT_EQ(readFile("/tmp/on"), "on\n");
+    EXPECT_EQ(PLATCProcAlive(std::stoi(readFile("/tmp/hangs"))), 0);
+    EXPECT_THAT(logs(), testing::Contains(HasSubstr("a handler of runs is ended after 60 s")));
 }
 
 } // namespace

@@ -236,6 +236,11 @@ void syslog(int priority, const char *format, ...) {
     errno = savedErrno;
 }
 
+long sysconf(int name) noexcept {
+    static auto *const real = support::next<long (*)(int)>("sysconf");
+    return name == _SC_CLK_TCK && fakes.clockTicks > 0 ? fakes.clockTicks : real(name);
+}
+
 unsigned int sleep(unsigned int seconds) {
     support::recordPause(seconds * 1000000L);
     return 0;

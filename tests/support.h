@@ -41,6 +41,7 @@ struct Fakes {
     bool fsyncFails = false;
     bool folderFsyncFails = false;
     long pauseMicroseconds = 0; // how long sleep() and usleep() really last
+    long clockTicks = 0;        // how many a second has; 0 = as many as there are
 };
 extern Fakes fakes;
 

@@ -1,6 +1,7 @@
 // Several changes as one.
 #include "batch.h"
 #include "change.h"
+#include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_guard.h"
 
@@ -21,6 +22,7 @@ struct Deferred {
 struct Batch {
     sched::Change change;
     std::vector<Deferred> hooks;
+    std::vector<std::function<void()>> consequences;
 };
 
 std::unique_ptr<Batch> batch;
@@ -53,8 +55,14 @@ std::unique_ptr<Batch> close() {
 // The handlers are told when the lock is released: they may change tasks themselves.
 void end(std::unique_ptr<Batch> ended, bool stored) {
     std::vector<Deferred> hooks = std::move(ended->hooks);
+    const auto consequences = std::move(ended->consequences);
     ended.reset();
     const sched::KeptError error;
+    for (const auto &consequence : consequences) {
+        if (stored) {
+            consequence();
+        }
+    }
     for (Deferred &deferred : hooks) {
         deferred.hook.afterwards(stored ? deferred.result : -1);
     }
@@ -125,11 +133,20 @@ void sched::deferHook(ChangeHook &hook, int result) {
     }
 }
 
+void sched::whenStored(std::function<void()> consequence) {
+    if (batch) {
+        batch->consequences.push_back(std::move(consequence));
+    } else {
+        consequence();
+    }
+}
+
 int TAVISchedChangeBegin() {
     SCHED_REQUIRE(!batch, "no change has begun", -1);
     if (sched::initBackends(SCHED_SITE) != 0) {
         return -1;
     }
+    sched::recordMissedRuns();
     return sched::guarded(
         SCHED_SITE,
         [] {

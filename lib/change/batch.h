@@ -5,6 +5,8 @@
 #include "change_record.h"
 #include "sched_hook.h"
 
+#include <functional>
+
 namespace sched {
 
 // A backend's part in a batch. Every function answers 0 or -1, with error and log line.
@@ -25,5 +27,8 @@ bool isBatchOpen();
 // Keeps a hook until the batch ends: its POST phase runs then, with the result of its operation, or
 // with -1 when the batch is rolled back.
 void deferHook(ChangeHook &hook, int result);
+
+// What follows from a change that is stored: done at once, or when the batch has been stored.
+void whenStored(std::function<void()> consequence);
 
 } // namespace sched

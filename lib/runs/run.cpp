@@ -4,6 +4,7 @@
 #include "run.h"
 #include "base/child.h"
 #include "limits.h"
+#include "run_report.h"
 #include "run_words.h"
 #include "sched_error.h"
 #include "sched_text.h"
@@ -29,6 +30,7 @@ constexpr size_t kBuffer = 65536;
 constexpr int kKillPause = 200;         // milliseconds
 constexpr int kMaxKills = 25;           // what is stuck in the kernel does not end
 constexpr int kWithoutSignalFile = 100; // milliseconds
+constexpr int kHandlerPause = 1000;     // milliseconds
 
 int64_t millisecondsOf(clockid_t clock) {
     timespec now{};
@@ -130,7 +132,8 @@ void sched::Run::store(bool isLast) {
     }
     const AsRoot rights;
     setProcess(record_);
-    RunRecords records(RunRecords::Mode::Write, [this](int milliseconds) { pause(milliseconds); });
+    RunRecords records(RunRecords::Mode::Write,
+                       [this](int milliseconds) { return pause(milliseconds); });
     if (records && records.write(record_) && isLast) {
         records.prune(readRunLimits(), record_.taskId);
     }
@@ -192,7 +195,7 @@ std::vector<std::string> sched::Run::variables() const {
 
 // The command is on its way meanwhile.
 void sched::Run::begun(pid_t process, base::Descriptor pipe) {
-    shell_ = process;
+    awaited_ = process;
     began_ = steadyClock();
     pipe_ = std::move(pipe);
     record_.result = TAVI_SCHED_RUN_RUNNING;
@@ -204,10 +207,7 @@ void sched::Run::begun(pid_t process, base::Descriptor pipe) {
 // What belongs to the result is what the command has printed by now. What it has left behind is
 // neither waited for nor, as the pipe stays open, ended.
 int sched::Run::wait(pid_t process) {
-    sigset_t child;
-    sigemptyset(&child);
-    sigaddset(&child, SIGCHLD);
-    children_ = base::Descriptor(signalfd(-1, &child, SFD_CLOEXEC | SFD_NONBLOCK));
+    listenToChildren();
     int status = -1;
     while (true) {
         const Left left = reap(process, status);
@@ -221,6 +221,14 @@ int sched::Run::wait(pid_t process) {
     return status;
 }
 
+// The signal is held back, and is read instead.
+void sched::Run::listenToChildren() {
+    sigset_t child;
+    sigemptyset(&child);
+    sigaddset(&child, SIGCHLD);
+    children_ = base::Descriptor(signalfd(-1, &child, SFD_CLOEXEC | SFD_NONBLOCK));
+}
+
 sched::Run::Left sched::Run::reap(pid_t process, int &status) {
     signalfd_siginfo told{};
     while (children_ && read(children_.get(), &told, sizeof told) > 0) {
@@ -230,10 +238,10 @@ sched::Run::Left sched::Run::reap(pid_t process, int &status) {
     while ((pid = waitpid(-1, &ended, WNOHANG)) > 0) {
         if (pid == process) {
             status = ended;
-            shell_ = -1;
+            awaited_ = -1;
         }
     }
-    return pid == -1 ? Left::None : shell_ == process ? Left::Command : Left::Others;
+    return pid == -1 ? Left::None : awaited_ == process ? Left::Command : Left::Others;
 }
 
 // Waits for something to happen; -1: for as long as it takes.
@@ -249,12 +257,19 @@ void sched::Run::await(int milliseconds) {
     StopRequest::take();
 }
 
-// A pause in which the command does not have to wait for its output to be taken.
-void sched::Run::pause(int milliseconds) {
+// A pause in which the command does not have to wait for its output to be taken. False when there
+// is something more important to do.
+bool sched::Run::pause(int milliseconds) {
     pollfd file{.fd = pipe_.get(), .events = POLLIN, .revents = 0};
     if (poll(&file, 1, milliseconds) > 0) {
         takeOutput(kBuffer);
     }
+    siginfo_t child{};
+    const bool hasEnded =
+        awaited_ != -1 &&
+        waitid(P_PID, static_cast<id_t>(awaited_), &child, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+        child.si_pid == awaited_;
+    return !hasEnded && !(awaited_ != -1 && isStopped());
 }
 
 // Nothing is taken out of a pipe at its end but its end: nobody has it open any more.
@@ -281,18 +296,30 @@ void sched::Run::takeRest() {
     }
 }
 
+// Handlers have a process of their own: it does not keep what is left behind from printing.
 void sched::Run::finish() {
+    const base::ChildSignals signals;
+    listenToChildren();
+    awaited_ = fork();
+    if (awaited_ == 0) {
+        pipe_.close();
+        pthread_sigmask(SIG_SETMASK, &signals.callersMask(), nullptr);
+        runHandlers(record_);
+        _exit(0);
+    }
     int status = 0;
-    if (!children_) {
-        return;
+    for (int64_t lookedAt = steadyClock(); pipe_ || awaited_ != -1;) {
+        await(awaited_ == -1 ? -1 : kHandlerPause);
+        if (reap(awaited_, status) == Left::None) {
+            awaited_ = -1;
+        }
+        if (awaited_ != -1 && steadyClock() - lookedAt >= kHandlerPause) {
+            endHangingHandlers(awaited_);
+            lookedAt = steadyClock();
+        }
     }
-    while (pipe_) {
-        await(-1);
-        reap(-1, status);
-    }
-    if (output_) {
-        output_.straighten();
-    }
+    output_.straighten();
+    output_.touch();
 }
 
 // ---- Stopping ----

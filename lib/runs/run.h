@@ -57,9 +57,10 @@ class Run final : private CommandWatch {
     bool takeOutput(size_t most);
     void takeRest();
     void await(int milliseconds);
-    void pause(int milliseconds);
+    bool pause(int milliseconds);
     // What is left of the run's processes.
     enum class Left { None, Others, Command };
+    void listenToChildren();
     Left reap(pid_t process, int &status);
     int stopStep();
     void signalAll(int signal) const;
@@ -70,7 +71,7 @@ class Run final : private CommandWatch {
     OutputFile output_;
     base::Descriptor pipe_;
     base::Descriptor children_; // tells of children that end
-    pid_t shell_ = -1;
+    pid_t awaited_ = -1;        // the command's, then the handlers' process; -1 when it has ended
     bool wasStopped_ = false;
     int64_t killAt_ = 0;
     int kills_ = 0;

@@ -25,8 +25,7 @@ namespace {
 
 using sched::RunRecord;
 
-constexpr int64_t kPatience = 3000; // milliseconds
-constexpr int kPause = 10;          // milliseconds
+constexpr int kPause = 10; // milliseconds
 constexpr int kSchema = 1;
 
 // Each brings the database from the version that is its place to the next one.
@@ -243,18 +242,20 @@ int64_t sched::nextRunNumber() {
     return file ? readNumber(file.get()) : 0;
 }
 
-void sched::mendRunNumber() {
+bool sched::mendRunNumber() {
     const base::Descriptor file = openNumber();
-    const int64_t newest = newestRecorded();
-    if (file && flock(file.get(), LOCK_EX) == 0 && readNumber(file.get()) <= newest) {
-        writeNumber(file.get(), newest + 1);
+    if (!file || flock(file.get(), LOCK_EX) != 0) {
+        SCHED_LOG("%s: %m", kRunNumber);
+        return false;
     }
+    const int64_t newest = newestRecorded();
+    return readNumber(file.get()) > newest || writeNumber(file.get(), newest + 1);
 }
 
 // ---- The database ----
 
-sched::RunRecords::RunRecords(Mode mode, Pause pause) : pause_(std::move(pause)) {
-    patience_ = monotonicNow() + kPatience;
+sched::RunRecords::RunRecords(Mode mode, Pause pause, int patience)
+    : pause_(std::move(pause)), patience_(monotonicNow() + patience) {
     isMissing_ = !hasRunRecords();
     if (mode == Mode::Write || !isMissing_) {
         if (!open(mode)) {
@@ -264,6 +265,9 @@ sched::RunRecords::RunRecords(Mode mode, Pause pause) : pause_(std::move(pause))
 }
 
 bool sched::RunRecords::failed(const char *what) {
+    if (hasGivenUp_) {
+        return false;
+    }
     SCHED_LOG("%s: %s: %s", kRunDatabase, what,
               database_ ? sqlite3_errmsg(database_.get()) : "out of memory");
     return false;
@@ -275,10 +279,10 @@ int sched::RunRecords::onBusy(void *self, int) {
         return 0;
     }
     if (records.pause_) {
-        records.pause_(kPause);
-    } else {
-        poll(nullptr, 0, kPause);
+        records.hasGivenUp_ = !records.pause_(kPause);
+        return records.hasGivenUp_ ? 0 : 1;
     }
+    poll(nullptr, 0, kPause);
     return 1;
 }
 
@@ -329,6 +333,11 @@ bool sched::RunRecords::openOnce(Mode mode) {
     const auto version = number("PRAGMA user_version", {});
     if (!version || *version > kSchema) {
         return false;
+    }
+    if (*version == 0 && mode == Mode::Read) { // whoever made it has not come further
+        isMissing_ = true;
+        database_.reset();
+        return true;
     }
     return (*version == kSchema || upgrade()) && execute("PRAGMA synchronous=FULL") &&
            execute("PRAGMA wal_autocheckpoint=100");
@@ -480,6 +489,10 @@ int64_t sched::RunRecords::newest() {
 
 int64_t sched::RunRecords::prunedUntil(int32_t taskId) {
     return number("SELECT pruned_until FROM tasks WHERE task_id=?", {taskId}).value_or(0);
+}
+
+bool sched::RunRecords::has(int64_t run) {
+    return number("SELECT count(*) FROM runs WHERE run=?", {run}).value_or(1) != 0;
 }
 
 bool sched::RunRecords::hasRunDue(int32_t taskId, int64_t due) {

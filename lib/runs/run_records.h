@@ -31,8 +31,9 @@ bool goesOn(const RunRecord &record);
 std::optional<int64_t> claimRunNumber();
 // Numbers below this one have been claimed; 0 when that is not known.
 int64_t nextRunNumber();
-// Brings the number behind all records, after a power cut may have set it back.
-void mendRunNumber();
+// Brings the number behind all records, after a power cut may have set it back, and makes the
+// folder.
+bool mendRunNumber();
 
 // Whether there are records at all.
 bool hasRunRecords();
@@ -40,11 +41,11 @@ bool hasRunRecords();
 class RunRecords {
   public:
     enum class Mode { Read, Write };
-    // What to do while somebody else has the database, for some milliseconds.
-    using Pause = std::function<void(int milliseconds)>;
+    // What to do while somebody else has the database, for some milliseconds; false: wait no more.
+    using Pause = std::function<bool(int milliseconds)>;
 
-    // Reading makes no database.
-    explicit RunRecords(Mode mode, Pause pause = {});
+    // Reading makes no database. A locked one is waited for so many milliseconds.
+    explicit RunRecords(Mode mode, Pause pause = {}, int patience = 3000);
     RunRecords(const RunRecords &) = delete;
     RunRecords &operator=(const RunRecords &) = delete;
 
@@ -65,6 +66,8 @@ class RunRecords {
     int list(const TAVI_SCHED_RUN_FILTER &filter,
              const std::function<bool(const RunRecord &)> &reader);
     std::optional<RunRecord> find(int64_t run);
+    // Also when that cannot be told.
+    bool has(int64_t run);
     int64_t newest();
 
     // The last minute of the task's runs whose records are gone, in milliseconds.
@@ -86,7 +89,8 @@ class RunRecords {
     bool failed(const char *what);
 
     Pause pause_;
-    int64_t patience_ = 0; // until then a locked database is waited for
+    int64_t patience_ = 0;    // until then a locked database is waited for
+    bool hasGivenUp_ = false; // on purpose
     bool isMissing_ = false;
     Handle database_{nullptr, sqlite3_close};
 };

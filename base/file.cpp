@@ -220,8 +220,9 @@ bool Replacement::commit(const Manner &manner) {
         return fail(Step::Attributes);
     }
     // Before the rename: what can fail before it leaves the old file in place.
-    const Descriptor folder = manner.durable ? openFolder(folderOf(path_)) : Descriptor();
-    if (manner.durable && !folder) {
+    const bool syncsFolder = manner.durable && manner.folderToo;
+    const Descriptor folder = syncsFolder ? openFolder(folderOf(path_)) : Descriptor();
+    if (syncsFolder && !folder) {
         return fail(Step::SyncFolder);
     }
     if (std::fclose(stream_.release()) != 0) {
@@ -231,7 +232,7 @@ bool Replacement::commit(const Manner &manner) {
         return fail(Step::Rename);
     }
     isMade_ = false;
-    return !manner.durable || syncFolder(folder) || fail(Step::SyncFolder);
+    return !syncsFolder || syncFolder(folder) || fail(Step::SyncFolder);
 }
 
 // ---- Putting in place ----

@@ -56,6 +56,7 @@ class Replacement {
     struct Manner {
         const struct stat *like = nullptr; // owner and mode; without it mode 0600
         bool durable = true;               // content before the rename, the folder after it
+        bool folderToo = true;             // flush the folder as well, or fail
         bool later = false; // by a second at least than `like`: cron compares whole seconds
     };
     // Once. When only the folder cannot be flushed, the new file is in place all the same.

@@ -1,13 +1,13 @@
 /*
  * The getters and tests of a task's fields, one row each. tavischeduler.h includes this file to
- * declare them and the library includes it once more to define them, so it has no include guard;
- * programs include tavischeduler.h.
+ * declare them and the library includes it once more to define them, so it has no include guard.
  *
- * All return 0, or -1 with error 0x0D00 when an argument is NULL or a buffer size is 0.
+ * A name is a form's and, for <X>, a row's first word: TAVISchedCTaskGetRunHour is found by looking
+ * for "(RunHour,". All return 0, or -1 with error 0x0D00 when an argument is NULL or a size is 0.
  *   TAVI_SCHED_GET_INT   TAVISchedCTaskGet<X>(value, task): the field.
  *   TAVI_SCHED_GET_TEXT  TAVISchedCTaskGet<X>(buffer, size, task): the text, cut to size - 1 bytes.
  *   TAVI_SCHED_IS        TAVISchedCTaskIs<X>(value, task): 1 when the field has the row's value,
- * else 0.
+ *                        else 0.
  */
 #ifndef TAVI_SCHED_GET_INT
 #include "tavischeduler.h"

@@ -1,14 +1,14 @@
 /*
  * The setters of a task's fields, one row each. tavischeduler.h includes this file to declare them
- * and the library includes it once more to define them, so it has no include guard; programs
- * include tavischeduler.h.
+ * and the library includes it once more to define them, so it has no include guard.
  *
+ * A name is TAVISchedCTaskSet and a row's first word, the <X> below: TAVISchedCTaskSetRunHour is
+ * found by looking for "(RunHour,".
  * All return 0, or -1 with error 0x0D00 when an argument is NULL.
- *   TAVI_SCHED_SET_INT   TAVISchedCTaskSet<X>(task, value): stores the value as given, no range
- * check. TAVI_SCHED_SET_FLAG  TAVISchedCTaskSet<X>(task, value): stores 1 when value is 1, else 0.
+ *   TAVI_SCHED_SET_INT   TAVISchedCTaskSet<X>(task, value): stores the value as given, no check.
+ *   TAVI_SCHED_SET_FLAG  TAVISchedCTaskSet<X>(task, value): stores 1 when value is 1, else 0.
  *   TAVI_SCHED_SET_TYPE  TAVISchedCTaskSet<X>(task): sets the schedule type.
- *   TAVI_SCHED_SET_TEXT  TAVISchedCTaskSet<X>(task, text): copies the text, cut to the field's
- * size.
+ *   TAVI_SCHED_SET_TEXT  TAVISchedCTaskSet<X>(task, text): copies it, cut to the field's size.
  */
 #ifndef TAVI_SCHED_SET_INT
 #include "tavischeduler.h"

@@ -1,17 +1,11 @@
 /*
  * The task scheduler of the storage appliance: tasks are stored, started by cron and run as their
- * owner. This header is usable from C and C++.
+ * owner. This header is usable from C and C++ and needs no other library's.
  *
  * Unless a declaration says otherwise, functions return 0 on success and -1 on failure. A failure
  * sets the process's error state (PLATCErrGet, PLATCErrorGetFile and PLATCErrorGetLine of platc.h)
- * and logs one line with syslog at LOG_ERR. A NULL pointer or a zero size is error 0x0D00
- * everywhere.
- *
- *   0x0100, 0x0200  out of memory             0x2000  no backend, no such value or name
- *   0x0400, 0x0500  run lock                  0x2700  a file's status could not be read
- *   0x0900          cannot open or create     0x2800  a file could not be moved into place
- *   0x0B00          read, write or look-up    0x2A00  a system call failed
- *   0x0D00          invalid argument          0x4000  bad format
+ * to one of TAVI_SCHED_ERR_*, or to what the platform found, and logs one line with syslog at
+ * LOG_ERR. A NULL pointer or a zero size is error 0x0D00 everywhere.
  *
  * The library is made for single-threaded processes: some functions return static buffers.
  */
@@ -27,6 +21,21 @@ extern "C" {
 #endif
 
 #define TAVI_SCHED_API __attribute__((visibility("default")))
+
+/* ---- Error codes ---- */
+
+#define TAVI_SCHED_ERR_SORT_MEMORY 0x0100      /* out of memory while sorting a list */
+#define TAVI_SCHED_ERR_MEMORY 0x0200           /* out of memory */
+#define TAVI_SCHED_ERR_LOCK 0x0400             /* a lock cannot be had, or not in time */
+#define TAVI_SCHED_ERR_UNLOCK 0x0500           /* the run lock cannot be released */
+#define TAVI_SCHED_ERR_OPEN 0x0900             /* a file cannot be opened, created or trusted */
+#define TAVI_SCHED_ERR_READ_WRITE 0x0B00       /* a read, write or look-up failed */
+#define TAVI_SCHED_ERR_INVALID_ARGUMENT 0x0D00 /* an argument that is not accepted */
+#define TAVI_SCHED_ERR_NOT_FOUND 0x2000        /* no such task, backend, value or name */
+#define TAVI_SCHED_ERR_FILE_STATUS 0x2700      /* a file's status cannot be read */
+#define TAVI_SCHED_ERR_RENAME 0x2800           /* a file cannot be moved into place */
+#define TAVI_SCHED_ERR_SYSTEM_CALL 0x2A00      /* a system call failed */
+#define TAVI_SCHED_ERR_BAD_FORMAT 0x4000       /* a text is not of the form that is due */
 
 /* ---- Task record ---- */
 
@@ -51,14 +60,21 @@ extern "C" {
 #define TAVI_SCHED_WEEK_DAYS 7
 
 /* One scheduled task. It holds no pointer but `next`, so a byte-wise copy is a full copy. Flags
- * hold 0 or 1. */
+ * hold 0 or 1.
+ *
+ * A new task (TAVISchedTaskAlloc, TAVISchedTaskGetDefault) is enabled and runs daily at 00:00 as
+ * root, without a command: id -1, `week` "1111111", first day 0/0/0, no repetition, an application
+ * and other texts that are empty but for `name` ("Task 7" after the next free id; "Power" in the
+ * power backend, whose `appName` is "#schedule:power_on_off#") and `editDialog`. All flags are 1
+ * but `canRunTaskSameTime` and `simpleEditForm`. */
 typedef struct TAVI_SCHED_TASK {
     struct TAVI_SCHED_TASK *next; /* next task of a list, or NULL */
     int32_t backend;              /* id of the backend that keeps the task */
     int32_t id;                   /* id within its backend; -1 = new, kept nowhere yet */
     uint32_t owner;               /* user id that the command runs as */
     char name[4096];
-    char nextTriggerTime[1024]; /* "YYYY-MM-DD hh:mm" or "N/A"; computed, never stored */
+    char nextTriggerTime[1024]; /* "YYYY-MM-DD hh:mm" or "N/A"; never stored: get by id and list
+                                 * compute it, saving leaves it as it is */
     int32_t state;              /* TAVI_SCHED_STATE_* */
     int32_t type;               /* TAVI_SCHED_TYPE_* */
     char week[8];               /* seven characters, Sunday first: '0' = not on that day */
@@ -257,20 +273,22 @@ TAVI_SCHED_API int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_REC
 
 /* ---- Task operations ---- */
 
-/* A new task with the schedule backend's defaults, or NULL with error 0x0200 or the failing
- * operation's. Freed with TAVISchedTaskFree. */
+/* A new task with the schedule backend's defaults (see the record), or NULL with error 0x0200 or
+ * the failing operation's. Freed with TAVISchedTaskFree. */
 TAVI_SCHED_API TAVI_SCHED_TASK *TAVISchedTaskAlloc(void);
 /* Frees the one task, not what follows in a list. */
 TAVI_SCHED_API int TAVISchedTaskFree(TAVI_SCHED_TASK *pTask);
-/* Fills the task with the defaults of the backend in its `backend` field, which the caller sets. */
+/* Fills the task with the defaults of the backend in its `backend` field, which the caller sets;
+ * the fields that are not stored keep their values. */
 TAVI_SCHED_API int TAVISchedTaskGetDefault(TAVI_SCHED_TASK *pTask);
-/* Reads a stored task. 0x2000 when no backend keeps it. */
+/* Reads a stored task and computes its next trigger time. 0x2000 when no backend keeps it. */
 TAVI_SCHED_API int TAVISchedTaskGetByID(int32_t id, TAVI_SCHED_TASK *pTask);
 /* Id -1: as TAVISchedTaskGetDefault (the caller sets `backend`); any other as TAVISchedTaskGetByID.
  */
 TAVI_SCHED_API int TAVISchedTaskLoad(int32_t id, TAVI_SCHED_TASK *pTask);
-/* Stores a new task in its backend, which sets the task's id. The task must not be NULL. 0x2000
- * when no backend serves it. */
+/* Stores a new task in its backend, which sets the task's id, and its name when that is empty; its
+ * next trigger time is not computed. The task must not be NULL. 0x2000 when no backend serves it.
+ */
 TAVI_SCHED_API int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask);
 /* Replaces the stored task of the same id. Returns the backend's result. */
 TAVI_SCHED_API int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask);
@@ -319,8 +337,10 @@ TAVI_SCHED_API int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTa
                                           TAVI_SCHED_FILTER filter);
 
 /* Makes the machine ready after its start, with root's rights: takes back what a change that was
- * cut off left, makes the working copy where there is none, the lock folder and the runner's link,
- * and synchronises. May be called at any time. */
+ * cut off left, fills a working copy that is missing, empty or another user's from what is stored,
+ * makes the lock folder and the runner's link, and synchronises, but for lines whose tasks are in
+ * neither file. What fails does not keep it from the rest. "tavischedtask --start" calls it at
+ * boot; it may be called at any time. 0x0D00 for anybody but root. */
 TAVI_SCHED_API int TAVISchedStart(void);
 
 /* ---- Several changes as one ---- */
@@ -339,6 +359,14 @@ TAVI_SCHED_API int TAVISchedStart(void);
 TAVI_SCHED_API int TAVISchedChangeBegin(void);
 TAVI_SCHED_API int TAVISchedChangeCommit(void);
 TAVI_SCHED_API int TAVISchedChangeRollback(void);
+/* The process whose change this one waits for at this moment, or waited for in vain in the last
+ * call that failed with 0x0400; else 0. May be called in a signal handler, so that a program can
+ * say what it waits for. */
+TAVI_SCHED_API int32_t TAVISchedWaitedFor(void);
+
+/* Whether the machine has a clock that can switch it on, which an enabled power-on schedule needs:
+ * 0 it has, 1 it has none, and the buffer tells why, -1. */
+TAVI_SCHED_API int TAVISchedPowerOnCheck(char *szReason, size_t cbReason);
 
 /* Sorts a list by a row of the field table, 0 to 30 (not checked). Direction 1 is ascending, any
  * other the exact reverse. Text fields order by their bytes. Number fields order by where the tasks
@@ -353,16 +381,19 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
 
 /* ---- Running ---- */
 
-/* Runs a stored task in a detached child, which waits for conflicting runs, runs the command as the
- * task's owner and records the result. Mode 1: only when it is due in this minute; mode 0: at once;
- * any other: nothing. `enabledOnly` 1 skips a disabled task. Returns 0 when the task was skipped or
- * the child was started; -1 when the task cannot be read or is marked not existing (0x2000), or the
- * date or the fork fails (0x2A00). */
+/* Runs a stored task in a detached child, which waits for conflicting runs, records the run, runs
+ * the command as the task's owner and records the result. All of that happens after this has
+ * returned: the run is not in the status database yet, and one that gives up waiting never is. Who
+ * wants to know more calls TAVISchedTaskRunFollowed. Mode 1: only when it is due in this minute;
+ * mode 0: at once; any other: nothing. `enabledOnly` 1 skips a disabled task. Returns 0 when the
+ * task was skipped or the child was started; -1 when the task cannot be read or is marked not
+ * existing (0x2000), or the date or the fork fails (0x2A00). */
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
 /* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
  * row bears, and `pEnd` a descriptor that reads end-of-file once the run has ended and its result
- * is stored, also when it recorded nothing; the caller closes it. What the command left behind may
- * keep the child longer. Both are -1 when the task was skipped. */
+ * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes
+ * it. What the command left behind may keep the child longer. Both are -1 when the task was
+ * skipped. */
 TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
                                             int32_t *pPid, int *pEnd);
 
@@ -391,11 +422,11 @@ typedef struct TAVI_SCHED_STATUS {
     char comment[1024];
 } TAVI_SCHED_STATUS;
 
-struct sqlite3;
+struct sqlite3; /* the functions below do with a handle all that is due; sqlite3.h is not needed */
 
-/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose or
- * sqlite3_close. NULL with error 0x0900, or without one when the table cannot be made. A statement
- * that meets a locked database is tried up to 101 times with a pause of up to a second between. */
+/* Opens the status database, made when missing; the caller closes it with TAVISchedDBClose. NULL
+ * with error 0x0900, or without one when the table cannot be made. A statement that meets a locked
+ * database is tried up to 101 times with a pause of up to a second between. */
 TAVI_SCHED_API struct sqlite3 *TAVISchedDBInit(void);
 /* Opens it to read what is there and makes nothing: 1 with the handle, 0 with NULL when there were
  * no runs yet, -1 with NULL and error 0x0900. */
@@ -435,6 +466,9 @@ TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
 /* The same for the newest run of every task that has one, in the order of their ids. */
 TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
                                              void *pContext);
+/* When the run of a row ended (seconds since the epoch): 1 known, 0 it goes on or that is not
+ * known, -1. */
+TAVI_SCHED_API int TAVISchedDBGetEnd(struct sqlite3 *db, int32_t statusId, int32_t *pTimestamp);
 
 /* ---- Records of runs: what a run did, beyond the machine's next start ----
  *
@@ -534,16 +568,26 @@ TAVI_SCHED_API int TAVISchedRunLimitsGet(TAVI_SCHED_RUN_LIMITS *pLimits);
 
 typedef struct TAVI_SCHED_FINDING {
     struct TAVI_SCHED_FINDING *next;
-    char name[32];     /* what was looked at, a stable word: "runner", "task files", ... */
-    char what[2048];   /* what is wrong; texts of tasks stand in it as they are */
-    char advice[1024]; /* what to do about it */
-    int32_t canRepair; /* 1 = TAVISchedFindingRepair can do it without a person */
-    int32_t isNote;    /* 1 = nothing is wrong yet */
+    char name[32];       /* what was looked at, a stable word; see TAVISchedMachineCheckOf */
+    char what[2048];     /* what is wrong; texts of tasks stand in it as they are */
+    char advice[1024];   /* what to do about it */
+    char repaired[1024]; /* what a repair has done about it; "" when it is for a person */
+    int32_t canRepair;   /* 1 = TAVISchedFindingRepair can do it without a person */
+    int32_t isNote;      /* 1 = nothing is wrong yet */
 } TAVI_SCHED_FINDING;
 
-/* Looks at everything that scheduled tasks need, with root's rights. Returns how many findings
- * there are; the head is overwritten with a list of them, those first on which others build. */
+/* Looks at everything that scheduled tasks need, with root's rights, when no change goes on.
+ * Returns how many findings there are; the head is overwritten with a list of them, those first on
+ * which others build. */
 TAVI_SCHED_API int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings);
+/* The same, but looks only at what is named, the names ended by NULL, and waits for no change:
+ *   "room" on the file systems, "folders", "task files" that are not the tasks, "missing files",
+ *   "put aside" tasks, "leftovers" of dead processes, "runner", "cron", "crontab" as a file,
+ *   "sections" of the working copy, "tasks", "power" schedules, "lines" of the crontab,
+ *   "status database", "plug-ins".
+ * 0x0D00 for another name. */
+TAVI_SCHED_API int TAVISchedMachineCheckOf(const char *const *rgszNames,
+                                           TAVI_SCHED_FINDING **ppFindings);
 /* Repairs one: 0 when it is not found any more, else -1. Others may be gone or new afterwards. */
 TAVI_SCHED_API int TAVISchedFindingRepair(const TAVI_SCHED_FINDING *pFinding);
 /* Frees all findings of a list and empties the head. */

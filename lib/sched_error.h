@@ -7,6 +7,7 @@
 
 #include "platc.h"
 #include "sched_text.h"
+#include "tavischeduler.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -19,18 +20,18 @@
 
 namespace sched {
 
-constexpr unsigned int kSortOutOfMemory = 0x0100;
-constexpr unsigned int kTaskOutOfMemory = 0x0200;
-constexpr unsigned int kLockFailed = 0x0400;
-constexpr unsigned int kUnlockFailed = 0x0500;
-constexpr unsigned int kOpenFailed = 0x0900;
-constexpr unsigned int kReadWriteFailed = 0x0B00;
-constexpr unsigned int kInvalidArgument = 0x0D00;
-constexpr unsigned int kNotFound = 0x2000;
-constexpr unsigned int kStatFailed = 0x2700;
-constexpr unsigned int kRenameFailed = 0x2800;
-constexpr unsigned int kSystemCallFailed = 0x2A00;
-constexpr unsigned int kBadFormat = 0x4000;
+constexpr unsigned int kSortOutOfMemory = TAVI_SCHED_ERR_SORT_MEMORY;
+constexpr unsigned int kTaskOutOfMemory = TAVI_SCHED_ERR_MEMORY;
+constexpr unsigned int kLockFailed = TAVI_SCHED_ERR_LOCK;
+constexpr unsigned int kUnlockFailed = TAVI_SCHED_ERR_UNLOCK;
+constexpr unsigned int kOpenFailed = TAVI_SCHED_ERR_OPEN;
+constexpr unsigned int kReadWriteFailed = TAVI_SCHED_ERR_READ_WRITE;
+constexpr unsigned int kInvalidArgument = TAVI_SCHED_ERR_INVALID_ARGUMENT;
+constexpr unsigned int kNotFound = TAVI_SCHED_ERR_NOT_FOUND;
+constexpr unsigned int kStatFailed = TAVI_SCHED_ERR_FILE_STATUS;
+constexpr unsigned int kRenameFailed = TAVI_SCHED_ERR_RENAME;
+constexpr unsigned int kSystemCallFailed = TAVI_SCHED_ERR_SYSTEM_CALL;
+constexpr unsigned int kBadFormat = TAVI_SCHED_ERR_BAD_FORMAT;
 
 // A source's name as messages carry it: the path below lib/ or include/. Found at compile time, as
 // operations name their place also when nothing fails.

@@ -48,7 +48,7 @@ class ChangeHook {
     void afterwards(int result) {
         if (context_) {
             PLATPLUGIN *const handle = context_->handle;
-            finish(handle && PLATPluginSetArgByInt(handle, "RESULT", result) == 0
+            finish(handle && PLATPluginSetArgByInt(handle, "RESULT", result) >= 0
                        ? PLATPluginAction(TAVI_SCHED_PLUGIN_POST, handle)
                        : -1);
         }

@@ -89,9 +89,9 @@ int makeTasksReady() {
     if (!change) {
         return -1;
     }
+    // A change that was cut off has been taken back, with its temporary crontab.
     constexpr timespec kNever{.tv_sec = std::numeric_limits<time_t>::max(), .tv_nsec = 0};
-    sched::removeLeftovers(
-        kNever); // temporary crontabs may be those of a change that goes on elsewhere
+    sched::removeLeftovers(kNever);
     const off_t size = ensureWorkingCopy();
     return size >= 0 ? synchronise(size > 0) : -1;
 }

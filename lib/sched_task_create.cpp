@@ -24,6 +24,7 @@ int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask) {
     }
     // The hook fires only here, unlike those of edit and remove: handlers have come to take a
     // "task_create" as news of a creation that found no backend.
+    const sched::KeptError error;
     sched::ChangeHook hook(SCHED_SITE, "task_create", nullptr, pTask);
     hook.after(-1);
     return -1;

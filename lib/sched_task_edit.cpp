@@ -32,7 +32,7 @@ int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
     sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
     const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;
     if (sched::isBatchOpen()) {
-        sched::deferHook(std::move(hook), result);
+        sched::deferHook(hook, result);
     } else {
         hook.after(result);
     }

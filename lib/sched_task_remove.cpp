@@ -44,7 +44,7 @@ int TAVISchedTaskRemove(int32_t id) {
         sched::whenStored([id] { sched::separateFromRemovedTask(id); });
     }
     if (sched::isBatchOpen()) {
-        sched::deferHook(std::move(hook), result);
+        sched::deferHook(hook, result);
     } else {
         hook.after(result);
     }

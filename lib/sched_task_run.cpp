@@ -10,6 +10,7 @@
 #include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
+#include "sched_run_end.h"
 #include "sched_shared_file.h"
 #include "tavischeduler.h"
 #include "tavisdk.h"
@@ -351,12 +352,15 @@ class TaskRun {
     }
 
     void storeResult() {
-        if (openDatabase() &&
-            TAVISchedDBSetStatus(database_.get(), statusId_, SCHED_STATUS_CODE_RUNNING, statusCode_,
+        if (!openDatabase()) {
+            return;
+        }
+        if (TAVISchedDBSetStatus(database_.get(), statusId_, SCHED_STATUS_CODE_RUNNING, statusCode_,
                                  comment_.data()) < 0) {
             SCHED_LOG("Update status record failed. id:[%ld][0x%04X %s:%d]", id(),
                       SCHED_LAST_ERROR);
         }
+        sched::recordEnd(database_.get(), statusId_);
     }
 
     TAVI_SCHED_TASK &task_;

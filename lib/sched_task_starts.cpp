@@ -9,6 +9,7 @@
 #include "sched_guard.h"
 #include "tavischeduler.h"
 
+#include <algorithm>
 #include <array>
 #include <bitset>
 #include <chrono>
@@ -31,16 +32,14 @@ bool isPower(const TAVI_SCHED_TASK &task) {
 // The days on which a task is started, from its line and the due test together.
 class Days {
   public:
-    explicit Days(const TAVI_SCHED_TASK &task)
-        : task_(task), start_{chrono::year(static_cast<int>(task.startYear)),
-                              chrono::month(task.startMonth), chrono::day(task.startDay)} {}
+    explicit Days(const TAVI_SCHED_TASK &task) : task_(task) {}
 
     bool has(const chrono::year_month_day &day, unsigned int weekDay) const {
         if (!isPower(task_) && order(day) < 0) {
             return false;
         }
-        const bool isSameDay = day.day() == start_.day();
-        const bool isSameMonth = day.month() == start_.month();
+        const bool isSameDay = static_cast<unsigned int>(day.day()) == task_.startDay;
+        const bool isSameMonth = static_cast<unsigned int>(day.month()) == task_.startMonth;
         switch (task_.type) {
         case TAVI_SCHED_TYPE_ONCE:
             return order(day) == 0;
@@ -60,21 +59,16 @@ class Days {
     }
 
   private:
-    // The day against the start day: below 0 before it, above 0 after it. Its fields may be no
-    // date.
+    // The day against the start day: below 0 before it, above 0 after it.
     int order(const chrono::year_month_day &day) const {
-        const auto key = [](const chrono::year_month_day &date) {
-            return (static_cast<int64_t>(static_cast<int>(date.year())) * 1000 +
-                    static_cast<unsigned int>(date.month())) *
-                       1000 +
-                   static_cast<unsigned int>(date.day());
-        };
-        const int64_t difference = key(day) - key(start_);
-        return difference < 0 ? -1 : difference > 0 ? 1 : 0;
+        const std::array date{static_cast<uint32_t>(static_cast<int>(day.year())),
+                              static_cast<uint32_t>(static_cast<unsigned int>(day.month())),
+                              static_cast<uint32_t>(static_cast<unsigned int>(day.day()))};
+        const std::array start{task_.startYear, task_.startMonth, task_.startDay};
+        return date < start ? -1 : date > start ? 1 : 0;
     }
 
     const TAVI_SCHED_TASK &task_;
-    chrono::year_month_day start_;
 };
 
 // A local calendar day, and where it begins when it is an ordinary one.
@@ -174,6 +168,9 @@ int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t unti
     SCHED_REQUIRE(pTask, "((void *)0) != pTask", -1);
     SCHED_REQUIRE(rgStarts, "((void *)0) != rgStarts", -1);
     SCHED_REQUIRE(cMax > 0, "0 < cMax", -1);
+    // Years of four digits, which is what dates are made for.
+    from = std::max<int64_t>(from, 0);
+    until = std::min<int64_t>(until, 253402300800);
     const auto hours = hoursOf(*pTask);
     if (!hours || !hasLine(*pTask)) {
         return 0;

@@ -26,7 +26,7 @@ of_zsh() { sed -nE "s/^ +'([a-z-]+):.*/!\1/p; s/^ +([a-z|]+)\)$/@\1/p; s/.*(--[a
     completion/_tavisched | spread; }
 of_fish() { sed -nE "s/.*use_subcommand -a ([a-z-]+) .*/!\1/p; s/.*use_subcommand .*-l ([a-z-]+).*/@\n--\1/p
     s/.*subcommand_from ([a-z ]+)'.* -l ([a-z-]+).*/@\1\n--\2/p" completion/tavisched.fish | spread; }
-of_manual() { grep -E '^\.(It|Sh)' man/tavisched.1 | sed 's/ Fl Fl /\n--/g' | sed -nE 's/^\.It Cm ([a-z-]+).*/!\1\n@\1/p
+of_manual() { grep -E '^\.(It|Sh)' man/tavisched.8 | sed 's/ Fl Fl /\n--/g' | sed -nE 's/^\.It Cm ([a-z-]+).*/!\1\n@\1/p
     s/^\.Sh OPTIONS OF ADD AND EDIT/@add edit/p; s/^(--[a-z-]+).*/\1/p' | spread; }
 sorted() { grep -v -e '--help$' -e '^$' | sort -u; }
 for source in manual bash zsh fish; do
@@ -41,5 +41,7 @@ s:show sync
 add --name list --d:--daily --disabled --dry-run
 add --weekly Mon,T:Mon,Tue Mon,Thu
 --verbose remove 2 1:1 12
+ls --f:--failed
+rm --yes 1:1 12
 END
 exit $status

@@ -3,6 +3,8 @@
 # of /usr and /var private as well. Needs root or sudo.
 #
 #   tests/package_test.sh BUILD_FOLDER     built, and configured with -DCMAKE_INSTALL_PREFIX=/usr
+#
+# Exit status 77 where the caller is no root and has no sudo.
 set -euo pipefail
 source=$(cd "$(dirname "$0")/.." && pwd)
 debs=$(cd "$1" && pwd)/packages
@@ -10,22 +12,40 @@ later=99.0.0
 crontab=/etc/crontab
 check=/usr/tavi/bin/tavi_poweroff_feasible_check
 tasks=/usr/tavi/etc/scheduled_tasks
-log=${2:-$debs}/log
+working=/tmp/scheduled_tasks
+unit=/usr/lib/systemd/system/tavischeduler.service
+own=/home/package_test # what the test itself keeps, in the sandbox
+log=$own/log
 
 step() { printf 'package_test: %s\n' "$*"; }
 fail() { printf 'package_test: FAILED: %s\n' "$*" >&2; exit 1; }
 expect() { local what=$1; shift; "$@" || fail "$what"; }
 quietly() { "$@" >"$log" 2>&1 </dev/null || { cat "$log" >&2; fail "$*"; }; }
 manage() { quietly dpkg --force-confdef --force-confold "$@"; }
-files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T /mnt; }
-expect_same() { expect "$1 changed $2" cmp "$2" "/mnt/${2##*/}"; }
+files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T $own; }
+expect_same() { expect "$1 changed $2" cmp "$2" "$own/${2##*/}"; }
 expect_own_crontab() { # as it was before the installation
-    expect "after $1 $crontab is not the machine's own" cmp $crontab /mnt/crontab.own
+    expect "after $1 $crontab is not the machine's own" cmp $crontab $own/crontab.own
     expect "$1 changed mode or owner of $crontab" [ "$(stat -c %a:%U:%G $crontab)" = 640:root:adm ]
 }
 expect_only_cron_missing() {
     local found; found=$(tavisched check | sed -n 's/^problem: //p') || true
     expect "check complains: $found" [ "${found%%,*}, $(wc -l <<< "$found")" = "cron is not running, 1" ]
+}
+expect_working_copy() { # as the stored tasks are, of root's alone
+    expect "$1 left $working $(stat -c %a:%U:%h $working)" [ "$(stat -c %a:%U:%h $working)" = 600:root:1 ]
+    expect "$1 left other tasks in $working" cmp $working "$2"
+}
+boot() { # what tmpfiles.d and the unit do; of /tmp nothing is left, or what is there stays
+    [ "$1" = stays ] || rm -rf $working* /tmp/lock /tmp/tavischedtask /tmp/sched_status.sqlite*
+    quietly systemd-tmpfiles --boot --remove --create tavischeduler.conf
+    expect "the name of the working copy is free before the unit runs" [ -f $working ]
+    # shellcheck disable=SC2046 # a list of words
+    quietly $(sed -n 's/^ExecStart=//p' $unit)
+}
+spoil() { # FILE as the loss of power left it
+    case $2 in torn) truncate -s "$(($(stat -c %s "$1") / 2))" "$1" ;; empty) truncate -s 0 "$1" ;; gone) rm "$1" ;;
+        as-before) cp "$own/${1##*/}" "$1" ;; esac
 }
 expect_files() {
     local wrong package=$1; shift
@@ -39,6 +59,9 @@ expect_files() {
 
 if [ $# -eq 1 ]; then
     expect "$1 is not configured with the prefix /usr" [ -f "$1/CPackConfig.cmake" ]
+    sudo=; [ "$(id -u)" -eq 0 ] || sudo="sudo -n"
+    $sudo true || { step "skipped: needs root or sudo"; exit 77; }
+    log=$debs/log
     rm -rf "$debs"
     mkdir "$debs"
     cd "$1"
@@ -47,18 +70,17 @@ if [ $# -eq 1 ]; then
     quietly cpack -G DEB -B packages/now
     quietly cpack -G DEB -B packages/later -D CPACK_PACKAGE_VERSION=$later
     umask 022
-    sudo=; [ "$(id -u)" -eq 0 ] || sudo=sudo
-    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" /mnt
+    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" inside
 fi
 
 # What lies in /usr/local on the machine is not tested, and nothing of the environment counts.
 export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive
 unset LD_LIBRARY_PATH LIBRARY_PATH CPATH PKG_CONFIG_PATH CMAKE_PREFIX_PATH
 rm -rf /usr/tavi
-mount -t tmpfs layers /mnt
+mkdir $own
 for folder in /usr/*/ /var/; do
-    mkdir -p "/mnt$folder"{upper,work}
-    mount -t overlay overlay -o "lowerdir=$folder,upperdir=/mnt${folder}upper,workdir=/mnt${folder}work" "$folder"
+    mkdir -p "$own$folder"{upper,work}
+    mount -t overlay overlay -o "lowerdir=$folder,upperdir=$own${folder}upper,workdir=$own${folder}work" "$folder"
 done
 mount -t tmpfs local /usr/local
 manage --purge tavischeduler-dev tavischeduler # where the machine has them
@@ -68,8 +90,8 @@ touch /usr/tavi/bin/of-the-machine
 printf '%s\n' 'SHELL=/bin/sh' '# tavischedtask' '0 5 * * * root /opt/tavischedtask' > $crontab
 chown root:adm $crontab
 chmod 640 $crontab
-cp $crontab /mnt/crontab.own
-files > /mnt/files
+cp $crontab $own/crontab.own
+files > $own/files
 
 step "installation"
 manage -i "$debs"/now/*.deb
@@ -78,29 +100,36 @@ for package in 'cron | cron-daemon' procps libc6 libjsoncpp libsodium libsqlite3
 done
 lib=/usr/lib/$(cc -print-multiarch)
 expect_files tavischeduler /usr/sbin/tavisched{,task} "$lib"/lib{tavischeduler.so.4,taviplatform.so.1} \
-    /usr/lib/tmpfiles.d/tavischeduler.conf /usr/share/man/man{1/tavisched.1,8/tavischedtask.8}.gz \
+    /usr/lib/tmpfiles.d/tavischeduler.conf $unit /usr/share/man/man8/tavisched{,task}.8.gz \
     /usr/share/{bash-completion/completions/tavisched,zsh/vendor-completions/_tavisched} \
     /usr/share/fish/vendor_completions.d/tavisched.fish /usr/tavi/etc/plugins/task_scheduler \
-    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,changelog.Debian.gz}
+    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,{changelog.Debian,README.md}.gz}
 expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavischedsetter}.h \
     /usr/include/{platc,platplugin,tavisdk}.h "$lib"/lib{tavischeduler,taviplatform}.so \
     "$lib"/{pkgconfig/tavischeduler.pc,cmake/tavischeduler/tavischeduler-config.cmake} \
-    /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/copyright
+    /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/{copyright,examples/task.c}
 expect "programs look for libraries elsewhere" \
     [ -z "$(readelf -d /usr/sbin/tavisched{,task} "$lib"/libtavi*.so | grep -E 'R(UN)?PATH')" ]
 expect_only_cron_missing
+expect_working_copy installation /dev/null
+expect "the unit is not enabled" [ -L /etc/systemd/system/multi-user.target.wants/${unit##*/} ]
+quietly systemd-analyze verify --man=no $unit
+rm -rf /run/systemd # where it notes what it looked at
 
 step "programs built over the installed package"
-# shellcheck disable=SC2046 # a list of words
-quietly cc "$source/examples/task.c" -o /mnt/task $(pkg-config --cflags --libs tavischeduler)
-quietly cmake -S "$source/examples" -B /mnt/example
-quietly cmake --build /mnt/example
+flags=$(pkg-config --cflags --libs tavischeduler | xargs)
+expect "pkg-config says: $flags" [ "$flags" = "-ltavischeduler -ltaviplatform" ]
+examples=/usr/share/doc/tavischeduler-dev/examples
+# shellcheck disable=SC2086 # a list of words
+quietly cc $examples/task.c -o $own/task $flags
+quietly cmake -S $examples -B $own/example
+quietly cmake --build $own/example
 
 step "tasks"
 id=$(tavisched add -q --name Nightly --command 'id -un > /tmp/ran' --daily --at 03:00 --owner nobody)
 quietly tavisched add --power off --weekly Mon --at 04:00
 expect "the task is not listed" grep -q Nightly <(tavisched list)
-expect "a program built over the package does not find the task" grep -q Nightly <(/mnt/task show "$id")
+expect "a program built over the package does not find the task" grep -q Nightly <($own/task show "$id")
 quietly tavisched run "$id" --wait
 expect "the task did not run as its owner" grep -qx nobody /tmp/ran
 rm /tmp/ran
@@ -113,10 +142,56 @@ quietly systemd-tmpfiles --create tavischeduler.conf
 expect "the power-off check is not made" cmp $check /usr/share/tavischeduler/${check##*/}
 echo '# changed on this machine' >> $check
 chmod 700 $check
-cp $check $tasks $crontab /mnt
+cp $check $tasks $crontab $own
 quietly systemd-tmpfiles --create tavischeduler.conf
 expect_same boot $check
 expect "boot changed the mode of $check" [ "$(stat -c %a $check)" = 700 ]
+
+step "boot: what was cut off comes back whole"
+# Copies one half and is killed with its caller where it is to write what CUT names.
+mv /usr/bin/cp /home/package_test/cp
+cat > /usr/bin/cp << 'END'
+#!/bin/sh
+[ "$3" = "${CUT:-nothing}" ] || exec /home/package_test/cp "$@"
+head -c 400 "$2" > "$3"
+kill -9 $PPID
+END
+chmod 755 /usr/bin/cp
+printf '{"id": "\\"-1\\""%s}' "$(printf ', "%s": "\\"%s\\""' 'run hour' 5 'run min' 0 name New app '' 'app name' '' \
+    action '' cmd dHJ1ZQ== state enabled type daily)" > /home/package_test/new.json
+while read -r CUT stored record tmp; do
+    row="a change cut off at $CUT with $stored tasks, $record record and /tmp that $tmp"
+    CUT=$CUT bash -c '/home/package_test/task save /home/package_test/new.json; true' &>"$log"
+    expect "$row: nothing was recorded" [ -s $tasks.journal ]
+    spoil $tasks "$stored"
+    spoil $tasks.journal "$record"
+    boot "$tmp"
+    for file in $tasks $crontab; do expect_same "$row" "$file"; done
+    expect_working_copy "$row" $tasks
+    expect "$row: the record is still there" [ -z "$(compgen -G "$tasks.journal*")" ]
+done << END
+$tasks torn whole is-lost
+$tasks empty whole is-lost
+$tasks gone whole stays
+$tasks as-before torn is-lost
+$tasks as-before empty is-lost
+$working whole whole is-lost
+$working torn whole stays
+$working empty whole is-lost
+END
+quietly /home/package_test/task save /home/package_test/new.json
+mv /home/package_test/cp /usr/bin/cp
+expect "no change is possible afterwards" grep -q '^name=New$' $tasks
+quietly tavisched remove --yes 2
+expect_same "a task that came and went" $tasks
+rm $tasks # lines of tasks that are nowhere else are the last trace of them
+boot is-lost
+expect_same "a boot without tasks" $crontab
+expect_working_copy "a boot without tasks" /dev/null
+cp /home/package_test/${tasks##*/} $tasks
+install -o nobody /home/package_test/new.json $working # and a user's file at the name is not believed
+boot stays
+expect_working_copy boot $tasks
 
 step "upgrade"
 manage -i "$debs"/later/*.deb
@@ -132,12 +207,12 @@ expect "removal left the runner's link" [ ! -L /tmp/tavischedtask ]
 
 step "re-installation"
 manage -i "$debs"/later/*.deb
-expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort /mnt/crontab)
+expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort $own/crontab)
 expect_same re-installation $check
 expect_only_cron_missing
 
 step "purge"
 manage --purge tavischeduler-dev tavischeduler
 expect_own_crontab purge
-expect "purge left or took files" diff /mnt/files <(files)
+expect "purge left or took files" diff $own/files <(files)
 step "passed"

@@ -314,6 +314,7 @@ TEST_F(Platform, ProgramsAndProcesses) {
 TEST_F(Platform, DetachedChildren) {
     int output[2];
     ASSERT_EQ(pipe(output), 0);
+    fflush(stdout);
     const pid_t caller = fork();
     if (caller == 0) {
         dup2(output[1], 1);

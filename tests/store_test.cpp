@@ -161,4 +161,18 @@ TEST_F(Store, StrangeWorkingCopiesAreRefused) {
     EXPECT_EQ(readFile("/etc/target"), planted);
 }
 
+TEST_F(Store, AWorkingCopyWithASecondNameIsReadAndChanged) {
+    storeIds("1");
+    ASSERT_EQ(link(kWorking, "/tmp/second-name"), 0);
+    const std::string before = readFile("/tmp/second-name");
+    Task task = newTask();
+    ASSERT_EQ(TAVISchedTaskGetByID(1, task.get()), 0);
+    task->runHour = 9;
+    EXPECT_EQ(TAVISchedTaskEdit(task.get()), 0);
+    ASSERT_EQ(TAVISchedTaskGetByID(1, task.get()), 0);
+    EXPECT_EQ(task->runHour, 9U);
+    EXPECT_EQ(readFile("/tmp/second-name"), before);
+    unlink("/tmp/second-name");
+}
+
 } // namespace

@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 #include <cstring>
@@ -119,6 +120,11 @@ std::string query(const std::string &sql) {
 int shell(const std::string &command) {
     const int status = std::system(command.c_str());
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+bool waitFor(const std::string &condition) {
+    return shell("for i in $(seq 12000); do ! { " + condition +
+                 "; } || exit 0; sleep 0.01; done; exit 1") == 0;
 }
 
 void waitForChildren() {
@@ -268,10 +274,11 @@ int rename(const char *from, const char *to) noexcept {
 }
 
 int fsync(int fd) {
-    const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd));
+    std::error_code error;
+    const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd), error);
     support::calledOnFiles.push_back("fsync " + path.string());
     const bool fails =
-        fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path));
+        fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path, error));
     errno = EIO;
     return fails ? -1 : support::next<int (*)(int)>("fsync")(fd);
 }
@@ -279,6 +286,11 @@ int fsync(int fd) {
 } // extern "C"
 
 int main(int argc, char **argv) {
+    // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may
+    // not.
+    for (const int number : {SIGHUP, SIGINT, SIGQUIT, SIGPIPE, SIGTERM, SIGCHLD, SIGALRM}) {
+        signal(number, SIG_DFL);
+    }
     const char *const sandbox = std::getenv("TAVI_SANDBOX");
     const bool onlyList = std::any_of(argv + 1, argv + argc, [](const char *argument) {
         return std::strncmp(argument, "--gtest_list_tests", 18) == 0;

@@ -26,6 +26,7 @@ using testing::IsEmpty;
 
 constexpr const char *kWorking = "/tmp/scheduled_tasks";
 constexpr const char *kPersistent = "/usr/tavi/etc/scheduled_tasks";
+constexpr const char *kRunner = "/tmp/tavischedtask";
 constexpr const char *kCrontab = "/etc/crontab";
 constexpr const char *kForeignCrontab = "SHELL=/bin/sh\n17 *\t* * *\troot\ttrue\n";
 // The line of a task with id 1 that has the default schedule.
@@ -66,6 +67,8 @@ void writeFile(const std::string &path, const std::string &content);
 struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Waits until a shell command succeeds, for two minutes at most.
+bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.
 std::string query(const std::string &sql);
 // Waits until all detached children of this process have ended.

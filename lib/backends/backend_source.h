@@ -3,5 +3,11 @@
 
 #include "sched_error.h"
 
+// What has no stable number of its own reports as the file that it stands in.
+#define SCHED_OWN_SITE                                                                             \
+    sched::Site {                                                                                  \
+        sched::sourceName(__FILE__), __LINE__                                                      \
+    }
+
 #undef SCHED_SOURCE
 #define SCHED_SOURCE "backends/backend_tavischedule.cpp"

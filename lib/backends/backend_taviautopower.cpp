@@ -1,6 +1,8 @@
 // The power backend: shows the machine's power-on and power-off schedules as tasks. It stores
 // nothing of its own: the auto-power configuration is the only store, and a task's id is computed
 // from the entry that it stands for, so that an edit changes the id.
+#include "base/file.h"
+#include "base/trust.h"
 #include "change/batch.h"
 #include "change/change.h"
 #include "platc.h"
@@ -77,7 +79,8 @@ class Entries {
     bool read(int kind) {
         const auto &changed = staged[static_cast<size_t>(kind)];
         if (changed) {
-            count_ = static_cast<int>(std::min(changed->size(), entries_.size()));
+            count_ =
+                static_cast<int>(std::min<size_t>(changed->size(), TAVI_AUTOPOWER_MAX_ENTRIES));
             std::copy_n(changed->begin(), count_, entries_.begin());
         } else {
             count_ = TAVIAutoPowerConfGet(kind, TAVI_AUTOPOWER_MAX_ENTRIES, entries_.data());
@@ -190,6 +193,7 @@ sched::Allocated<Task> makeTask(int kind, size_t index, const Entry &entry) {
     const auto id = idOf(kind, entry);
     if (!id) {
         SCHED_LOG("taviautopower_get_from_psched failed.");
+        SCHED_SET_ERROR(sched::kBadFormat);
         return nullptr;
     }
     // The name of a listed task, of one fetched by id and of a new one differ; front ends know all
@@ -223,6 +227,7 @@ int listKind(int kind, TAVI_SCHED_FILTER filter, sched::TaskList &tasks) {
 }
 
 int ListGet(Task **pTaskList, TAVI_SCHED_FILTER filter) {
+    SCHED_REQUIRE(pTaskList, "((void *)0) != pTaskList", -1);
     sched::TaskList tasks;
     int total = 0;
     for (const int kind : {TAVI_AUTOPOWER_KIND_ON, TAVI_AUTOPOWER_KIND_OFF}) {
@@ -254,6 +259,7 @@ int GetByID(int32_t id, Task *pTask) {
         const auto entryId = idOf(kind, all[index]);
         if (!entryId) {
             SCHED_LOG("transform power schedule to id failed. ");
+            SCHED_SET_ERROR(sched::kBadFormat);
             return -1;
         }
         if (*entryId != id) {
@@ -300,6 +306,8 @@ int describeKind(int kind, std::span<const Entry> entries, sched::Before &before
     return 0;
 }
 
+bool isStored = false; // by the change that goes on
+
 // Stores what a kind's entries have become: for the batch that goes on, or with a record of what
 // they were.
 int storeEntries(int kind, std::span<const Entry> before, std::span<const Entry> after) {
@@ -309,7 +317,11 @@ int storeEntries(int kind, std::span<const Entry> before, std::span<const Entry>
     }
     sched::Before record;
     describeKind(kind, before, record);
-    return sched::Change::record(record) != 0 ? -1 : writeEntries(kind, after);
+    if (sched::Change::record(record) != 0 || writeEntries(kind, after) != 0) {
+        return -1;
+    }
+    isStored = true;
+    return 0;
 }
 
 // Replaces or appends the entry of the id, or removes it when there is no task: 1 changed, 0
@@ -399,7 +411,35 @@ int addCrontabLine(const Entry &entry) {
     return 0;
 }
 
-int setPowerOffLines(std::span<const Entry> entries) {
+// The crontab as it is when this is made, for a failure between the removal of lines and the last
+// of the new ones: what is due meanwhile must not be missing.
+class CrontabBefore {
+  public:
+    CrontabBefore() : opened_(base::openTrusted(kCrontab, base::kOrdinaryFile)) {
+        if (opened_.found == base::Found::Trusted) {
+            content_ = base::readAll(opened_.file.get());
+        }
+    }
+    // The error stays that of the failure.
+    void putBack() const {
+        const sched::KeptError error;
+        const auto now = CrontabBefore().content_;
+        if (!content_ || now == content_) {
+            return;
+        }
+        base::Replacement crontab(kCrontab, base::processTemporary());
+        if (!crontab.open() || !crontab.write(*content_) ||
+            !crontab.commit({.like = &opened_.status, .later = true})) {
+            SCHED_LOG("%s cannot be put back: %m", kCrontab);
+        }
+    }
+
+  private:
+    base::Opened opened_;
+    std::optional<std::string> content_;
+};
+
+int replacePowerOffLines(std::span<const Entry> entries) {
     if (removeCrontabLines() < 0) {
         return -1;
     }
@@ -413,6 +453,15 @@ int setPowerOffLines(std::span<const Entry> entries) {
         }
     }
     return 0;
+}
+
+int setPowerOffLines(std::span<const Entry> entries) {
+    const CrontabBefore before;
+    const int result = replacePowerOffLines(entries);
+    if (result != 0) {
+        before.putBack();
+    }
+    return result;
 }
 
 int applyConfiguration() {
@@ -443,8 +492,9 @@ template <typename Body> int inChange(Body &&body) {
             if (!change) {
                 return -1;
             }
+            isStored = false;
             const int result = body();
-            return change.finish() == 0 ? result : -1;
+            return (result >= 0 || isStored) && change.finish() != 0 ? -1 : result;
         },
         -1);
 }
@@ -497,6 +547,7 @@ int Create(Task *pTask) {
     const auto kind = kindOfArguments(*pTask);
     if (!kind) {
         SCHED_LOG("Invalid app args for power [%s]", sched::LogText(pTask->appArgs).c_str());
+        SCHED_SET_ERROR(sched::kInvalidArgument);
         return -1;
     }
     pTask->id = idOf(*kind, *entry).value(); // an entry made of a task has its ranges
@@ -603,11 +654,7 @@ int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) 
                   sched::LogText(szName).c_str());
         return -1;
     }
-    static const bool joined = [] {
-        sched::joinBatches({isTouched, describe, store, applyConfiguration, forget});
-        return true;
-    }();
-    static_cast<void>(joined);
+    sched::joinBatches({isTouched, describe, store, applyConfiguration, forget});
     *pBackend = {.id = pBackend->id,
                  .name = szName,
                  .sync = Sync,

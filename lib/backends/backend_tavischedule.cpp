@@ -10,6 +10,7 @@
 #include "sched_field.h"
 #include "sched_guard.h"
 #include "sched_handle.h"
+#include "staged_tasks.h"
 #include "task_file.h"
 #include "tavischeduler.h"
 
@@ -17,6 +18,7 @@
 #include <array>
 #include <cstdio>
 #include <cstring>
+#include <functional>
 #include <string_view>
 #include <sys/wait.h>
 
@@ -42,7 +44,7 @@ int ListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
         }
         return true;
     };
-    if (sched::forEachStoredTask({.fresh = true, .onTask = keep}) != 0) {
+    if (sched::forEachStoredTask({.fresh = true, .onTask = std::ref(keep)}) != 0) {
         return -1;
     }
     tasks.appendTo(pTaskList);
@@ -64,7 +66,7 @@ int GetNextId(int32_t *pID) {
 // ---- Crontab ----
 
 // The lines stand in the order in which the tasks were read, which is that of their records.
-int gatherLines(sched::RunnerLines &lines) {
+int gatherLines(sched::RunnerLines &lines, int &unreadable) {
     int count = 0;
     const auto add = [&](const char *, TAVI_SCHED_TASK *task) {
         ++count;
@@ -75,34 +77,42 @@ int gatherLines(sched::RunnerLines &lines) {
         }
         return true;
     };
-    const auto keep = [&](const char *section) { lines.unreadable.emplace_back(section); };
+    const auto keep = [&](const char *section) {
+        if (sched::idOfSection(section)) {
+            lines.unreadable.emplace_back(section);
+        }
+        ++unreadable;
+    };
     return sched::forEachStoredTask({.onTask = add, .onUnreadable = keep}) == 0 ? count : -1;
 }
 
 struct Synced {
     int count; // of tasks, or -1
-    bool whole;
+    bool isWritten;
+    int unreadable; // sections whose lines stayed as they were
 };
 
 Synced syncCrontab() {
     sched::RunnerLines lines;
-    const int count = gatherLines(lines);
+    int unreadable = 0;
+    const int count = gatherLines(lines, unreadable);
     if (count < 0) {
         SCHED_LOG_AT(272, "get task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
-        return {count, false};
+        return {count, false, unreadable};
     }
-    const bool whole = sched::rewriteCrontab(lines) == 0 && lines.unreadable.empty();
-    if (!whole) {
+    const bool isWritten =
+        sched::guarded(SCHED_SITE, [&] { return sched::rewriteCrontab(lines); }) == 0;
+    if (!isWritten || unreadable > 0) {
         SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
     }
-    return {count, whole};
+    return {count, isWritten, unreadable};
 }
 
 // A failed rewrite answers the number of tasks, not -1: the change itself is stored, and the front
 // ends take only a negative answer for a change that is not. Only the log and the error state tell.
 int SyncCrontab() {
-    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false});
-    return synced.whole ? 0 : synced.count;
+    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false, 0});
+    return synced.isWritten && synced.unreadable == 0 ? 0 : synced.count;
 }
 
 bool crontabIsStaged = false; // a batch asks for the crontab at its end
@@ -172,7 +182,7 @@ int Remove(int32_t id) {
         return -1;
     }
     if (removed == 0) {
-        return change.discard();
+        return 0;
     }
     return finishChange(change, 502) == 0 ? 1 : -1;
 }
@@ -183,7 +193,24 @@ bool isTouched() {
     return crontabIsStaged || sched::isAnyTaskStaged();
 }
 
+sched::RunnerLines batchLines; // as they are to be, gathered from what is staged
+
+// The line of a task that cannot be read stays, which is right unless the batch has changed it.
 int describe(sched::Before &before) {
+    batchLines = {};
+    batchLines.openFailure = sched::kOpenFailed;
+    int unreadable = 0;
+    if (gatherLines(batchLines, unreadable) < 0) {
+        SCHED_LOG_AT(272, "get task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return -1;
+    }
+    if (unreadable > 0) {
+        SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    }
+    if (std::any_of(batchLines.unreadable.begin(), batchLines.unreadable.end(),
+                    sched::isTaskStaged)) {
+        return -1;
+    }
     return sched::isAnyTaskStaged() ? sched::describeStaged(before) : 0;
 }
 
@@ -194,13 +221,18 @@ int store() {
 // Unlike outside of a batch, a crontab that cannot be written is a failure.
 int apply() {
     sched::forgetStaged();
-    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false});
-    return synced.whole ? 0 : -1;
+    const int written =
+        sched::guarded(SCHED_SITE, [] { return sched::rewriteCrontab(batchLines); });
+    if (written != 0) {
+        SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    }
+    return written;
 }
 
 void forget() {
     sched::forgetStaged();
     crontabIsStaged = false;
+    batchLines = {};
 }
 
 // ---- New tasks ----
@@ -273,11 +305,7 @@ int tavischedule_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) {
                      LogText(szName).c_str());
         return -1;
     }
-    static const bool joined = [] {
-        sched::joinBatches({isTouched, describe, store, apply, forget});
-        return true;
-    }();
-    static_cast<void>(joined);
+    sched::joinBatches({isTouched, describe, store, apply, forget});
     // There is no owns_id: every look-up by id asks this backend.
     *pBackend = {.id = pBackend->id,
                  .name = szName,

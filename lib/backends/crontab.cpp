@@ -52,7 +52,7 @@ int failStep(base::Replacement::Step step) {
     case Step::Rename:
         return fail(sched::kRenameFailed, 240);
     default:
-        return fail(sched::kReadWriteFailed, __LINE__);
+        return fail(sched::kReadWriteFailed, 241);
     }
 }
 
@@ -112,7 +112,7 @@ void signalCron() {
 int sched::rewriteCrontab(const RunnerLines &lines) {
     const File old(std::fopen(kCrontab, "re"));
     if (!old) {
-        return -1;
+        return lines.openFailure == 0 ? -1 : fail(lines.openFailure, __LINE__);
     }
     struct stat status {};
     if (fstat(fileno(old.get()), &status) != 0) {
@@ -136,8 +136,14 @@ int sched::rewriteCrontab(const RunnerLines &lines) {
     // Write errors are found when the stream is flushed.
     crontab.write(endsOpen && !lines.text.empty() ? "\n" : "");
     crontab.write(lines.text);
-    if (!crontab.commit({.like = &status, .durable = true, .later = true})) {
+    if (!crontab.commit({.like = &status, .folderToo = false, .later = true})) {
         return failStep(crontab.failedStep());
+    }
+    // The new file is in place: without the flush a loss of power may bring the old one back, and
+    // the start of the machine writes it anew.
+    if (!base::syncFolderOf(kCrontab)) {
+        syslog(LOG_ERR, "%s:%d the folder of %s cannot be flushed: %m", "backends/crontab.cpp",
+               __LINE__, kCrontab);
     }
     signalCron();
     return 0;

@@ -10,6 +10,7 @@ namespace sched {
 struct RunnerLines {
     std::string text;                    // the lines of enabled tasks, each with its line feed
     std::vector<std::string> unreadable; // ids of tasks whose lines stay as they are
+    unsigned int openFailure = 0;        // the error of a crontab that cannot be opened, if any
 };
 
 // Replaces /etc/crontab atomically: lines that name the runner go but for those of unreadable

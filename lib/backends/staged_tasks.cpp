@@ -35,12 +35,12 @@ void StagedTasks::touch(const std::string &section) {
     }
 }
 
-void StagedTasks::store(const std::string &section, std::unique_ptr<Hash> form) {
+void StagedTasks::store(const std::string &section, int32_t id, std::unique_ptr<Hash> form) {
     touch(section);
     forms_[section] = std::move(form);
     if (ids) {
         ids->remove(section);
-        ids->add(section, idOfSection(section).value_or(0));
+        ids->add(section, id);
     }
 }
 

@@ -22,7 +22,7 @@ class StagedTasks {
     State stateOf(std::string_view section) const;
     // The section's stored form; nullptr unless it is Stored.
     PLATCSZHASH *find(std::string_view section) const;
-    void store(const std::string &section, std::unique_ptr<Hash> form);
+    void store(const std::string &section, int32_t id, std::unique_ptr<Hash> form);
     void remove(const std::string &section);
     // Every changed section, those that are new in the order in which they came.
     const std::vector<std::string> &order() const { return order_; }

@@ -30,6 +30,10 @@ using sched::LogText;
 
 constexpr int kCapacity = 1024;
 
+void setOwnError(unsigned int code, const sched::Site &site) {
+    PLATCErrSetEx(code, site.file, site.line);
+}
+
 sched::StagedTasks staged;
 
 // ---- Reading ----
@@ -72,8 +76,8 @@ bool isThere(const char *path, bool &unreadable) {
     const base::Found found = base::look(path, base::kSharedFileToRead);
     unreadable = found == base::Found::Unreadable;
     if (unreadable) {
-        SCHED_LOG("%s cannot be looked at: %m", path);
-        SCHED_SET_ERROR(sched::kOpenFailed);
+        SCHED_LOG_FOR(SCHED_OWN_SITE, "%s cannot be looked at: %m", path);
+        setOwnError(sched::kOpenFailed, SCHED_OWN_SITE);
     }
     return found != base::Found::Nothing && !unreadable;
 }
@@ -128,6 +132,7 @@ int pass(const sched::TaskPass &how) {
         }
         makeFresh(*task);
         if (!readTask(reading.path(), name.c_str(), hash, *task)) {
+            *task = {}; // what it has of this section is nobody's
             how.onUnreadable(name.c_str());
         } else if (!how.onTask(name.c_str(), how.fresh ? task.release() : task.get())) {
             return 0;
@@ -257,7 +262,7 @@ class Scratch {
         unlink(path());
         const bool claimed = sched::claimSharedFile(path()) == 0;
         if (!claimed) {
-            SCHED_SET_ERROR(sched::kOpenFailed);
+            setOwnError(sched::kOpenFailed, SCHED_OWN_SITE);
         }
         if (working) {
             return claimed ? copyWorking(*working) : logCopyFailure(kWorkingCopy, path(), 379);
@@ -276,8 +281,8 @@ class Scratch {
         auto content =
             opened.found == base::Found::Trusted ? base::readAll(opened.file.get()) : std::nullopt;
         if (!content) {
-            SCHED_SET_ERROR(sched::kReadWriteFailed);
-            SCHED_LOG("%s cannot be read: %m", path());
+            setOwnError(sched::kReadWriteFailed, SCHED_OWN_SITE);
+            SCHED_LOG_FOR(SCHED_OWN_SITE, "%s cannot be read: %m", path());
         }
         return content;
     }
@@ -342,11 +347,12 @@ bool readBefore(const char *path, const base::TrustRule &rule,
     if (opened.found == base::Found::Nothing || content) {
         return true;
     }
-    SCHED_SET_ERROR(sched::kOpenFailed);
+    setOwnError(sched::kOpenFailed, SCHED_OWN_SITE);
     if (opened.found == base::Found::Strange) {
-        SCHED_LOG("[%s] is refused: another user may have put it there or may write it", path);
+        SCHED_LOG_FOR(SCHED_OWN_SITE,
+                      "[%s] is refused: another user may have put it there or may write it", path);
     } else {
-        SCHED_LOG("[%s] cannot be read: %m", path);
+        SCHED_LOG_FOR(SCHED_OWN_SITE, "[%s] cannot be read: %m", path);
     }
     return false;
 }
@@ -356,12 +362,17 @@ bool readBefore(sched::Before::Tasks &before) {
            readBefore(kPersistent, kPersistentRule, before.persistent);
 }
 
+constexpr int kPutAsideSite = 416; // no other message of this source has it
+
 // Without a working copy, or with one that a failed copy left empty, a change starts from nothing
 // and would erase every task of the persistent file for good, so that file is put aside first. What
 // was put aside before moves on to the next free number.
 int savePersistent(const sched::Before::Tasks &before) {
     if ((before.working && !before.working->empty()) || !before.persistent ||
         before.persistent->empty()) {
+        return 0;
+    }
+    if (holds(sched::kPutAside, *before.persistent, true)) {
         return 0;
     }
     if (PLATCFileExist(sched::kPutAside)) {
@@ -371,13 +382,16 @@ int savePersistent(const sched::Before::Tasks &before) {
             std::snprintf(older.data(), older.size(), "%s.%d", sched::kPutAside, ++number);
         } while (PLATCFileExist(older.data()));
         if (rename(sched::kPutAside, older.data()) != 0) {
-            SCHED_SET_ERROR(sched::kRenameFailed);
-            return logCopyFailure(sched::kPutAside, older.data(), __LINE__);
+            setOwnError(sched::kRenameFailed, SCHED_OWN_SITE);
+            return logCopyFailure(sched::kPutAside, older.data(), kPutAsideSite);
         }
     }
-    return copyFile(kPersistent, sched::kPutAside, __LINE__) != 0
-               ? -1
-               : verify(kPersistent, sched::kPutAside, *before.persistent, true, __LINE__);
+    if (copyFile(kPersistent, sched::kPutAside, kPutAsideSite) == 0 &&
+        verify(kPersistent, sched::kPutAside, *before.persistent, true, kPutAsideSite) == 0) {
+        return 0;
+    }
+    unlink(sched::kPutAside);
+    return -1;
 }
 
 // A working copy that this process makes is made before cp opens it, so that cp follows no link
@@ -388,7 +402,7 @@ int publishWorking(const char *scratch, const std::string &content) {
         return logCopyFailure(scratch, kWorkingCopy, 424);
     }
     if (sched::claimSharedFile(kWorkingCopy) != 0) {
-        SCHED_SET_ERROR(sched::kOpenFailed);
+        setOwnError(sched::kOpenFailed, SCHED_OWN_SITE);
         return logCopyFailure(scratch, kWorkingCopy, 424);
     }
     if (copyFile(scratch, kWorkingCopy, 424) != 0 ||
@@ -423,17 +437,16 @@ int storeSection(const std::string &section, const TAVI_SCHED_TASK *task) {
     if (!readBefore(before.tasks.emplace())) {
         return -1;
     }
-    if ((task || before.tasks->working) && sched::Change::record(before) != 0) {
-        return -1;
-    }
     const Scratch scratch;
-    if ((task && savePersistent(*before.tasks) != 0) ||
-        scratch.prepare(before.tasks->working) != 0) {
+    if (scratch.prepare(before.tasks->working) != 0) {
         return -1;
     }
     const int changed = changeScratch(scratch, section, *before.tasks, task);
     if (changed <= 0) {
         return changed;
+    }
+    if (sched::Change::record(before) != 0 || (task && savePersistent(*before.tasks) != 0)) {
+        return -1;
     }
     return publish(scratch) == 0 ? 1 : -1;
 }
@@ -446,7 +459,7 @@ int stage(const std::string &section, const TAVI_SCHED_TASK *task) {
         if (!form) {
             return -1;
         }
-        staged.store(section, std::move(form));
+        staged.store(section, task->id, std::move(form));
         return 1;
     }
     if (staged.stateOf(section) == sched::StagedTasks::State::Untouched) {
@@ -488,8 +501,8 @@ int writeStaged(const char *path) {
     }
     if (PLATCFileEditSections(path, static_cast<int>(names.size()), names.data(), forms.data()) !=
         0) {
-        SCHED_LOG("Save %zu sections to [%s] failed. [0x%04X %s:%d]", names.size(), path,
-                  SCHED_LAST_ERROR);
+        SCHED_LOG_FOR(SCHED_OWN_SITE, "Save %zu sections to [%s] failed. [0x%04X %s:%d]",
+                      names.size(), path, SCHED_LAST_ERROR);
         return -1;
     }
     return 0;
@@ -509,40 +522,46 @@ SectionName sectionName(int32_t id) {
 
 int forEachStoredTask(const TaskPass &how) {
     return guarded(
-        SCHED_SITE, [&] { return pass(how); }, -1);
+        SCHED_OWN_SITE, [&] { return pass(how); }, -1);
 }
 
 int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
-    return guarded(SCHED_SITE, [&] { return lookUp(id, task); });
+    return guarded(SCHED_OWN_SITE, [&] { return lookUp(id, task); });
 }
 
 int nextFreeId(int32_t *id) {
-    return guarded(
-        SCHED_SITE,
-        [&] {
-            StagedTasks::Ids gathered;
-            if (!staged.ids) {
-                if (gatherIds(gathered) != 0) {
-                    return -1;
-                }
-                if (isBatchOpen()) {
-                    staged.ids = std::move(gathered);
-                }
+    try {
+        StagedTasks::Ids gathered;
+        if (!staged.ids) {
+            if (gatherIds(gathered) != 0) {
+                return -1;
             }
-            *id = smallestFreeId(staged.ids ? staged.ids->used : gathered.used);
-            return 0;
-        },
-        -1);
+            if (isBatchOpen()) {
+                staged.ids = std::move(gathered);
+            }
+        }
+        *id = smallestFreeId(staged.ids ? staged.ids->used : gathered.used);
+        return 0;
+    } catch (const std::exception &) {
+        setOwnError(kTaskOutOfMemory, SCHED_OWN_SITE);
+        SCHED_LOG_AT(321, "Alloc id slot failed. num:[%d] [0x%04X %s:%d]",
+                     static_cast<int>(staged.order().size()), SCHED_LAST_ERROR);
+        return -1;
+    }
 }
 
 int setTaskSection(int32_t id, const TAVI_SCHED_TASK *task) {
     return guarded(
-        SCHED_SITE,
+        SCHED_OWN_SITE,
         [&] {
             const std::string section = sectionName(id).data();
             return isBatchOpen() ? stage(section, task) : storeSection(section, task);
         },
         -1);
+}
+
+bool isTaskStaged(const std::string &section) {
+    return staged.find(section) != nullptr;
 }
 
 bool isAnyTaskStaged() {

@@ -5,8 +5,11 @@
 #include "sched_backend.h"
 #include "sched_guard.h"
 
+#include <algorithm>
+#include <array>
 #include <memory>
 #include <pthread.h>
+#include <span>
 #include <vector>
 
 namespace {
@@ -23,10 +26,15 @@ struct Batch {
 };
 
 std::unique_ptr<Batch> batch;
-std::vector<sched::BatchPart> parts;
+std::array<sched::BatchPart, TAVI_SCHED_MAX_BACKENDS> allParts;
+size_t partCount = 0;
+
+std::span<const sched::BatchPart> parts() {
+    return {allParts.data(), partCount};
+}
 
 void forgetStaged() {
-    for (const sched::BatchPart &part : parts) {
+    for (const sched::BatchPart &part : parts()) {
         part.forget();
     }
 }
@@ -61,7 +69,7 @@ void end(std::unique_ptr<Batch> ended, bool stored) {
 }
 
 int forEachTouched(int (*sched::BatchPart::*step)()) {
-    for (const sched::BatchPart &part : parts) {
+    for (const sched::BatchPart &part : parts()) {
         if (part.isTouched() && (part.*step)() != 0) {
             return -1;
         }
@@ -72,7 +80,7 @@ int forEachTouched(int (*sched::BatchPart::*step)()) {
 int storeAll() {
     sched::Before before;
     bool touched = false;
-    for (const sched::BatchPart &part : parts) {
+    for (const sched::BatchPart &part : parts()) {
         if (part.isTouched()) {
             touched = true;
             if (part.describe(before) != 0) {
@@ -90,18 +98,39 @@ int storeAll() {
     return 0;
 }
 
+// A program that ends without having ended its batch has not stored it.
+void dropOpenBatch() {
+    if (batch) {
+        end(close(), false);
+    }
+}
+
 } // namespace
 
 void sched::joinBatches(const BatchPart &part) {
-    parts.push_back(part);
+    const auto joined = parts();
+    const bool isNew = std::none_of(joined.begin(), joined.end(), [&](const BatchPart &other) {
+        return other.store == part.store;
+    });
+    if (isNew && partCount < allParts.size()) {
+        allParts[partCount++] = part;
+    }
 }
 
 bool sched::isBatchOpen() {
     return batch != nullptr;
 }
 
-void sched::deferHook(ChangeHook hook, int result) {
-    batch->hooks.push_back({std::move(hook), result});
+void sched::deferHook(ChangeHook &hook, int result) {
+    const int deferred = guarded(SCHED_SITE, [&] {
+        batch->hooks.reserve(batch->hooks.size() + 1);
+        return 0;
+    });
+    if (deferred == 0) {
+        batch->hooks.push_back({std::move(hook), result});
+    } else {
+        hook.after(-1);
+    }
 }
 
 void sched::whenStored(std::function<void()> consequence) {
@@ -125,7 +154,8 @@ int TAVISchedChangeBegin() {
             if (!begun->change) {
                 return -1;
             }
-            static const int registered = pthread_atfork(nullptr, nullptr, leaveInChild);
+            static const int registered =
+                pthread_atfork(nullptr, nullptr, leaveInChild) + std::atexit(dropOpenBatch);
             static_cast<void>(registered);
             batch = std::move(begun);
             return 0;

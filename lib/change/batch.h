@@ -18,7 +18,7 @@ struct BatchPart {
     void (*forget)();                // drops what was staged
 };
 
-// To be called once by each backend.
+// Each backend takes part; once is enough.
 void joinBatches(const BatchPart &part);
 
 // A batch of this process goes on.
@@ -26,7 +26,7 @@ bool isBatchOpen();
 
 // Keeps a hook until the batch ends: its POST phase runs then, with the result of its operation, or
 // with -1 when the batch is rolled back.
-void deferHook(ChangeHook hook, int result);
+void deferHook(ChangeHook &hook, int result);
 
 // What follows from a change that is stored: done at once, or when the batch has been stored.
 void whenStored(std::function<void()> consequence);

@@ -14,7 +14,9 @@
 
 namespace {
 
-bool recorded = false; // by the change of this process that goes on
+bool recorded = false;  // by the change of this process that goes on
+int openChanges = 0;    // one within another
+bool takesBack = false; // what a cut-off change left, just now
 
 // Backends bring the crontab in line with what their tasks are now. What fails is logged, and the
 // next change or sync tries again.
@@ -96,23 +98,29 @@ int sched::takeBackCutOffChange() {
         SCHED_SET_ERROR(kOpenFailed);
         return -1;
     }
-    return guarded(
-        SCHED_SITE,
-        [&] { return state == RecordState::Present ? takeBackRecorded() : finishUnrecorded(); },
-        -1);
+    takesBack = true;
+    const int result = guarded(SCHED_SITE, [&] {
+        return state == RecordState::Present ? takeBackRecorded() : finishUnrecorded();
+    });
+    takesBack = false;
+    return result;
 }
 
 sched::Change::Change() {
     if (!lock_) {
         return;
     }
-    isOutermost_ = lock_.isOutermost();
+    isOutermost_ = openChanges++ == 0 && !takesBack;
     ready_ = !isOutermost_ || takeBackCutOffChange() == 0;
     recorded = recorded && !isOutermost_;
 }
 
 // The tasks alone: before the end nothing else has changed.
 sched::Change::~Change() {
+    if (!lock_) {
+        return;
+    }
+    --openChanges;
     if (isOutermost_ && recorded) {
         recorded = false;
         takeBackOwn(false);
@@ -149,14 +157,6 @@ int sched::Change::finish() {
     return 0;
 }
 
-int sched::Change::discard() {
-    if (isOutermost_ && recorded) {
-        recorded = false;
-        return removeRecord();
-    }
-    return 0;
-}
-
 // ---- Reading ----
 
 sched::Reading::Reading() : path_(kWorkingCopy) {
@@ -165,10 +165,11 @@ sched::Reading::Reading() : path_(kWorkingCopy) {
     }
 }
 
-// No change goes on, and none was cut off.
+// None was cut off: a change that goes on waits with overwriting it.
 bool sched::Reading::isWhole() {
-    return recordState() != RecordState::Present && !ReadingLock::isUnfinished() &&
-           !ChangeLock::isMarked();
+    return !ReadingLock::isUnfinished() &&
+           ((recordState() != RecordState::Present && !ChangeLock::isMarked()) ||
+            changeLockHolder() != 0);
 }
 
 // While this process has the lock of reading, a working copy that is finished stays whole, and one

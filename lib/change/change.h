@@ -25,8 +25,6 @@ class Change {
     static int record(const Before &before);
     // Everything is stored. 0, or -1 when that cannot be made durable, and then it is taken back.
     int finish();
-    // Nothing was overwritten after all.
-    int discard();
     // Takes back what was recorded, the crontab too.
     void rollBack();
 

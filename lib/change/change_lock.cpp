@@ -2,9 +2,12 @@
 #include "change_lock.h"
 #include "sched_error.h"
 #include "sched_paths.h"
+#include "tavischeduler.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
@@ -21,9 +24,12 @@ namespace {
 // Of a fixed width: one in another's place leaves nothing of it.
 constexpr const char *kHolderFormat = "%10d %20lld.%09ld\n";
 
-constexpr long kPatience = 30;        // seconds
-constexpr long kPause = 5'000'000;    // nanoseconds
-constexpr long kShortPause = 200'000; // nanoseconds
+constexpr long kPatience = 30;             // seconds
+constexpr long kPause = 1'000'000;         // nanoseconds, at first
+constexpr long kLongestPause = 16'000'000; // when many wait, each of them looks less often
+constexpr long kShortPause = 200'000;
+
+volatile std::sig_atomic_t waitedFor = 0; // a process
 
 base::Descriptor openLockFile(const char *path) {
     return base::Descriptor(open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600));
@@ -52,8 +58,8 @@ int failToOpen(const char *path) {
     return -1;
 }
 
-// Tries until it works or patience ends.
-template <typename Try> bool retry(long pause, Try &&tryOnce) {
+// Tries until it works or patience ends, with longer and longer pauses.
+template <typename Try> bool retry(long pause, long longest, Try &&tryOnce) {
     timespec start{};
     clock_gettime(CLOCK_MONOTONIC, &start);
     for (;;) {
@@ -67,6 +73,7 @@ template <typename Try> bool retry(long pause, Try &&tryOnce) {
         }
         const timespec length{.tv_sec = 0, .tv_nsec = pause};
         nanosleep(&length, nullptr);
+        pause = std::min(2 * pause, longest);
     }
 }
 
@@ -79,10 +86,19 @@ struct HeldLock {
 };
 HeldLock held;
 
+// What this process reads: a function that is handed a task may read, and change, tasks itself.
+struct OwnReading {
+    base::Descriptor file;
+    int depth = 0;
+};
+OwnReading own;
+
 // A child does not hold what its parent holds, and must not keep it either.
 void forgetInChild() {
     held.file.close();
     held.depth = 0;
+    own.file.close();
+    own.depth = 0;
 }
 
 void forgetInChildren() {
@@ -145,10 +161,20 @@ bool isBelow(pid_t holder) {
     return holder > 1 && ancestor == holder;
 }
 
+// The lock of the last call is somebody else's; otherwise there can be none on this file system,
+// and everything goes on without it.
+bool isContended() {
+    return errno == EWOULDBLOCK || errno == EACCES || errno == EINTR;
+}
+
+bool lockChanges(int fd) {
+    return flock(fd, LOCK_EX | LOCK_NB) == 0 || !isContended();
+}
+
 enum class Outcome { Held, Busy, Below };
 
 Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
-    if (flock(fd, LOCK_EX | LOCK_NB) == 0) {
+    if (lockChanges(fd)) {
         return Outcome::Held;
     }
     if (wait == sched::ChangeLock::Wait::No) {
@@ -156,17 +182,90 @@ Outcome acquire(int fd, sched::ChangeLock::Wait wait) {
     }
     bool below = false;
     pid_t known = 0;
-    const bool locked = retry(kPause, [&] {
+    const bool locked = retry(kPause, kLongestPause, [&] {
         const pid_t holder = writtenProcess(fd);
+        waitedFor = holder;
         below = holder != std::exchange(known, holder) && isBelow(holder);
-        return below || flock(fd, LOCK_EX | LOCK_NB) == 0;
+        return below || lockChanges(fd);
     });
+    waitedFor = below || !locked ? waitedFor : 0;
     return below ? Outcome::Below : locked ? Outcome::Held : Outcome::Busy;
 }
+
+// Two bytes of one file: readers pass the gate one by one and then share the room; a writer keeps
+// the gate shut while it waits for those inside.
+enum Place : off_t { Gate, Room };
+
+struct flock lockOf(Place place, short type) {
+    struct flock lock {};
+    lock.l_type = type;
+    lock.l_whence = SEEK_SET;
+    lock.l_start = place;
+    lock.l_len = 1;
+    return lock;
+}
+
+bool setLock(int fd, Place place, short type) {
+    struct flock lock = lockOf(place, type);
+    return fcntl(fd, F_OFD_SETLK, &lock) == 0 || !isContended();
+}
+
+bool isGateOpen(int fd) {
+    struct flock lock = lockOf(Gate, F_RDLCK);
+    return fcntl(fd, F_OFD_GETLK, &lock) != 0 || lock.l_type == F_UNLCK;
+}
+
+// Tries until it works, and notes for which process it waits.
+template <typename Try> bool waitToEnter(Try &&tryOnce) {
+    waitedFor = 0;
+    const bool entered = retry(kShortPause, kShortPause, [&] {
+        if (tryOnce()) {
+            return true;
+        }
+        if (waitedFor == 0) {
+            const base::Descriptor changes(
+                open(sched::kChangeLock, O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+            waitedFor = writtenProcess(changes.get());
+        }
+        return false;
+    });
+    waitedFor = 0;
+    return entered;
+}
+
+bool enterToRead(int fd) {
+    return waitToEnter([&] { return isGateOpen(fd) && setLock(fd, Room, F_RDLCK); });
+}
+
+bool enterToWrite(int fd) {
+    return waitToEnter([&] { return setLock(fd, Gate, F_WRLCK); }) &&
+           waitToEnter([&] { return setLock(fd, Room, F_WRLCK); });
+}
+
+// While this process waits for others' changes it reads nothing: they may wait for its readers.
+class PausedReading {
+  public:
+    explicit PausedReading(bool waits) : isPaused_(waits && own.file) {
+        if (isPaused_) {
+            setLock(own.file.get(), Room, F_UNLCK);
+        }
+    }
+    ~PausedReading() {
+        if (isPaused_) {
+            enterToRead(own.file.get());
+        }
+    }
+    PausedReading(const PausedReading &) = delete;
+    PausedReading &operator=(const PausedReading &) = delete;
+
+  private:
+    bool isPaused_;
+};
 
 } // namespace
 
 sched::ChangeLock::ChangeLock(Wait wait) {
+    waitedFor = 0;
     if (held.depth > 0) {
         ++held.depth;
         held_ = true;
@@ -174,9 +273,12 @@ sched::ChangeLock::ChangeLock(Wait wait) {
     }
     base::Descriptor file = openLockFile(kChangeLock);
     if (!file && !isWithoutPlace(errno)) {
-        failToOpen(kChangeLock);
+        if (wait == Wait::HalfAMinute) {
+            failToOpen(kChangeLock);
+        }
         return;
     }
+    const PausedReading paused(wait == Wait::HalfAMinute);
     const Outcome outcome = file ? acquire(file.get(), wait) : Outcome::Held;
     if (outcome != Outcome::Held) {
         if (wait == Wait::HalfAMinute) {
@@ -253,38 +355,15 @@ pid_t sched::changeLockHolder() {
 
 // ---- Reading and writing ----
 
-// Two bytes of one file: readers pass the gate one by one and then share the room; a writer keeps
-// the gate shut while it waits for those inside.
+// Two bytes of one file: readers share the room, and a writer that waits for it shuts the gate, at
+// which readers look before they enter. So a writer waits only for those who are inside.
 namespace {
-
-enum Place : off_t { Gate, Room };
-
-bool setLock(int fd, Place place, short type) {
-    struct flock lock {};
-    lock.l_type = type;
-    lock.l_whence = SEEK_SET;
-    lock.l_start = place;
-    lock.l_len = 1;
-    return fcntl(fd, F_OFD_SETLK, &lock) == 0;
-}
-
-bool enter(int fd, short type) {
-    return retry(kShortPause, [&] { return setLock(fd, Gate, type); }) &&
-           retry(kShortPause, [&] { return setLock(fd, Room, type); });
-}
 
 bool failToEnter(const char *what) {
     SCHED_SET_ERROR(sched::kLockFailed);
     SCHED_LOG("%s has been %s for half a minute", sched::kWorkingCopy, what);
     return false;
 }
-
-// What this process reads: a function that is handed a task may read, and change, tasks itself.
-struct OwnReading {
-    base::Descriptor file;
-    int depth = 0;
-};
-OwnReading own;
 
 } // namespace
 
@@ -302,16 +381,17 @@ sched::ReadingLock::ReadingLock() {
 }
 
 sched::ReadingLock::~ReadingLock() {
-    if (--own.depth == 0) {
-        own.file.close();
+    if (own.depth == 0 || --own.depth > 0) { // none in a child
+        return;
     }
+    if (own.file) {
+        setLock(own.file.get(), Room, F_UNLCK); // a child may have the same open file
+    }
+    own.file.close();
 }
 
 void sched::ReadingLock::acquire() {
-    held_ = !own.file || enter(own.file.get(), F_RDLCK) || failToEnter("overwritten");
-    if (own.file) {
-        setLock(own.file.get(), Gate, F_UNLCK);
-    }
+    held_ = !own.file || enterToRead(own.file.get()) || failToEnter("overwritten");
 }
 
 void sched::ReadingLock::release() {
@@ -331,7 +411,7 @@ bool sched::ReadingLock::isUnfinished() {
 }
 
 bool sched::ReadingLock::waitUntil(const std::function<bool()> &tryOnce) {
-    return retry(kShortPause, tryOnce);
+    return retry(kShortPause, kShortPause, tryOnce);
 }
 
 sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
@@ -342,7 +422,7 @@ sched::WritingLock::WritingLock() : file_(openLockFile(kReadingLock)) {
     if (own.file) {
         setLock(own.file.get(), Room, F_UNLCK);
     }
-    held_ = (enter(file_.get(), F_WRLCK) || failToEnter("read")) &&
+    held_ = (enterToWrite(file_.get()) || failToEnter("read")) &&
             (ftruncate(file_.get(), 1) == 0 || failToOpen(kReadingLock) == 0);
     if (held_) {
         fcntl(file_.get(), F_SETFD, 0); // a program that overwrites tasks keeps readers away
@@ -365,4 +445,8 @@ void sched::tellWorkingCopyIsWhole() {
     if (file && fstat(file.get(), &status) == 0 && status.st_size > 0) {
         (void)!ftruncate(file.get(), 0);
     }
+}
+
+int32_t TAVISchedWaitedFor() {
+    return waitedFor;
 }

@@ -99,9 +99,12 @@ std::string textOf(const Before &before) {
 // Owner and mode are those of the file whose place it may take.
 bool writeDurably(const char *path, std::string_view content) {
     base::Descriptor file(open(path, O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0600));
+    if (!file) {
+        return false;
+    }
     struct stat like {};
     const bool hasLike = stat(kPersistent, &like) == 0;
-    return file && base::writeAll(file.get(), content) &&
+    return base::writeAll(file.get(), content) &&
            (!hasLike || (fchown(file.get(), like.st_uid, like.st_gid) == 0 &&
                          fchmod(file.get(), like.st_mode & ALLPERMS) == 0)) &&
            fsync(file.get()) == 0 && file.close();
@@ -225,9 +228,10 @@ Record parseRecord(const std::string &text) {
     } else if (persistent == static_cast<int>(Persistent::Other)) {
         // It has taken its place already when a restoration was cut off.
         before.persistent = readTrusted(kRecordPersistent, found);
-        if (!before.persistent) {
+        if (found == base::Found::Nothing) {
             before.persistent = readTrusted(kPersistent, found);
         }
+        record.isReadable = before.persistent.has_value();
     }
     return record;
 }
@@ -309,6 +313,10 @@ std::optional<Record> readRecord() {
     }
     Record record = parseRecord(*text);
     record.isInPlace = isInPlace;
+    if (!record.isReadable) {
+        fail(kOpenFailed, "cannot be read", kRecordPersistent);
+        return std::nullopt;
+    }
     return record;
 }
 

@@ -45,6 +45,7 @@ struct Record {
     pid_t process = 0;      // whose change it is
     size_t size = 0;        // of the working copy in it
     bool isWhole = true;    // else nothing was overwritten yet
+    bool isReadable = true; // else what lies beside it is not
     bool isInPlace = false; // all but the persistent file is restored already
 };
 // Nothing when it cannot be read, which is logged.

@@ -37,25 +37,37 @@ bool isScratchOfTheDead(std::string_view path) {
     return parsed.ec == std::errc() && process > 0 && PLATCProcAlive(process) == 0;
 }
 
+// Made by the change that was cut off, and not by somebody who named a copy so: soon after its
+// beginning. Without one nothing is.
 bool isTemporaryCrontab(const fs::path &path, const timespec &since) {
+    constexpr time_t kLongestChange = 120; // seconds
     const std::string stem = std::string(sched::kCrontab) + ".";
     struct stat status {};
     return path.native().starts_with(stem) &&
            path.native().size() == stem.size() + kRandomCharacters &&
            lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode) &&
-           status.st_uid == geteuid() &&
+           status.st_uid == geteuid() && since.tv_sec > 0 &&
+           status.st_ctim.tv_sec <= since.tv_sec + kLongestChange &&
            std::tie(status.st_mtim.tv_sec, status.st_mtim.tv_nsec) >=
                std::tie(since.tv_sec, since.tv_nsec);
 }
 
 } // namespace
 
-void sched::removeLeftovers(const timespec &since) {
-    forEachEntry("/tmp", [](const fs::path &path) {
+std::vector<std::string> sched::findScratchFiles() {
+    std::vector<std::string> paths;
+    forEachEntry("/tmp", [&](const fs::path &path) {
         if (isScratchOfTheDead(path.native())) {
-            unlink(path.c_str());
+            paths.push_back(path.native());
         }
     });
+    return paths;
+}
+
+void sched::removeLeftovers(const timespec &since) {
+    for (const std::string &path : findScratchFiles()) {
+        unlink(path.c_str());
+    }
     base::removeLeftovers(kWorkingCopy);
     base::removeLeftovers(kRunner);
     base::removeLeftovers(kCrontab);

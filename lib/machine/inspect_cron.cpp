@@ -15,6 +15,8 @@
 #include <cstring>
 #include <fcntl.h>
 #include <fstream>
+#include <iterator>
+#include <set>
 #include <sys/stat.h>
 
 namespace sched {
@@ -38,8 +40,8 @@ Crontab readCrontab() {
     return crontab;
 }
 
-// cron holds a lock on the file with its process id for as long as it runs; another process can have
-// come by the same id.
+// cron holds a lock on the file with its process id for as long as it runs; another process can
+// have come by the same id.
 bool isCronRunning() {
     pid_t pid = 0;
     std::string name;
@@ -59,9 +61,12 @@ bool expectedLines(std::vector<std::string> &lines) {
            }}) == 0;
 }
 
-bool isRejected(const std::string &line) {
+// "" for a line that cron takes.
+std::string whyRejected(const std::string &line) {
     std::array<char, 512> reason{};
-    return TAVISchedCrontabLineCheck(line.c_str(), nullptr, reason.data(), reason.size()) == 1;
+    const bool isRejected =
+        TAVISchedCrontabLineCheck(line.c_str(), nullptr, reason.data(), reason.size()) == 1;
+    return isRejected ? reason.data() : "";
 }
 
 // Whether its power-off lines are those of the enabled power-off schedules.
@@ -79,8 +84,8 @@ bool arePowerOffLinesRight(const Crontab &crontab) {
     };
     Times asked;
     for (const TAVI_SCHED_TASK *task = tasks.head(); task; task = task->next) {
-        if (task->state == TAVI_SCHED_STATE_ENABLED && std::strcmp(task->appArgs, "poweroff") == 0 &&
-            std::strchr(task->week, '1')) {
+        if (task->state == TAVI_SCHED_STATE_ENABLED &&
+            std::strcmp(task->appArgs, "poweroff") == 0 && std::strchr(task->week, '1')) {
             asked.push_back(timesOf(CronLine(*task).c_str()));
         }
     }
@@ -95,70 +100,15 @@ bool arePowerOffLinesRight(const Crontab &crontab) {
     return asked == present;
 }
 
-bool synchronise() {
-    return TAVISchedTaskSync() == 0;
-}
-
-} // namespace
-
-void inspectCron(Inspection &inspection) {
-    if (!isCronRunning()) {
-        inspection.add({"cron is not running, so that no task runs",
-                        "start it: systemctl enable --now cron"});
-    }
-}
-
-void inspectCrontabFile(Inspection &inspection) {
-    const Crontab crontab = readCrontab();
-    if (!crontab.isReadable) {
-        inspection.canReadTasks = false;
-        inspection.add({std::string(kCrontab) + " cannot be read",
-                        "make it; an empty file is enough"});
-        return;
-    }
-    base::TrustRule rule = base::kRootsFile;
-    rule.oneName = true;
-    if (base::look(kCrontab, rule) != base::Found::Trusted) {
-        inspection.add({"cron ignores " + std::string(kCrontab) +
-                            ", which must be a file of root's with one name, and writable by "
-                            "nobody else",
-                        std::string("look who changed it; then chown root ") + kCrontab +
-                            " and chmod go-w " + kCrontab});
-    }
-    for (size_t i = 0; i < crontab.lines.size(); ++i) {
-        std::array<char, 512> reason{};
-        if (crontab.lines[i].find(kRunner) == std::string::npos &&
-            TAVISchedCrontabLineCheck(crontab.lines[i].c_str(), nullptr, reason.data(),
-                                      reason.size()) == 1) {
-            inspection.add({"cron ignores all of " + std::string(kCrontab) + " for its line " +
-                                std::to_string(i + 1) + ": " + reason.data(),
-                            "mend the line by hand"});
-        }
-    }
-    if (!crontab.endsWithLineFeed) {
-        inspection.add({"cron ignores all of " + std::string(kCrontab) +
-                            ", as its last line has no line feed",
-                        "add one at the end of the file"});
-    }
-}
-
-// Lines are only taken out when it is clear what the tasks are: both files say the same, and every
-// section can be read. Lines that cron would reject are for a person to mend.
-void inspectLines(Inspection &inspection) {
-    std::vector<std::string> asked;
-    if (!inspection.canReadTasks || !expectedLines(asked)) {
-        return;
-    }
-    const Crontab crontab = readCrontab();
-    std::vector<std::string> surplus;
-    std::copy_if(crontab.lines.begin(), crontab.lines.end(), std::back_inserter(surplus),
+// What the crontab lacks and has too much, each for behind its name.
+std::vector<std::string> compareLines(const Crontab &crontab, const std::vector<std::string> &asked,
+                                      const Inspection &inspection) {
+    std::multiset<std::string> surplus;
+    std::copy_if(crontab.lines.begin(), crontab.lines.end(), std::inserter(surplus, surplus.end()),
                  [](const std::string &line) { return line.find(kRunner) != std::string::npos; });
-    const bool isClear = inspection.areCopiesSame && inspection.areSectionsGood &&
-                         inspection.canReadPower &&
-                         std::none_of(asked.begin(), asked.end(), isRejected);
     std::vector<std::string> differences;
     for (const std::string &line : asked) {
-        const auto found = std::find(surplus.begin(), surplus.end(), line);
+        const auto found = surplus.find(line);
         if (found == surplus.end()) {
             differences.push_back("lacks a task's line: " + line);
         } else {
@@ -171,15 +121,91 @@ void inspectLines(Inspection &inspection) {
     if (inspection.canReadPower && !arePowerOffLinesRight(crontab)) {
         differences.emplace_back("has other power-off lines than the power-off schedules ask for");
     }
-    // The lines may be the last trace of tasks whose files are gone.
-    const bool isLastTrace = asked.empty() && !surplus.empty();
-    for (const std::string &difference : differences) {
-        inspection.add({std::string(kCrontab) + " " + difference,
-                        isLastTrace ? "look where the tasks have gone; tavisched sync takes such "
-                                      "lines out"
-                                    : "tavisched sync",
-                        isClear && !isLastTrace ? synchronise : std::function<bool()>()});
+    return differences;
+}
+
+bool synchronise() {
+    return TAVISchedTaskSync() == 0;
+}
+
+} // namespace
+
+void inspectCron(Inspection &inspection) {
+    if (!isCronRunning()) {
+        inspection.add("cron is not running, so that no task runs",
+                       "start it: systemctl enable --now cron");
     }
+}
+
+void inspectCrontabFile(Inspection &inspection) {
+    const Crontab crontab = readCrontab();
+    const std::string all = "cron ignores all of " + std::string(kCrontab);
+    if (!crontab.isReadable) {
+        inspection.canReadTasks = false;
+        inspection.add(std::string(kCrontab) + " cannot be read",
+                       "make it; an empty file is enough");
+        return;
+    }
+    base::TrustRule rule = base::kRootsFile;
+    rule.oneName = true;
+    if (base::look(kCrontab, rule) != base::Found::Trusted) {
+        inspection.add("cron ignores " + std::string(kCrontab) +
+                           ", which must be a file of root's with one name, and writable by "
+                           "nobody else",
+                       std::string("look who changed it; then chown root ") + kCrontab +
+                           " and chmod go-w " + kCrontab);
+    }
+    for (size_t i = 0; i < crontab.lines.size(); ++i) {
+        const bool isTasks = crontab.lines[i].find(kRunner) != std::string::npos;
+        const std::string why =
+            isTasks && inspection.looksAtTasks ? "" : whyRejected(crontab.lines[i]);
+        if (!why.empty()) {
+            inspection.add(all + " for its line " + std::to_string(i + 1) + ": " + why,
+                           isTasks ? "mend the schedule of the line's task with tavisched edit"
+                                   : "mend the line by hand");
+        }
+    }
+    if (!crontab.endsWithLineFeed) {
+        inspection.add(all + ", as its last line has no line feed",
+                       "add one at the end of the file");
+    }
+}
+
+// Lines are only taken out when it is clear what the tasks are: both files say the same, every
+// section can be read, and there are tasks at all, as the lines may be the last trace of tasks
+// whose files are gone. Lines that cron would reject are for a person to mend.
+void inspectLines(Inspection &inspection) {
+    std::vector<std::string> asked;
+    if (!inspection.canReadTasks || !expectedLines(asked)) {
+        return;
+    }
+    const Crontab crontab = readCrontab();
+    const std::vector<std::string> differences = compareLines(crontab, asked, inspection);
+    if (differences.empty()) {
+        return;
+    }
+    const bool hasLines =
+        std::any_of(crontab.lines.begin(), crontab.lines.end(), [](const std::string &line) {
+            return line.find(kRunner) != std::string::npos;
+        });
+    const bool isLastTrace = asked.empty() && hasLines;
+    const bool isClear = inspection.isSettled && inspection.areCopiesSame &&
+                         inspection.areSectionsGood && inspection.canReadPower && !isLastTrace &&
+                         std::all_of(asked.begin(), asked.end(), [](const std::string &line) {
+                             return whyRejected(line).empty();
+                         });
+    Finding finding{.what = std::string(kCrontab) + " " + differences.front(),
+                    .advice = isLastTrace ? "look where the tasks have gone; tavisched sync takes "
+                                            "such lines out"
+                                          : "tavisched sync"};
+    if (differences.size() > 1) {
+        finding.what += " (and " + std::to_string(differences.size() - 1) + " more differences)";
+    }
+    if (isClear) {
+        finding.repair = synchronise;
+        finding.repaired = "the lines were written anew";
+    }
+    inspection.add(std::move(finding));
 }
 
 } // namespace sched

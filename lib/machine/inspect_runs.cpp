@@ -30,11 +30,11 @@ bool isDatabaseReadable() {
 // A full file system is no reason to give the results of earlier runs up.
 void inspectStatusDatabase(Inspection &inspection) {
     if (inspection.hasRoom && !isDatabaseReadable()) {
-        inspection.add({std::string("no task runs without its status database ") +
-                            kStatusDatabase + ", which cannot be read",
+        inspection.add({std::string("no task runs without its status database ") + kStatusDatabase +
+                            ", which cannot be read",
                         std::string("remove ") + kStatusDatabase +
                             ", which the next run makes anew; how earlier runs ended is lost",
-                        [] { return unlink(kStatusDatabase) == 0; }});
+                        [] { return unlink(kStatusDatabase) == 0; }, "it was removed"});
     }
 }
 
@@ -43,9 +43,9 @@ void inspectPlugins(Inspection &inspection) {
     const int count =
         PLATPluginCheck && faults ? PLATPluginCheck("task_scheduler", faults.address()) : 0;
     for (int i = 0; i < count; ++i) {
-        inspection.add({PLATCSzListGet(faults.get(), i),
-                        "handlers and their folder must be root's, executable, and writable by "
-                        "nobody else"});
+        inspection.add(PLATCSzListGet(faults.get(), i),
+                       "handlers and their folder must be root's, executable, and writable by "
+                       "nobody else");
     }
 }
 

@@ -1,6 +1,7 @@
 // The sections of the working copy, and the tasks that they are.
 #include "backends/task_file.h"
 #include "change/change.h"
+#include "cron/cron_line.h"
 #include "finding.h"
 #include "platc.h"
 #include "sched_handle.h"
@@ -9,7 +10,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstring>
 
 #pragma weak PLATCFileCheckSections // an appliance's own platform may lack it
 
@@ -25,52 +25,50 @@ void inspectHeaders(const char *path, Inspection &inspection) {
     const int count =
         PLATCFileCheckSections && faults ? PLATCFileCheckSections(path, faults.address()) : 0;
     for (int i = 0; i < count; ++i) {
-        inspection.add({std::string(kWorkingCopy) + ": " + PLATCSzListGet(faults.get(), i),
-                        kByHand});
+        inspection.add(std::string(kWorkingCopy) + ": " + PLATCSzListGet(faults.get(), i), kByHand);
     }
 }
 
-std::string describe(const TAVI_SCHED_FAULT &fault) {
-    return fault.key[0] == '\0' ? fault.reason
-                                : "\"" + std::string(fault.key) + "\": " + fault.reason;
-}
-
-// What is wrong with a stored form, in words; "" for nothing.
-std::string faultsOf(PLATCSZHASH *form, bool &readable) {
+// What is wrong with a stored form, for behind the section's name; "" for nothing. Keys that no
+// task has are passed over by readers.
+std::string faultsOf(PLATCSZHASH *form) {
     std::array<TAVI_SCHED_FAULT, kMostFaults> faults{};
     const int count = TAVISchedHashCheck(form, faults.data(), faults.size());
-    std::string text;
+    bool isReadable = true;
+    std::string words;
     for (size_t i = 0; i < std::min<size_t>(faults.size(), static_cast<size_t>(std::max(count, 0)));
          ++i) {
-        readable = readable && (faults[i].kind == TAVI_SCHED_FAULT_VALUE ||
-                                faults[i].kind == TAVI_SCHED_FAULT_UNKNOWN_KEY);
-        text += (text.empty() ? "" : "; ") + describe(faults[i]);
+        const TAVI_SCHED_FAULT &fault = faults[i];
+        if (fault.kind == TAVI_SCHED_FAULT_UNKNOWN_KEY) {
+            continue;
+        }
+        const bool isMissing = fault.kind == TAVI_SCHED_FAULT_MISSING;
+        isReadable = isReadable && fault.kind == TAVI_SCHED_FAULT_VALUE;
+        words += (words.empty() ? "\"" : "; \"") + std::string(fault.key) +
+                 (isMissing ? "\" is missing" : "\": " + std::string(fault.reason));
     }
-    return text;
+    return words.empty()
+               ? ""
+               : (isReadable ? "is not read as it is written: " : "is no task that can be read: ") +
+                     words;
 }
 
 void inspectSection(const char *path, const std::string &name, Inspection &inspection) {
     const std::string section = "the section [" + name + "] of " + kWorkingCopy;
     Hash form(64);
     if (!form || PLATCFileGetSection(path, name.c_str(), form.address()) <= 0) {
-        inspection.add({section + " cannot be read", kByHand});
+        inspection.add(section + " cannot be read", kByHand);
         return;
     }
-    bool readable = true;
-    const std::string faults = faultsOf(form.get(), readable);
+    const std::string faults = faultsOf(form.get());
     const char *const id = PLATCSzHashGetValue(form.get(), "id");
     if (!faults.empty()) {
-        inspection.add({section +
-                            (readable ? " is not read as it is written: "
-                                      : " is no task that can be read: ") +
-                            faults,
-                        std::string(kByHand) + ", or remove it there"});
+        inspection.add(section + " " + faults, std::string(kByHand) + ", or remove it there");
     } else if (name != (id ? id : "")) {
-        inspection.add({section + " says that its task has the id " + (id ? id : ""),
-                        "give both the same number in both task files"});
+        inspection.add(section + " says that its task has the id " + (id ? id : ""),
+                       "give both the same number in both task files");
     } else if (name.starts_with('-') || name == "0") {
-        inspection.add({section + " has a number below 1",
-                        "give it another one in both task files"});
+        inspection.add(section + " has a number below 1", "give it another one in both task files");
     }
 }
 
@@ -94,20 +92,35 @@ std::string called(const TAVI_SCHED_TASK &task) {
     return task.name[0] == '\0' ? number : number + " (" + task.name + ")";
 }
 
+// Why cron rejects the line that an enabled task has; "" for nothing.
+std::string whyLineIsRejected(const TAVI_SCHED_TASK &task) {
+    std::array<char, 512> reason{};
+    return task.state == TAVI_SCHED_STATE_ENABLED &&
+                   TAVISchedCrontabLineCheck(CronLine(task).c_str(), nullptr, reason.data(),
+                                             reason.size()) == 1
+               ? reason.data()
+               : "";
+}
+
 void inspectTask(const TAVI_SCHED_TASK &task, Inspection &inspection) {
     const std::string id = std::to_string(task.id);
     TAVI_SCHED_FAULT fault{};
-    if (TAVISchedTaskCheck(&task, &fault) == 1) {
-        const bool isLine = fault.key[0] == '\0';
-        inspection.add({called(task) + ": " +
-                            (isLine ? std::string("its line")
-                                    : "its \"" + std::string(fault.key) + "\"") +
-                            " is wrong: " + fault.reason,
-                        "mend it with tavisched edit " + id + ", or where the task was made"});
+    if (const std::string why = whyLineIsRejected(task); !why.empty()) {
+        inspection.add("cron ignores all of " + std::string(kCrontab) + " for the line of " +
+                           called(task) + ": " + why,
+                       "mend its schedule with tavisched edit " + id + ", or tavisched disable " +
+                           id);
+    } else if (TAVISchedTaskCheck(&task, &fault) == 1) {
+        inspection.add(called(task) +
+                           (fault.key[0] == '\0'
+                                ? std::string(": ")
+                                : ": its \"" + std::string(fault.key) + "\" is wrong: ") +
+                           fault.reason,
+                       "mend it with tavisched edit " + id + ", or where the task was made");
     } else if (startsLater(task)) {
-        inspection.add({called(task) + " does not run before its first day, whatever is shown as "
-                                       "its next run",
-                        "say its days anew: tavisched edit " + id + " --daily or --weekly"});
+        inspection.add(called(task) + " does not run before its first day, whatever is shown as "
+                                      "its next run",
+                       "say its days anew: tavisched edit " + id + " --daily or --weekly");
     }
 }
 

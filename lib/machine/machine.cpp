@@ -1,4 +1,5 @@
 // The table of what is looked at on a machine, and the exported functions over it.
+#include "change/change.h"
 #include "finding.h"
 #include "sched_backend.h"
 #include "sched_error.h"
@@ -8,11 +9,15 @@
 #include "tavischeduler.h"
 
 #include <algorithm>
+#include <set>
+#include <string_view>
 
 namespace {
 
+using sched::ChangeLock;
 using sched::Finding;
 using sched::Inspection;
+using Names = std::set<std::string_view>;
 
 struct Row {
     const char *name;
@@ -23,7 +28,9 @@ struct Row {
 constexpr Row kRows[] = {{"room", sched::inspectRoom},
                          {"folders", sched::inspectFolders},
                          {"task files", sched::inspectTaskFiles},
+                         {"missing files", sched::inspectMissingFiles},
                          {"put aside", sched::inspectPutAside},
+                         {"leftovers", sched::inspectLeftovers},
                          {"runner", sched::inspectRunner},
                          {"cron", sched::inspectCron},
                          {"crontab", sched::inspectCrontabFile},
@@ -39,10 +46,31 @@ struct Named {
     Finding finding;
 };
 
-std::vector<Named> inspectAll() {
+// A change that goes on is not met half done, and one that was cut off is taken back.
+bool settle(const ChangeLock &lock, std::vector<Named> &all) {
+    if (!lock) {
+        return false;
+    }
+    if (lock.isOutermost() && ChangeLock::isUsable() && sched::takeBackCutOffChange() != 0) {
+        all.push_back({kRows[0].name,
+                       {"a change was cut off and cannot be taken back, so that no other one is "
+                        "possible",
+                        "the system log tells why; most often the file system of the task files "
+                        "has no room"}});
+    }
+    return true;
+}
+
+std::vector<Named> inspect(ChangeLock::Wait wait, const Names *names) {
     std::vector<Named> all;
     Inspection inspection;
+    const ChangeLock lock(wait);
+    inspection.isSettled = settle(lock, all);
+    inspection.looksAtTasks = !names;
     for (const Row &row : kRows) {
+        if (names && !names->contains(row.name)) {
+            continue;
+        }
         row.inspect(inspection);
         for (Finding &finding : inspection.findings) {
             all.push_back({row.name, std::move(finding)});
@@ -50,6 +78,10 @@ std::vector<Named> inspectAll() {
         inspection.findings.clear();
     }
     return all;
+}
+
+std::vector<Named> inspectAll() {
+    return inspect(ChangeLock::Wait::HalfAMinute, nullptr);
 }
 
 void freeFindings(TAVI_SCHED_FINDING *head) {
@@ -69,6 +101,7 @@ bool pushFront(FindingList &list, const Named &named) {
     sched::copyText(record->name, sizeof record->name, named.name);
     sched::copyText(record->what, sizeof record->what, named.finding.what.c_str());
     sched::copyText(record->advice, sizeof record->advice, named.finding.advice.c_str());
+    sched::copyText(record->repaired, sizeof record->repaired, named.finding.repaired.c_str());
     record->canRepair = named.finding.repair ? 1 : 0;
     record->isNote = named.finding.isNote ? 1 : 0;
     return true;
@@ -79,8 +112,7 @@ bool isSame(const Named &named, const TAVI_SCHED_FINDING &finding) {
            std::string_view(named.name) == finding.name;
 }
 
-int check(TAVI_SCHED_FINDING **findings) {
-    const std::vector<Named> all = inspectAll();
+int report(const std::vector<Named> &all, TAVI_SCHED_FINDING **findings) {
     FindingList list;
     for (auto named = all.rbegin(); named != all.rend(); ++named) {
         if (!pushFront(list, *named)) {
@@ -90,6 +122,11 @@ int check(TAVI_SCHED_FINDING **findings) {
     }
     *findings = list.release();
     return static_cast<int>(all.size());
+}
+
+bool isName(std::string_view name) {
+    return std::any_of(std::begin(kRows), std::end(kRows),
+                       [name](const Row &row) { return name == row.name; });
 }
 
 const Named *find(const std::vector<Named> &all, const TAVI_SCHED_FINDING &finding) {
@@ -117,7 +154,23 @@ int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings) {
     if (sched::initBackends(SCHED_SITE) != 0) {
         return -1;
     }
-    return sched::guarded(SCHED_SITE, [&] { return check(ppFindings); });
+    return sched::guarded(SCHED_SITE, [&] { return report(inspectAll(), ppFindings); });
+}
+
+int TAVISchedMachineCheckOf(const char *const *rgszNames, TAVI_SCHED_FINDING **ppFindings) {
+    SCHED_REQUIRE(rgszNames, "((void *)0) != rgszNames", -1);
+    SCHED_REQUIRE(ppFindings, "((void *)0) != ppFindings", -1);
+    if (sched::initBackends(SCHED_SITE) != 0) {
+        return -1;
+    }
+    return sched::guarded(SCHED_SITE, [&] {
+        Names names;
+        for (const char *const *name = rgszNames; *name; ++name) {
+            SCHED_REQUIRE(isName(*name), "name is known", -1);
+            names.insert(*name);
+        }
+        return report(inspect(ChangeLock::Wait::No, &names), ppFindings);
+    });
 }
 
 int TAVISchedFindingRepair(const TAVI_SCHED_FINDING *pFinding) {

@@ -44,14 +44,19 @@ std::optional<Character> firstOf(std::string_view text) {
                : std::optional(Character{code, length});
 }
 
-// Controls, line and paragraph ends, and marks that change the direction of writing.
+// Controls, line and paragraph ends, marks that change the direction of writing, and what takes no
+// room.
 bool isTreacherous(char32_t code) {
-    constexpr std::array<std::array<char32_t, 2>, 6> kRanges = {{{0x00, 0x1F},
-                                                                 {0x7F, 0x9F},
-                                                                 {0x061C, 0x061C},
-                                                                 {0x200E, 0x200F},
-                                                                 {0x2028, 0x202E},
-                                                                 {0x2066, 0x2069}}};
+    constexpr std::array<std::array<char32_t, 2>, 10> kRanges = {{{0x00, 0x1F},
+                                                                  {0x7F, 0x9F},
+                                                                  {0xAD, 0xAD},
+                                                                  {0x061C, 0x061C},
+                                                                  {0x180E, 0x180E},
+                                                                  {0x200B, 0x200F},
+                                                                  {0x2028, 0x202E},
+                                                                  {0x2060, 0x206F},
+                                                                  {0xFEFF, 0xFEFF},
+                                                                  {0xE0000, 0xE007F}}};
     return std::any_of(kRanges.begin(), kRanges.end(),
                        [code](const auto &range) { return code >= range[0] && code <= range[1]; });
 }

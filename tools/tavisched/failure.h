@@ -5,12 +5,9 @@
 #include "platc.h"
 
 #include <array>
-#include <cerrno>
 #include <cstdio>
-#include <cstring>
 #include <stdexcept>
 #include <string>
-#include <unistd.h>
 
 namespace tavisched {
 
@@ -35,12 +32,6 @@ inline std::string libraryError() {
     std::snprintf(code.data(), code.size(), "error 0x%04X (", PLATCErrGet());
     return code.data() + std::string(PLATCErrorGetFile()) + ":" +
            std::to_string(PLATCErrorGetLine()) + "); --verbose tells more";
-}
-
-// What errno tells of the system call that failed, and what a person can do about missing rights.
-inline std::string systemReason() {
-    const bool lacksRights = (errno == EACCES || errno == EPERM) && geteuid() != 0;
-    return std::strerror(errno) + std::string(lacksRights ? "; tavisched must be run by root" : "");
 }
 
 } // namespace tavisched

@@ -1,8 +1,9 @@
 // tavisched, the command line of the task scheduler: its subcommands with their options, and the
 // exit status.
-#include "commands.h"
+#include "commands/commands.h"
 #include "failure.h"
-#include "text.h"
+#include "text/utf8.h"
+#include "waiting.h"
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
@@ -14,6 +15,7 @@
 #include <string>
 #include <sys/stat.h>
 #include <syslog.h>
+#include <unistd.h>
 
 namespace {
 
@@ -66,7 +68,7 @@ void taskOptions(CLI::App *sub, TaskOptions &options) {
     sub->add_option("--at", options.at, "time of the day")->type_name("HH:MM");
     sub->add_flag("--daily", options.daily, "run every day");
     sub->add_option("--weekly", options.weekly, "run on these days of the week")
-        ->type_name("Mon,Fri");
+        ->type_name("Mon-Fri");
     sub->add_option("--monthly", options.monthly, "run on this day of the month")->type_name("DAY");
     sub->add_option("--yearly", options.yearly, "run on this day of the year")->type_name("MM-DD");
     sub->add_option("--once", options.once, "run on this day alone")->type_name("YYYY-MM-DD");
@@ -89,28 +91,39 @@ void taskOptions(CLI::App *sub, TaskOptions &options) {
 struct Settings {
     ListOptions list;
     TaskOptions task;
+    ImportOptions import;
     std::vector<std::string> ids;
     std::string id;
     int limit = std::numeric_limits<int>::max();
-    std::string file;
-    bool json = false, dryRun = false, quiet = false, yes = false, wait = false, repair = false;
+    bool json = false, web = false, dryRun = false, quiet = false, yes = false, wait = false,
+         repair = false;
 };
 
-void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
+void addListCommand(CLI::App &app, Settings &given, Command &command) {
     auto *const listing =
         subcommand(app, command, "list", "show the tasks", "tavisched list --sort next",
                    [&] { return list(given.list); });
+    listing->add_option("WORD", given.list.words,
+                        "only tasks with this in name, owner or application, or of this state");
     listing->add_flag("--all", given.list.all, "also those that are not listable");
+    listing->add_flag("--failed", given.list.failed, "only those whose last run failed");
+    listing->add_option("--owner", given.list.owner, "only those of this user")->type_name("USER");
+    listing->add_option("--next", given.list.next, "only those that run within this time")
+        ->type_name("24h");
     listing->add_option("--sort", given.list.sort, "field to sort by")
         ->check(CLI::IsMember(sortFields()));
     listing->add_flag("--reverse", given.list.reverse, "the other way round");
     jsonOption(listing, given.list.json, "as JSON for scripts");
+}
+
+void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
+    addListCommand(app, given, command);
 
     auto *const showing =
         subcommand(app, command, "show", "show every field of a task", "tavisched show 3",
                    [&] { return show(parseId(given.id), given.json); });
     showing->add_option("ID", given.id, "id of the task")->required();
-    jsonOption(showing, given.json, "as the web back end exchanges it");
+    jsonOption(showing, given.json, "as JSON for scripts");
 
     auto *const past =
         subcommand(app, command, "history", "show how runs ended, newest first",
@@ -127,8 +140,9 @@ void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
 
     auto *const exporting = subcommand(app, command, "export", "write tasks as a JSON array",
                                        "tavisched export > tasks.json",
-                                       [&] { return exportTasks(parseIds(given.ids)); });
+                                       [&] { return exportTasks(parseIds(given.ids), given.web); });
     idsOption(exporting, given.ids, false);
+    exporting->add_flag("--web", given.web, "as the web back end exchanges them");
 }
 
 void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
@@ -138,7 +152,7 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
                    "--at 22:00 --owner alice",
                    [&] { return add(given.task, given.dryRun, given.quiet); });
     taskOptions(adding, given.task);
-    adding->add_flag("--dry-run", given.dryRun, "show crontab line and next run, store nothing");
+    adding->add_flag("--dry-run", given.dryRun, "show what would come of it, store nothing");
     adding->add_flag("-q,--quiet", given.quiet, "print the id alone");
 
     auto *const editing =
@@ -162,12 +176,17 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
         subcommand(app, command, "remove", "remove tasks", "tavisched remove 3 4 --yes",
                    [&] { return removeTasks(parseIds(given.ids), given.yes); });
     idsOption(removing, given.ids, true);
-    removing->add_flag("-y,--yes", given.yes, "do not ask");
+    removing->add_flag("-y,--yes", given.yes, "do not ask; needed without a terminal");
 
-    subcommand(app, command, "import", "store the tasks of a JSON array, all or none",
-               "tavisched import tasks.json", [&] { return importTasks(given.file); })
-        ->add_option("FILE", given.file, "file to read; - is standard input")
+    auto *const importing =
+        subcommand(app, command, "import", "store the tasks of a JSON array, all or none",
+                   "tavisched import tasks.json", [&] { return importTasks(given.import); });
+    importing->add_option("FILE", given.import.file, "file to read; - is standard input")
         ->required();
+    importing->add_flag("--replace", given.import.replace,
+                        "overwrite tasks of the same id and name");
+    importing->add_flag("--dry-run", given.import.dryRun,
+                        "show what would come of it, store nothing");
 }
 
 void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
@@ -182,21 +201,122 @@ void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
 
     subcommand(app, command, "check", "look for what is wrong with this machine",
                "tavisched check --repair", [&] { return check(given.repair); })
-        ->add_flag("--repair", given.repair, "mend what is safe to mend");
+        ->add_flag("--repair", given.repair, "repair what needs no person");
 
     subcommand(app, command, "complete-ids", "ids and names, for completion",
                "tavisched complete-ids", [] { return completeIds(); })
         ->group(""); // not shown
 }
 
+// ---- What was not understood ----
+
+// Letters that must be added, left out, changed or exchanged with the next one.
+size_t distance(const std::string &one, const std::string &other) {
+    std::vector<std::vector<size_t>> steps(one.size() + 1, std::vector<size_t>(other.size() + 1));
+    for (size_t i = 0; i <= one.size(); ++i) {
+        for (size_t j = 0; j <= other.size(); ++j) {
+            if (i == 0 || j == 0) {
+                steps[i][j] = i + j;
+                continue;
+            }
+            const bool isSame = one[i - 1] == other[j - 1];
+            steps[i][j] = std::min(
+                {steps[i - 1][j] + 1, steps[i][j - 1] + 1, steps[i - 1][j - 1] + (isSame ? 0 : 1)});
+            if (i > 1 && j > 1 && one[i - 1] == other[j - 2] && one[i - 2] == other[j - 1]) {
+                steps[i][j] = std::min(steps[i][j], steps[i - 2][j - 2] + 1);
+            }
+        }
+    }
+    return steps[one.size()][other.size()];
+}
+
+// "; did you mean ...?", or "" when nothing is near.
+std::string suggest(const std::string &typed, const std::vector<std::string> &known) {
+    const auto nearest =
+        std::min_element(known.begin(), known.end(), [&](const auto &one, const auto &other) {
+            return distance(typed, one) < distance(typed, other);
+        });
+    const size_t most = std::max<size_t>(1, typed.size() / 3);
+    return nearest == known.end() || distance(typed, *nearest) > most
+               ? ""
+               : "; did you mean \"" + *nearest + "\"?";
+}
+
+std::vector<std::string> optionsOf(const CLI::App &app) {
+    std::vector<std::string> names;
+    for (const CLI::Option *const option : app.get_options()) {
+        for (const std::string &name : option->get_lnames()) {
+            names.push_back("--" + name);
+        }
+    }
+    return names;
+}
+
+std::vector<std::string> commandsOf(const CLI::App &app) {
+    std::vector<std::string> names;
+    for (const CLI::App *const sub : app.get_subcommands(nullptr)) {
+        if (!sub->get_group().empty()) {
+            names.push_back(sub->get_name());
+        }
+    }
+    return names;
+}
+
+std::string explainExtras(const CLI::App &app, const CLI::App *sub) {
+    const std::vector<std::string> extras = app.remaining(true);
+    const std::string first = extras.empty() ? "" : extras.front();
+    if (!first.starts_with('-')) {
+        return sub ? "\"" + join(extras, " ") + "\" is not expected"
+                   : "there is no command \"" + first + "\"" + suggest(first, commandsOf(app));
+    }
+    std::vector<std::string> known = optionsOf(app);
+    const std::vector<std::string> subs = sub ? optionsOf(*sub) : std::vector<std::string>();
+    known.insert(known.end(), subs.begin(), subs.end());
+    return "\"" + join(extras, " ") + "\" is not understood" +
+           suggest(first.substr(0, first.find('=')), known);
+}
+
+// How the command line is wrong, and where its help is.
+std::string explain(const CLI::App &app, const CLI::ParseError &error) {
+    const auto parsed = app.get_subcommands();
+    const CLI::App *const sub = parsed.empty() ? nullptr : parsed.front();
+    const bool isExtra = dynamic_cast<const CLI::ExtrasError *>(&error) != nullptr;
+    return printable(isExtra ? explainExtras(app, sub) : error.what()) + "\n\"tavisched " +
+           (sub ? sub->get_name() + " " : "") + "--help\" tells more.";
+}
+
+// People know these from elsewhere.
+std::string commandFor(const std::string &typed) {
+    return typed == "ls" ? "list" : typed == "rm" ? "remove" : typed;
+}
+
+// The arguments without the program's name, the last one first, as the parser takes them.
+std::vector<std::string> argumentsOf(int argc, char **argv) {
+    std::vector<std::string> arguments(argv + std::min(argc, 1), argv + argc);
+    const auto command =
+        std::find_if(arguments.begin(), arguments.end(),
+                     [](const std::string &argument) { return !argument.starts_with('-'); });
+    if (command != arguments.end()) {
+        *command = commandFor(*command);
+    }
+    std::reverse(arguments.begin(), arguments.end());
+    return arguments;
+}
+
+// ---- Executing ----
+
 int fail(const std::exception &error, int status) {
     std::fflush(stdout);
-    std::fprintf(stderr, "tavisched: %s\n", error.what());
+    std::fprintf(stderr, "tavisched: %s\n", printableLines(error.what()).c_str());
     return status;
 }
 
 int execute(const Command &command) {
     try {
+        if (geteuid() != 0) {
+            throw Failure("tasks are kept in root's files: it must be run by root");
+        }
+        tellOfWaiting();
         const int status = command();
         if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
             throw Failure("what was asked for was done, but the output could not be written");
@@ -217,18 +337,18 @@ int tavischedMain(int argc, char **argv) {
     bool verbose = false;
     app.set_version_flag("--version", kVersion);
     app.add_flag("-v,--verbose", verbose, "show the library's log lines on standard error");
-    app.footer("\"tavisched COMMAND --help\" shows a command's options and an example.");
+    app.footer("\"ls\" and \"rm\" stand for list and remove.\n"
+               "\"tavisched COMMAND --help\" shows a command's options and an example.");
     app.require_subcommand(0, 1);
-    app.failure_message([](const CLI::App *, const CLI::Error &error) {
-        return std::string("tavisched: ") + error.what() + "\n\"tavisched --help\" tells more.\n";
-    });
     addReadingCommands(app, given, command);
     addChangingCommands(app, given, command);
     addMachineCommands(app, given, command);
     try {
-        app.parse(argc, argv);
+        app.parse(argumentsOf(argc, argv));
     } catch (const CLI::ParseError &error) {
-        return app.exit(error) == 0 ? 0 : Refusal::kExitStatus;
+        return error.get_exit_code() == 0
+                   ? app.exit(error)
+                   : fail(Refusal(explain(app, error)), Refusal::kExitStatus);
     }
     if (!command) {
         return fail(Refusal("a command is needed; \"tavisched --help\" lists them"),

@@ -1,0 +1,208 @@
+// Several changes as one.
+#include "support.h"
+
+#include <sstream>
+
+namespace {
+
+using namespace support;
+
+class Batch : public SchedTest {
+  protected:
+    void SetUp() override {
+        SchedTest::SetUp();
+        storedTask();
+        before_ = machine();
+    }
+    void TearDown() override {
+        TAVISchedChangeRollback();
+        SchedTest::TearDown();
+    }
+    static std::string machine() {
+        return readFile(kWorking) + "|" + readFile(kPersistent) + "|" + readFile(kCrontab) + "|" +
+               readFile("/usr/tavi/etc/auto_power");
+    }
+    static Task powerOff(uint32_t hour, uint32_t minute) {
+        Task task(static_cast<TAVI_SCHED_TASK *>(calloc(1, sizeof(TAVI_SCHED_TASK))),
+                  TAVISchedTaskFree);
+        task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
+        EXPECT_EQ(TAVISchedTaskGetDefault(task.get()), 0);
+        TAVISchedCTaskSetAppArgs(task.get(), "poweroff");
+        task->runHour = hour;
+        task->runMin = minute;
+        return task;
+    }
+    // What another process lists.
+    static std::vector<int> othersIds() {
+        if (const pid_t child = fork(); child != 0) {
+            int status = 0;
+            waitpid(child, &status, 0);
+        } else {
+            std::string text;
+            for (const int id : listedIds()) {
+                text += std::to_string(id) + " ";
+            }
+            writeFile("/tmp/ids", text);
+            _exit(0);
+        }
+        std::vector<int> ids;
+        std::istringstream text(readFile("/tmp/ids"));
+        for (int id = 0; text >> id;) {
+            ids.push_back(id);
+        }
+        unlink("/tmp/ids");
+        return ids;
+    }
+
+    std::string before_;
+};
+
+TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    EXPECT_EQ(storedTask()->id, 2);
+    Task third = storedTask("echo 3");
+    EXPECT_EQ(TAVISchedTaskRemove(2), 0);
+    TAVISchedCTaskSetName(third.get(), "third");
+    EXPECT_EQ(TAVISchedTaskEdit(third.get()), 0);
+    EXPECT_EQ(TAVISchedTaskCreate(powerOff(22, 30).get()), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 3, 91272230));
+    TAVI_SCHED_TASK back{};
+    EXPECT_EQ(TAVISchedTaskGetByID(2, &back), -1);
+    EXPECT_EQ(TAVISchedTaskGetByID(3, &back), 0);
+    EXPECT_STREQ(back.name, "third");
+    EXPECT_STREQ(newTask()->name, "Task 2");
+    EXPECT_EQ(machine(), before_);
+    EXPECT_THAT(othersIds(), ElementsAre(1));
+    ASSERT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_THAT(othersIds(), ElementsAre(1, 3, 91272230));
+    EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
+    EXPECT_THAT(readFile(kCrontab), HasSubstr("--run id=3\n"));
+    EXPECT_THAT(readFile(kCrontab), HasSubstr("tavi_poweroff_feasible_check"));
+}
+
+TEST_F(Batch, EndsWithoutATrace) {
+    const struct {
+        const char *what;
+        int (*end)();
+    } cases[] = {{"rolled back", TAVISchedChangeRollback},
+                 {"without room for the files",
+                  [] {
+                      shell("mount -t tmpfs -o size=4k,nr_inodes=3 full /usr/tavi/etc");
+                      const int result = TAVISchedChangeCommit() == -1 ? 0 : 1;
+                      shell("umount /usr/tavi/etc");
+                      return result;
+                  }},
+                 {"with a crontab that cannot be written", [] {
+                      fakes.renameFails = true;
+                      const int result = TAVISchedChangeCommit() == -1 ? 0 : 1;
+                      fakes.renameFails = false;
+                      return result;
+                  }}};
+    for (const auto &c : cases) {
+        ASSERT_EQ(TAVISchedChangeBegin(), 0) << c.what;
+        storedTask();
+        EXPECT_EQ(TAVISchedTaskRemove(1), 0);
+        EXPECT_EQ(TAVISchedTaskCreate(powerOff(1, 2).get()), 0);
+        EXPECT_EQ(c.end(), 0) << c.what;
+        EXPECT_EQ(machine(), before_) << c.what;
+        EXPECT_THAT(listedIds(), ElementsAre(1)) << c.what;
+    }
+}
+
+TEST_F(Batch, MisuseIsRefused) {
+    EXPECT_EQ(failure(TAVISchedChangeCommit()), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedChangeRollback()), 0x0D00U);
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    EXPECT_EQ(failure(TAVISchedChangeBegin()), 0x0D00U);
+    EXPECT_EQ(TAVISchedChangeCommit(), 0); // of nothing
+    EXPECT_EQ(machine(), before_);
+}
+
+// Neither a section that nobody can read nor ids below 1 stand in the way.
+TEST_F(Batch, BesideDamagedSections) {
+    for (const char *const path : {kWorking, kPersistent}) {
+        writeFile(path, readFile(path) + "[7]\nid=7\n[-5]\nid=-5\nrun hour=1\nrun min=2\nname=n\n"
+                                         "app=\napp name=\naction=\ncmd=\nstate=enabled\n"
+                                         "type=daily\n");
+    }
+    writeFile(kCrontab, readFile(kCrontab) + "1 1 * * * root /tmp/tavischedtask --run id=7\n");
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    EXPECT_EQ(storedTask()->id, -4);
+    EXPECT_EQ(storedTask()->id, -3);
+    EXPECT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(-5, -4, -3, 1));
+    EXPECT_THAT(readFile(kCrontab), HasSubstr("root /tmp/tavischedtask --run id=7\n"));
+    EXPECT_THAT(readFile(kWorking), HasSubstr("[7]\nid=7\n"));
+}
+
+TEST_F(Batch, OfMorePowerSchedulesThanAreRead) {
+    std::string entries = "[power off]\n";
+    for (int i = 0; i < 100; ++i) {
+        char line[32];
+        snprintf(line, sizeof line, "%03d=0 1 %d %d\n", i, i / 60, i % 60);
+        entries += line;
+    }
+    writeFile("/usr/tavi/etc/auto_power", entries);
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    for (uint32_t minute = 0; minute < 3; ++minute) {
+        EXPECT_EQ(TAVISchedTaskCreate(powerOff(20, minute).get()), 0);
+    }
+    EXPECT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_THAT(readFile("/usr/tavi/etc/auto_power"), HasSubstr("099=0 1 1 39\n100=1 127 20 2\n"));
+}
+
+// A handler's PRE phase runs with each change, its POST phase at the end, with the batch's result.
+TEST_F(Batch, HandlersAreToldAtTheEnd) {
+    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
+          "printf '#!/bin/sh\necho $1 $2 $RESULT $ORG_TASK_ID >> /tmp/told\n' > note;"
+          "chmod 755 note");
+    for (const bool stored : {false, true}) {
+        ASSERT_EQ(TAVISchedChangeBegin(), 0);
+        EXPECT_EQ(TAVISchedTaskRemove(1), 0);
+        EXPECT_EQ(readFile("/tmp/told"), "task_remove pre 0 1\n");
+        EXPECT_EQ(stored ? TAVISchedChangeCommit() : TAVISchedChangeRollback(), 0);
+        EXPECT_EQ(readFile("/tmp/told"), std::string("task_remove pre 0 1\ntask_remove post ") +
+                                             (stored ? "0" : "-1") + " 1\n");
+        unlink("/tmp/told");
+    }
+    shell("rm -r /usr/tavi/etc/plugins");
+}
+
+// What the process starts would wait for it, and it for them.
+TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    const Task second = storedTask();
+    const pid_t child = fork();
+    if (child == 0) {
+        const Task task = newTask();
+        _exit(failure(TAVISchedTaskCreate(task.get())) == 0x0400 ? 0 : 1);
+    }
+    int status = -1;
+    waitpid(child, &status, 0);
+    EXPECT_EQ(status, 0);
+    EXPECT_THAT(logs(), Contains(HasSubstr("a change waits for this process")));
+    EXPECT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2));
+}
+
+TEST_F(Batch, NewTasksUnderGivenIds) {
+    Task task = newTask();
+    for (const int id : {0, -1, 1, 70000000}) {
+        task->id = id;
+        EXPECT_EQ(failure(TAVISchedTaskCreateWithId(task.get())), 0x0D00U) << id;
+    }
+    EXPECT_EQ(machine(), before_);
+    task->id = 40;
+    EXPECT_EQ(TAVISchedTaskCreateWithId(task.get()), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 40));
+    int32_t next = 0;
+    EXPECT_EQ(TAVISchedTaskNextId(&next), 0);
+    EXPECT_EQ(next, 2);
+    TAVI_SCHED_TASK *list = nullptr;
+    EXPECT_EQ(TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_AUTOPOWER, &list, nullptr), 0);
+    writeFile("/usr/tavi/etc/auto_power", "[power on]\n000=damaged\n");
+    EXPECT_EQ(TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_AUTOPOWER, &list, nullptr), -1);
+    EXPECT_EQ(failure(TAVISchedTaskListGetOf(-7, &list, nullptr)), 0x2000U);
+}
+
+} // namespace

@@ -1,0 +1,142 @@
+// A machine's task files as a whole.
+#include "machine.h"
+
+#include <algorithm>
+#include <array>
+#include <fcntl.h>
+#include <filesystem>
+#include <sstream>
+
+namespace support {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+std::vector<std::string> entriesOf(const char *folder) {
+    std::vector<std::string> paths;
+    for (const auto &entry : fs::directory_iterator(folder)) {
+        paths.push_back(entry.path());
+    }
+    return paths;
+}
+
+std::string sortedLines(const std::string &text) {
+    std::vector<std::string> lines;
+    std::istringstream stream(text);
+    for (std::string line; std::getline(stream, line);) {
+        lines.push_back(line);
+    }
+    std::sort(lines.begin(), lines.end());
+    std::string sorted;
+    for (const std::string &line : lines) {
+        sorted += line + "\n";
+    }
+    return sorted;
+}
+
+} // namespace
+
+State stateNow() {
+    State state;
+    for (const char *const path : {kWorking, kPersistent, kPower, kCrontab}) {
+        state[path] = fs::exists(path) ? readFile(path) : "(none)";
+    }
+    state[kCrontab] = sortedLines(state[kCrontab]);
+    return state;
+}
+
+std::vector<std::string> leftovers() {
+    std::vector<std::string> found;
+    for (const char *const folder : {"/tmp", "/usr/tavi/etc", "/etc"}) {
+        for (const std::string &path : entriesOf(folder)) {
+            const bool isKnown = path == kRunner || path == kWorking || path == kPersistent ||
+                                 path == kPower || path == std::string(kPersistent) + ".lock" ||
+                                 path == std::string(kPersistent) + ".reading";
+            const bool isMine = folder != std::string("/etc") || path.starts_with("/etc/crontab.");
+            if (!isKnown && isMine) {
+                found.push_back(path);
+            }
+        }
+    }
+    return found;
+}
+
+Snapshot::Snapshot() {
+    for (const char *const path : {kWorking, kPersistent, kPower, kCrontab}) {
+        contents_[path] = fs::exists(path) ? std::optional(readFile(path)) : std::nullopt;
+    }
+}
+
+void Snapshot::restore() const {
+    for (const std::string &path : leftovers()) {
+        fs::remove_all(path);
+    }
+    for (const auto &[path, content] : contents_) {
+        if (content) {
+            writeFile(path, *content);
+        } else {
+            unlink(path.c_str());
+        }
+    }
+    // A new crontab is later than the old one: with the same calls whatever the second is.
+    const std::array<timespec, 2> later = {
+        {{.tv_sec = 0, .tv_nsec = UTIME_OMIT}, {.tv_sec = time(nullptr) + 60, .tv_nsec = 0}}};
+    utimensat(AT_FDCWD, kCrontab, later.data(), 0);
+}
+
+std::string listOfFreshProcess() {
+    std::array<int, 2> ends{};
+    if (pipe(ends.data()) != 0) {
+        return "no pipe";
+    }
+    const pid_t pid = fork();
+    if (pid == 0) {
+        TAVI_SCHED_TASK *list = nullptr;
+        std::vector<std::string> rows;
+        const bool listed = TAVISchedTaskListGet(&list, nullptr) >= 0;
+        for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
+            rows.push_back(std::to_string(task->id) + " " + task->name + " " + task->command);
+        }
+        std::sort(rows.begin(), rows.end());
+        std::string text = listed ? "" : "failed";
+        for (const std::string &row : rows) {
+            text += row + "; ";
+        }
+        _exit(write(ends[1], text.data(), text.size()) == static_cast<ssize_t>(text.size()) ? 0
+                                                                                            : 1);
+    }
+    close(ends[1]);
+    std::string text;
+    std::array<char, 4096> buffer{};
+    for (ssize_t count = 0; (count = read(ends[0], buffer.data(), buffer.size())) > 0;) {
+        text.append(buffer.data(), static_cast<size_t>(count));
+    }
+    close(ends[0]);
+    int status = -1;
+    waitpid(pid, &status, 0);
+    return status == 0 ? text : text + " (list: wait status " + std::to_string(status) + ")";
+}
+
+int created(const char *name, const char *command) {
+    const Task task = newTask(command);
+    if (!task) {
+        return 1;
+    }
+    TAVISchedCTaskSetName(task.get(), name);
+    return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
+}
+
+int powerCreated(uint32_t hour) {
+    const Task task = newTask();
+    if (!task) {
+        return 1;
+    }
+    task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
+    TAVISchedTaskGetDefault(task.get());
+    TAVISchedCTaskSetAppArgs(task.get(), "poweroff");
+    task->runHour = hour;
+    return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
+}
+
+} // namespace support

@@ -1,0 +1,50 @@
+// A machine's task files as a whole: what they hold, what does not belong beside them, and the same
+// machine again for the next try.
+#pragma once
+
+#include "support.h"
+
+#include <map>
+
+namespace support {
+
+constexpr const char *kPower = "/usr/tavi/etc/auto_power";
+constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
+
+// By path; a file that is not there is "(none)", and the crontab's lines are sorted: they may
+// change places.
+using State = std::map<std::string, std::string>;
+State stateNow();
+
+// What is in the folders of these files and does not belong there.
+std::vector<std::string> leftovers();
+
+// The files as they are when it is made, to start again from.
+class Snapshot {
+  public:
+    Snapshot();
+    void restore() const;
+
+  private:
+    std::map<std::string, std::optional<std::string>> contents_;
+};
+
+// What a process that has just started lists: "id name command; ...", or "failed".
+std::string listOfFreshProcess();
+
+// Stores a task of that name, a power-off schedule: 0 or 1.
+int created(const char *name, const char *command = "true");
+int powerCreated(uint32_t hour = 22);
+
+// The result of a function in a process of its own, its exit status.
+template <typename Function> int inChild(Function &&function) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+        _exit(function());
+    }
+    int status = -1;
+    waitpid(pid, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+} // namespace support

@@ -1,0 +1,41 @@
+# The target "tidy": clang-tidy on every C++ source of the tree. A source is looked at anew when its object is, so
+# when it, a header that it includes or its compile command changed, and when .clang-tidy did.
+find_program(CLANG_TIDY clang-tidy)
+set(analysed)
+
+function(analyse_folder folder)
+    get_property(targets DIRECTORY ${folder} PROPERTY BUILDSYSTEM_TARGETS)
+    foreach(target IN LISTS targets)
+        get_target_property(sources ${target} SOURCES)
+        get_target_property(objects ${target} BINARY_DIR)
+        foreach(source IN LISTS sources)
+            if(NOT source MATCHES "\\.cpp$")
+                continue()
+            endif()
+            cmake_path(ABSOLUTE_PATH source BASE_DIRECTORY ${folder} OUTPUT_VARIABLE file)
+            cmake_path(RELATIVE_PATH file BASE_DIRECTORY ${PROJECT_SOURCE_DIR} OUTPUT_VARIABLE name)
+            set(stamp ${PROJECT_BINARY_DIR}/tidy/${name}.ok)
+            if(name MATCHES "^(build|bench/)" OR stamp IN_LIST analysed)
+                continue()
+            endif()
+            file(GLOB rules ${folder}/.clang-tidy)
+            add_custom_command(OUTPUT ${stamp} VERBATIM
+                COMMENT "clang-tidy ${name}"
+                COMMAND ${PROJECT_SOURCE_DIR}/tests/static_analysis.sh
+                    ${CLANG_TIDY} ${PROJECT_BINARY_DIR} ${file} ${stamp}
+                DEPENDS ${objects}/CMakeFiles/${target}.dir/${source}.o ${CLANG_TIDY}
+                    ${PROJECT_SOURCE_DIR}/.clang-tidy ${rules})
+            list(APPEND analysed ${stamp})
+        endforeach()
+    endforeach()
+    get_property(below DIRECTORY ${folder} PROPERTY SUBDIRECTORIES)
+    foreach(subfolder IN LISTS below)
+        analyse_folder(${subfolder})
+    endforeach()
+    set(analysed ${analysed} PARENT_SCOPE)
+endfunction()
+
+if(CLANG_TIDY AND CMAKE_GENERATOR STREQUAL "Ninja")
+    analyse_folder(${PROJECT_SOURCE_DIR})
+    add_custom_target(tidy DEPENDS ${analysed})
+endif()

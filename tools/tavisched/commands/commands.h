@@ -1,0 +1,53 @@
+// The subcommands, each in the file of its name. They print their results and return the exit
+// status; a Refusal or a Failure ends them early.
+#pragma once
+
+#include "tasks/options.h"
+
+#include <cstdint>
+#include <ctime>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace tavisched {
+
+using Ids = std::vector<int32_t>;
+
+struct ListOptions {
+    std::vector<std::string> words; // each must be found in the task
+    std::string owner;
+    std::string next; // such as "24h"
+    std::string sort = "id";
+    bool all = false;
+    bool failed = false;
+    bool reverse = false;
+    bool json = false;
+};
+// The fields that a list can be sorted by.
+const std::vector<std::string> &sortFields();
+int list(const ListOptions &options);
+
+int show(int32_t id, bool json);
+int history(std::optional<int32_t> id, size_t limit, bool json);
+int exportTasks(const Ids &ids, bool web);
+
+int add(const TaskOptions &options, bool dryRun, bool quiet);
+int edit(int32_t id, const TaskOptions &options, bool quiet);
+int setEnabled(const Ids &ids, bool enabled); // enable.cpp
+int removeTasks(const Ids &ids, bool yes);
+struct ImportOptions {
+    std::string file;
+    bool replace = false;
+    bool dryRun = false;
+};
+int importTasks(const ImportOptions &options);
+
+int run(const Ids &ids, bool wait);
+int syncTasks();
+int check(bool repair);
+
+// Ids and names of all tasks, a line each, for completion.
+int completeIds();
+
+} // namespace tavisched

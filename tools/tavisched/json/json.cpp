@@ -1,0 +1,38 @@
+// JSON as text.
+#include "json/json.h"
+#include "text/utf8.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <json/reader.h>
+#include <json/writer.h>
+#include <memory>
+
+namespace tavisched {
+
+std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json::Value &value) {
+    Json::CharReaderBuilder builder;
+    Json::CharReaderBuilder::strictMode(&builder.settings_);
+    builder["strictRoot"] = !anyRoot;
+    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+    std::string errors;
+    try {
+        if (reader->parse(text.data(), text.data() + text.size(), &value, &errors)) {
+            return std::nullopt;
+        }
+    } catch (const Json::Exception &refusal) { // of deep nesting
+        errors = refusal.what();
+    }
+    std::replace(errors.begin(), errors.end(), '\n', ' ');
+    return printable(errors);
+}
+
+void printJson(const Json::Value &value) {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "  ";
+    builder["emitUTF8"] = true;
+    builder["enableYAMLCompatibility"] = true; // no blank before a colon
+    std::printf("%s\n", printableLines(Json::writeString(builder, value)).c_str());
+}
+
+} // namespace tavisched

@@ -390,10 +390,10 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
  * existing (0x2000), or the date or the fork fails (0x2A00). */
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
 /* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
- * row bears, and `pEnd` a descriptor that reads end-of-file once the child has ended, also when it
- * recorded nothing; the caller waits for it with read or poll and closes it. Then the newest row of
- * the task with that process id (TAVISchedDBListStatus) tells how the command ended. Both are -1
- * when the task was skipped. */
+ * row bears, and `pEnd` a descriptor that reads end-of-file once the run has ended and its result
+ * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes
+ * it. What the command left behind may keep the child longer. Both are -1 when the task was
+ * skipped. */
 TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
                                             int32_t *pPid, int *pEnd);
 
@@ -469,6 +469,100 @@ TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STAT
 /* When the run of a row ended (seconds since the epoch): 1 known, 0 it goes on or that is not
  * known, -1. */
 TAVI_SCHED_API int TAVISchedDBGetEnd(struct sqlite3 *db, int32_t statusId, int32_t *pTimestamp);
+
+/* ---- Records of runs: what a run did, beyond the machine's next start ----
+ *
+ * Every run has a record with a number that is never given again, also one that came to nothing,
+ * and what its command printed is kept beside it. Records and outputs lie where only root reads
+ * them; a run whose record cannot be written goes on without one. As runs end, records beyond the
+ * limits go with their outputs. What conflicts is decided by the status database alone. */
+
+/* How a run went. The first are those of the status database. */
+#define TAVI_SCHED_RUN_NONE 0        /* the task's backend runs nothing */
+#define TAVI_SCHED_RUN_INTERRUPTED 1 /* nobody is left to end it: a power cut, a killed runner */
+#define TAVI_SCHED_RUN_RUNNING 2
+#define TAVI_SCHED_RUN_SUCCESS 3
+#define TAVI_SCHED_RUN_START_FAILED 4
+#define TAVI_SCHED_RUN_STOPPED 5
+#define TAVI_SCHED_RUN_SIGNALED 6         /* `number` is the signal */
+#define TAVI_SCHED_RUN_EXIT_FAILED 7      /* `number` is the exit code */
+#define TAVI_SCHED_RUN_WAITING 32         /* for the task `waitedFor`, since `waitingSince` */
+#define TAVI_SCHED_RUN_STOPPED_BY_USER 33 /* TAVISchedRunStop */
+#define TAVI_SCHED_RUN_GIVEN_UP 34        /* `waitedFor` was running each time */
+#define TAVI_SCHED_RUN_LOCK_FAILED 35
+#define TAVI_SCHED_RUN_DATABASE_FAILED 36
+#define TAVI_SCHED_RUN_OWNER_UNKNOWN 37
+#define TAVI_SCHED_RUN_TASK_REMOVED 38  /* while the run waited */
+#define TAVI_SCHED_RUN_TASK_DISABLED 39 /* while the run waited */
+#define TAVI_SCHED_RUN_MISSED 40        /* the task was due, and cron did not start it */
+
+/* Times are milliseconds since the epoch, and 0 for what did not happen. */
+typedef struct TAVI_SCHED_RUN {
+    int64_t run; /* its number, from 1 on */
+    int32_t taskId;
+    int32_t isOfRemovedTask; /* 1 = the task was removed; another one may have its id now */
+    uint32_t owner;
+    int32_t mode;         /* 1 = by cron, 0 = by hand */
+    uint32_t startedBy;   /* the user who started it by hand, whoever root is for */
+    int32_t result;       /* TAVI_SCHED_RUN_* */
+    int32_t number;       /* exit code or signal */
+    int64_t due;          /* the minute in which cron started it, or should have */
+    int64_t asked;        /* when it was started, or due when missed; it may have waited then */
+    int64_t began;        /* when its command began */
+    int64_t ended;        /* when its result was known */
+    int64_t duration;     /* milliseconds from began to ended, whatever the clock was set to */
+    int64_t waitingSince; /* when it met the first conflict */
+    int32_t waited;       /* seconds spent waiting */
+    int32_t waitedFor;    /* the last task that it waited for; 0 for the run lock */
+    int64_t outputSize;   /* bytes that the command has printed */
+    int64_t outputKept; /* those that TAVISchedRunOutputRead can give; 0 also when they are gone */
+    int32_t pid;        /* of the process that waits for the command */
+    char name[4096];    /* the task's name at that time */
+} TAVI_SCHED_RUN;
+
+/* Which runs to list; zeros ask for nothing in particular but for `taskId`. */
+typedef struct TAVI_SCHED_RUN_FILTER {
+    int32_t taskId;     /* of the task that has this id now; -1 = of all, removed ones too */
+    int32_t failedOnly; /* 1 = neither success, none, running nor waiting */
+    int32_t newestOnly; /* 1 = of each task that is there the newest alone */
+    int32_t limit;      /* at most so many; 0 = all */
+    int64_t since;      /* asked at that moment or later */
+} TAVI_SCHED_RUN_FILTER;
+
+/* Is handed one record, which is gone after the call; anything but 0 ends the list. */
+typedef int (*TAVI_SCHED_RUN_READER)(void *pContext, const TAVI_SCHED_RUN *pRun);
+/* Hands the runs that the filter (NULL: all) keeps to the reader, the newest first. Returns how
+ * many it was handed, 0 where there are no records, or -1 with error 0x0900 or 0x0B00. */
+TAVI_SCHED_API int TAVISchedRunList(const TAVI_SCHED_RUN_FILTER *pFilter,
+                                    TAVI_SCHED_RUN_READER reader, void *pContext);
+/* One record. 0x2000 when there is none of that number. */
+TAVI_SCHED_API int TAVISchedRunGet(int64_t run, TAVI_SCHED_RUN *pRun);
+
+/* Of an output the first and the last TAVI_SCHED_OUTPUT_PART bytes are kept. */
+#define TAVI_SCHED_OUTPUT_PART 65536
+
+/* Reads what the run printed from `*pOffset` on, also while it goes on, as bytes that may be
+ * anything. Returns how many bytes were written, 0 when there are no more (yet), or -1: 0x2000 when
+ * nothing is kept of the run. `*pOffset` moves behind what was written; what was cut out before it
+ * is passed over, and `*pCut` (may be NULL) tells how many bytes that were. */
+TAVI_SCHED_API int64_t TAVISchedRunOutputRead(int64_t run, int64_t *pOffset, char *pBuf,
+                                              size_t cbBuf, int64_t *pCut);
+/* Waits, up to so many milliseconds, until the run has printed more than `offset` bytes or has
+ * ended: 1, or 0 when the time is over first, or -1. */
+TAVI_SCHED_API int TAVISchedRunFollow(int64_t run, int64_t offset, int32_t milliseconds);
+/* Asks a run, waiting or with its command running, to end: everything that it started is sent TERM,
+ * and KILL so many seconds later. Does not wait for that. 0x2000 when no such run goes on; 0x2A00
+ * when it cannot be asked. */
+TAVI_SCHED_API int TAVISchedRunStop(int64_t run, int32_t graceSeconds);
+
+/* How many records are kept, of one task and of all; set by "runs_per_task" and "runs" in the
+ * section [limits] of /usr/tavi/etc/run_records. */
+typedef struct TAVI_SCHED_RUN_LIMITS {
+    int32_t runsPerTask; /* 50 by default */
+    int32_t runs;        /* 10,000 by default */
+} TAVI_SCHED_RUN_LIMITS;
+/* The limits in force; a value that is no number above 0 is passed over with a log line. */
+TAVI_SCHED_API int TAVISchedRunLimitsGet(TAVI_SCHED_RUN_LIMITS *pLimits);
 
 /* ---- What is wrong with the machine ---- */
 

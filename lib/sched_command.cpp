@@ -6,6 +6,8 @@
 #include "sched_handle.h"
 #include "tavisdk.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <csignal>
 #include <fcntl.h>
@@ -14,16 +16,20 @@
 #include <string>
 #include <string_view>
 #include <unistd.h>
+#include <utility>
 #include <vector>
 
 namespace {
 
 // What a command starts with: who it becomes, in which environment and where.
 struct Setting {
-    sched::User user; // the owner; none when the caller's identity serves as it is
-    std::vector<std::string> variables; // an environment of the owner's own
-    std::vector<char *> environment;    // the same for execve; empty: the caller's
+    sched::User user;      // the owner; none when the caller's identity serves as it is
+    bool isOwners = false; // home and environment are the owner's own
+    std::vector<std::string> variables;
+    std::vector<char *> environment; // for execve; empty: the caller's
 };
+
+sched::CommandWatch *watching = nullptr;
 
 bool isLocaleVariable(std::string_view variable) {
     return variable.starts_with("LANG=") || variable.starts_with("LC_") ||
@@ -42,10 +48,33 @@ void addOwnersEnvironment(Setting &setting) {
             setting.variables.emplace_back(*variable);
         }
     }
+    setting.isOwners = true;
+}
+
+bool hasName(std::string_view variable, std::string_view other) {
+    const size_t length = other.find('=') + 1;
+    return variable.substr(0, length) == other.substr(0, length);
+}
+
+// Variables of the watch's own, in the place of the caller's of the same names.
+void addWatchsVariables(Setting &setting) {
+    const std::vector<std::string> own = watching->variables();
+    for (char **variable = environ; variable && *variable && !setting.isOwners; ++variable) {
+        if (std::none_of(own.begin(), own.end(),
+                         [&](const std::string &name) { return hasName(*variable, name); })) {
+            setting.variables.emplace_back(*variable);
+        }
+    }
+    setting.variables.insert(setting.variables.end(), own.begin(), own.end());
+}
+
+void pointAtVariables(Setting &setting) {
     for (std::string &variable : setting.variables) {
         setting.environment.push_back(variable.data());
     }
-    setting.environment.push_back(nullptr);
+    if (!setting.environment.empty()) {
+        setting.environment.push_back(nullptr);
+    }
 }
 
 // Whoever made this root's process, such as cron, looked root's groups up and found no others. The
@@ -55,7 +84,7 @@ bool hasRootsGroupAlone() {
     return getegid() == 0 && getgroups(1, &group) == 1 && group == 0;
 }
 
-bool prepare(Setting &setting) {
+bool findOwner(Setting &setting) {
     const bool ownerIsCaller = geteuid() == getuid();
     if (ownerIsCaller && (geteuid() != 0 || hasRootsGroupAlone())) {
         return true;
@@ -68,6 +97,17 @@ bool prepare(Setting &setting) {
     if (!ownerIsCaller) {
         addOwnersEnvironment(setting);
     }
+    return true;
+}
+
+bool prepare(Setting &setting) {
+    if (!findOwner(setting)) {
+        return false;
+    }
+    if (watching) {
+        addWatchsVariables(setting);
+    }
+    pointAtVariables(setting);
     return true;
 }
 
@@ -127,17 +167,40 @@ void markInheritedDescriptors() {
     }
 }
 
-// In the child: becomes the shell. `report` is written to when the command must not be started.
+// A pipe that is the effective user's, so that the command may open /dev/stdout by name. Only the
+// end that is read does not wait.
+struct Output {
+    base::Descriptor reading;
+    base::Descriptor writing;
+
+    void make() {
+        std::array<int, 2> ends{};
+        if (pipe2(ends.data(), O_CLOEXEC) == 0) {
+            reading = base::Descriptor(ends[0]);
+            writing = base::Descriptor(ends[1]);
+            fcntl(ends[0], F_SETFL, O_NONBLOCK);
+        }
+    }
+    // In the child.
+    bool use() const {
+        return !writing || (dup2(writing.get(), STDOUT_FILENO) != -1 &&
+                            dup2(writing.get(), STDERR_FILENO) != -1);
+    }
+};
+
+// In the child: becomes the shell. `report` is written to when the command must not be started. A
+// command that is watched has a process group, so that one that signals its own spares the watch.
 [[noreturn]] void becomeShell(const char *command, Setting &setting, const WaitingSignals &signals,
-                              int report) {
+                              const Output &output, int report) {
     signals.restoreForCommand();
-    const bool ownEnvironment = !setting.environment.empty();
+    const bool grouped = !watching || setpgid(0, 0) == 0;
+    const bool used = output.use();
     markInheritedDescriptors();
-    if (takeEffectiveIdentity(setting.user.get()) &&
-        (!ownEnvironment || chdir(setting.user->szHome) == 0 || chdir("/") == 0)) {
+    if (grouped && used && takeEffectiveIdentity(setting.user.get()) &&
+        (!setting.isOwners || chdir(setting.user->szHome) == 0 || chdir("/") == 0)) {
         const char *const argv[] = {"sh", "-c", command, nullptr};
         execve("/bin/sh", const_cast<char *const *>(argv),
-               ownEnvironment ? setting.environment.data() : environ);
+               setting.environment.empty() ? environ : setting.environment.data());
     } else {
         const char failed = 1;
         (void)!write(report, &failed, 1);
@@ -151,7 +214,7 @@ int waitForShell(pid_t pid, int report) {
     ssize_t reported = 0;
     while ((reported = read(report, &failed, 1)) == -1 && errno == EINTR) {
     }
-    const int status = base::waitForChild(pid);
+    const int status = watching ? watching->wait(pid) : base::waitForChild(pid);
     return reported == 1 ? -1 : status;
 }
 
@@ -160,18 +223,30 @@ int startAndWait(const char *command, Setting &setting) {
     if (pipe2(report, O_CLOEXEC) != 0) {
         return -1;
     }
+    Output output;
+    if (watching && watching->wantsOutput()) {
+        output.make();
+    }
     const WaitingSignals signals;
     const pid_t pid = fork();
     if (pid == 0) {
-        becomeShell(command, setting, signals, report[1]);
+        becomeShell(command, setting, signals, output, report[1]);
     }
     close(report[1]);
+    output.writing.close();
+    if (watching && pid != -1) {
+        watching->begun(pid, std::move(output.reading));
+    }
     const int status = pid == -1 ? -1 : waitForShell(pid, report[0]);
     close(report[0]);
     return status;
 }
 
 } // namespace
+
+void sched::watchCommands(CommandWatch *watch) {
+    watching = watch;
+}
 
 int sched::runCommand(const char *command) {
     try {

@@ -35,4 +35,15 @@ inline constexpr const char *kStatusDatabase = "/tmp/sched_status.sqlite";
 inline constexpr const char *kStatusJournal = "/tmp/sched_status.sqlite-journal";
 inline constexpr const char *kStatusWal = "/tmp/sched_status.sqlite-wal";
 
+// What is remembered of runs, and the limits of it.
+inline constexpr const char *kRecordFolder = "/var/lib/tavischeduler";
+inline constexpr const char *kOutputFolder = "/var/lib/tavischeduler/output";
+inline constexpr const char *kRunDatabase = "/var/lib/tavischeduler/runs.sqlite";
+inline constexpr const char *kRunDatabaseWal = "/var/lib/tavischeduler/runs.sqlite-wal";
+inline constexpr const char *kRunDatabaseIndex = "/var/lib/tavischeduler/runs.sqlite-shm";
+inline constexpr const char *kDamagedRuns = "/var/lib/tavischeduler/runs.sqlite.damaged";
+inline constexpr const char *kRunNumber = "/var/lib/tavischeduler/run_number";
+inline constexpr const char *kLastLook = "/var/lib/tavischeduler/last_look";
+inline constexpr const char *kRunLimits = "/usr/tavi/etc/run_records";
+
 } // namespace sched

@@ -3,9 +3,11 @@
 // it ended. The lock covers the check for conflicts and the recording only, never the execution.
 #include "base/descriptor.h"
 #include "platc.h"
+#include "runs/run.h"
 #include "sched_backend.h"
 #include "sched_calendar.h"
 #include "sched_error.h"
+#include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
 #include "sched_run_end.h"
@@ -16,10 +18,12 @@
 #include <array>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <grp.h>
 #include <sys/file.h>
 #include <sys/socket.h>
 #include <unistd.h>
+#include <utility>
 
 FILE *pfLock = nullptr;
 
@@ -168,7 +172,8 @@ bool enterUserContext(uid_t uid) {
 // it.
 class TaskRun {
   public:
-    explicit TaskRun(TAVI_SCHED_TASK &task) : task_(task) {}
+    TaskRun(TAVI_SCHED_TASK &task, const sched::RunOrigin &origin)
+        : task_(task), wasEnabled_(task.state == TAVI_SCHED_STATE_ENABLED), run_(task, origin) {}
     ~TaskRun() {
         database_.reset();
         releaseLock();
@@ -176,15 +181,23 @@ class TaskRun {
     TaskRun(const TaskRun &) = delete;
     TaskRun &operator=(const TaskRun &) = delete;
 
+    // Until the result is stored.
     void perform() {
         Admission admission = Admission::Wait;
-        while (admission == Admission::Wait) {
+        while (admission == Admission::Wait && !run_.isStopped()) {
             admission = tryAdmission();
         }
-        if (admission == Admission::Granted && record() && execute()) {
+        if (run_.isStopped()) {
+            outcome_ = TAVI_SCHED_RUN_STOPPED_BY_USER;
+        } else if (admission == Admission::Granted && isStillToRun() && record() && execute()) {
             storeResult();
         }
+        database_.reset();
+        releaseLock();
+        run_.end(outcome_, std::atoi(comment_.data()));
     }
+    // What nobody waits for.
+    void finish() { run_.finish(); }
 
   private:
     enum class Admission { Granted, Wait, Refused };
@@ -196,11 +209,17 @@ class TaskRun {
     // The length of a pause: 3 to 30 seconds.
     static unsigned int drawPause() { return static_cast<unsigned int>(std::rand() % 10) * 3 + 3; }
 
-    // Waits before the next attempt, with neither lock nor database held.
-    Admission pause(unsigned int seconds) {
+    Admission refuse(int32_t outcome) {
+        outcome_ = outcome;
+        return Admission::Refused;
+    }
+
+    // Waits before the next attempt, with neither lock nor database held. 0 stands for the lock.
+    Admission pause(unsigned int seconds, int32_t taskId) {
         ++waits_;
         database_.reset();
         releaseLock();
+        run_.waitFor(taskId, seconds);
         sleep(seconds);
         return Admission::Wait;
     }
@@ -220,7 +239,7 @@ class TaskRun {
             return afterLockFailure();
         }
         if (!openDatabase()) {
-            return Admission::Refused;
+            return refuse(TAVI_SCHED_RUN_DATABASE_FAILED);
         }
         const Admission admission = mayOverlapTask() ? Admission::Granted : checkTask();
         return admission != Admission::Granted || mayOverlapApp() ? admission : checkApp();
@@ -228,11 +247,11 @@ class TaskRun {
 
     Admission afterLockFailure() {
         if (waits_ >= kMaxWaits) {
-            return Admission::Refused;
+            return refuse(TAVI_SCHED_RUN_LOCK_FAILED);
         }
         const unsigned int seconds = drawPause();
         SCHED_LOG("Lock failed (retry=%d), sleep %u secs.", waits_ + 1, seconds);
-        return pause(seconds);
+        return pause(seconds, 0);
     }
 
     Admission checkTask() {
@@ -240,7 +259,7 @@ class TaskRun {
         if (TAVISchedDBIsTaskRunning(database_.get(), task_.id, &status) < 0) {
             SCHED_LOG("Check task running status failed. id:[%ld][0x%04X %s:%d]", id(),
                       SCHED_LAST_ERROR);
-            return Admission::Refused;
+            return refuse(TAVI_SCHED_RUN_DATABASE_FAILED);
         }
         return status.found ? afterConflict(status) : Admission::Granted;
     }
@@ -250,7 +269,7 @@ class TaskRun {
         if (TAVISchedDBIsAppRunning(database_.get(), task_.app, &status) < 0) {
             SCHED_LOG("Check app running status failed. app:[%s][0x%04X %s:%d]", task_.app,
                       SCHED_LAST_ERROR);
-            return Admission::Refused;
+            return refuse(TAVI_SCHED_RUN_DATABASE_FAILED);
         }
         return status.found ? afterConflict(status) : Admission::Granted;
     }
@@ -258,15 +277,43 @@ class TaskRun {
     Admission afterConflict(const TAVI_SCHED_STATUS &running) {
         releaseLock();
         if (waits_ >= kMaxWaits) {
-            return Admission::Refused;
+            return refuse(TAVI_SCHED_RUN_GIVEN_UP);
         }
         const unsigned int seconds = drawPause();
         SCHED_LOG("Task %ld conflict with task %ld (running), retry = %d, wait %u secs.", id(),
                   static_cast<long>(running.taskId), waits_ + 1, seconds);
-        return pause(seconds);
+        return pause(seconds, running.taskId);
+    }
+
+    // What waited reads its task once more: it may be gone, disabled or another by now. One that
+    // cannot be read is run as it was.
+    bool isStillToRun() {
+        const auto row =
+            waits_ == 0 ? std::nullopt
+                        : sched::findBackend(task_.backend, &TAVI_SCHED_BACKEND_RECORD::get_by_id);
+        if (!row) {
+            return true;
+        }
+        auto present = sched::allocateTask();
+        const int found = present ? SchedBackends[*row].get_by_id(task_.id, present.get()) : -1;
+        if (found == 0 || present->state == TAVI_SCHED_STATE_NOT_EXISTED ||
+            !run_.isOfPresentTask()) {
+            outcome_ = TAVI_SCHED_RUN_TASK_REMOVED;
+            return found < 0;
+        }
+        if (wasEnabled_ && present->state == TAVI_SCHED_STATE_DISABLED) {
+            outcome_ = TAVI_SCHED_RUN_TASK_DISABLED;
+            return found < 0;
+        }
+        if (found > 0) {
+            std::memcpy(&task_, present.get(), sizeof task_);
+            run_.setTask(task_);
+        }
+        return true;
     }
 
     bool record() {
+        outcome_ = TAVI_SCHED_RUN_DATABASE_FAILED;
         const int result = TAVISchedDBAddRecord(database_.get(), &task_, &statusId_);
         if (result < 0) {
             SCHED_LOG("Add status record failed. id:[%ld][0x%04X %s:%d]", id(), SCHED_LAST_ERROR);
@@ -278,14 +325,18 @@ class TaskRun {
 
     // Runs the command as the owner and comes back to the user that this process was.
     bool execute() {
+        outcome_ = TAVI_SCHED_RUN_START_FAILED;
         if (sched::initBackends(SCHED_SITE) != 0) {
             return false;
         }
         const uid_t caller = geteuid();
+        run_.beginCommand();
         if (!enterUserContext(task_.owner)) {
+            outcome_ = TAVI_SCHED_RUN_OWNER_UNKNOWN;
             return false;
         }
         const bool ran = runBackend();
+        outcome_ = ran ? statusCode_ : outcome_;
         return enterUserContext(caller) && ran;
     }
 
@@ -313,16 +364,27 @@ class TaskRun {
     }
 
     TAVI_SCHED_TASK &task_;
+    bool wasEnabled_;
+    sched::Run run_;
     sched::Database database_;
     int waits_ = 0;
+    int32_t outcome_ = TAVI_SCHED_RUN_LOCK_FAILED; // as the records tell it
     int32_t statusId_ = -1;
     int statusCode_ = SCHED_STATUS_CODE_NONE;
     std::array<char, 1024> comment_{};
 };
 
-[[noreturn]] void runInChild(TAVI_SCHED_TASK &task) {
+// The caller's side of the connection reads its end when the result is stored.
+[[noreturn]] void runInChild(TAVI_SCHED_TASK &task, const sched::RunOrigin &origin,
+                             base::Descriptor connection) {
     TAVISchedRandInit();
-    TaskRun(task).perform();
+    sched::guarded(SCHED_SITE, [&] {
+        TaskRun run(task, origin);
+        run.perform();
+        connection.close();
+        run.finish();
+        return 0;
+    });
     _exit(0);
 }
 
@@ -334,7 +396,7 @@ struct Followed {
 };
 
 // A connection between the caller's process and the child: it carries the child's process id, and
-// it ends with the child, as nobody else has that side of it.
+// it ends with the run, at the latest with the child, as nobody else has that side of it.
 class Connection {
   public:
     bool make() {
@@ -346,11 +408,12 @@ class Connection {
         childs_ = base::Descriptor(ends[1]);
         return true;
     }
-    // In the child, for as long as it lives. A caller that is gone by now is no reason to end.
-    void tellPid() {
+    // In the child. A caller that is gone by now is no reason to end.
+    base::Descriptor tellPid() {
         const int32_t pid = getpid();
-        send(childs_.release(), &pid, sizeof pid, MSG_NOSIGNAL);
+        send(childs_.get(), &pid, sizeof pid, MSG_NOSIGNAL);
         callers_.close();
+        return std::move(childs_);
     }
     // In the caller's process. A child that was killed at once tells nothing.
     void takePid(const Followed &followed) {
@@ -372,7 +435,8 @@ int failToRun(int32_t id) {
     return -1;
 }
 
-int startChild(int32_t id, TAVI_SCHED_TASK &task, const Followed *followed) {
+int startChild(int32_t id, int32_t mode, TAVI_SCHED_TASK &task, const Followed *followed) {
+    const sched::RunOrigin origin = sched::originOf(mode);
     Connection connection;
     if (followed && !connection.make()) {
         SCHED_LOG("socketpair failed. %m");
@@ -386,10 +450,7 @@ int startChild(int32_t id, TAVI_SCHED_TASK &task, const Followed *followed) {
         }
         return 0;
     case 0:
-        if (followed) {
-            connection.tellPid();
-        }
-        runInChild(task);
+        runInChild(task, origin, followed ? connection.tellPid() : base::Descriptor());
     default:
         SCHED_LOG("Fork error! [0x%04X %s:%d]", SCHED_LAST_ERROR);
         return failToRun(id);
@@ -418,7 +479,7 @@ int runTask(int32_t id, int32_t mode, int32_t enabledOnly, const Followed *follo
     if (due != 1) {
         return due;
     }
-    return startChild(id, task, followed);
+    return startChild(id, mode, task, followed);
 }
 
 } // namespace

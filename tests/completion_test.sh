@@ -41,5 +41,7 @@ s:show sync
 add --name list --d:--daily --disabled --dry-run
 add --weekly Mon,T:Mon,Tue Mon,Thu
 --verbose remove 2 1:1 12
+ls --f:--failed
+rm --yes 1:1 12
 END
 exit $status

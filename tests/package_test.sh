@@ -14,17 +14,18 @@ check=/usr/tavi/bin/tavi_poweroff_feasible_check
 tasks=/usr/tavi/etc/scheduled_tasks
 working=/tmp/scheduled_tasks
 unit=/usr/lib/systemd/system/tavischeduler.service
-log=${2:-$debs}/log
+own=/home/package_test # what the test itself keeps, in the sandbox
+log=$own/log
 
 step() { printf 'package_test: %s\n' "$*"; }
 fail() { printf 'package_test: FAILED: %s\n' "$*" >&2; exit 1; }
 expect() { local what=$1; shift; "$@" || fail "$what"; }
 quietly() { "$@" >"$log" 2>&1 </dev/null || { cat "$log" >&2; fail "$*"; }; }
 manage() { quietly dpkg --force-confdef --force-confold "$@"; }
-files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T /mnt; }
-expect_same() { expect "$1 changed $2" cmp "$2" "/mnt/${2##*/}"; }
+files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T $own; }
+expect_same() { expect "$1 changed $2" cmp "$2" "$own/${2##*/}"; }
 expect_own_crontab() { # as it was before the installation
-    expect "after $1 $crontab is not the machine's own" cmp $crontab /mnt/crontab.own
+    expect "after $1 $crontab is not the machine's own" cmp $crontab $own/crontab.own
     expect "$1 changed mode or owner of $crontab" [ "$(stat -c %a:%U:%G $crontab)" = 640:root:adm ]
 }
 expect_only_cron_missing() {
@@ -44,7 +45,7 @@ boot() { # what tmpfiles.d and the unit do; of /tmp nothing is left, or what is 
 }
 spoil() { # FILE as the loss of power left it
     case $2 in torn) truncate -s "$(($(stat -c %s "$1") / 2))" "$1" ;; empty) truncate -s 0 "$1" ;; gone) rm "$1" ;;
-        as-before) cp "/mnt/${1##*/}" "$1" ;; esac
+        as-before) cp "$own/${1##*/}" "$1" ;; esac
 }
 expect_files() {
     local wrong package=$1; shift
@@ -60,6 +61,7 @@ if [ $# -eq 1 ]; then
     expect "$1 is not configured with the prefix /usr" [ -f "$1/CPackConfig.cmake" ]
     sudo=; [ "$(id -u)" -eq 0 ] || sudo="sudo -n"
     $sudo true || { step "skipped: needs root or sudo"; exit 77; }
+    log=$debs/log
     rm -rf "$debs"
     mkdir "$debs"
     cd "$1"
@@ -68,17 +70,17 @@ if [ $# -eq 1 ]; then
     quietly cpack -G DEB -B packages/now
     quietly cpack -G DEB -B packages/later -D CPACK_PACKAGE_VERSION=$later
     umask 022
-    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" /mnt
+    exec $sudo "$source/scripts/sandbox" "$source/tests/package_test.sh" "$PWD" inside
 fi
 
 # What lies in /usr/local on the machine is not tested, and nothing of the environment counts.
 export PATH=/usr/sbin:/usr/bin:/sbin:/bin LC_ALL=C.UTF-8 DEBIAN_FRONTEND=noninteractive
 unset LD_LIBRARY_PATH LIBRARY_PATH CPATH PKG_CONFIG_PATH CMAKE_PREFIX_PATH
 rm -rf /usr/tavi
-mount -t tmpfs layers /mnt
+mkdir $own
 for folder in /usr/*/ /var/; do
-    mkdir -p "/mnt$folder"{upper,work}
-    mount -t overlay overlay -o "lowerdir=$folder,upperdir=/mnt${folder}upper,workdir=/mnt${folder}work" "$folder"
+    mkdir -p "$own$folder"{upper,work}
+    mount -t overlay overlay -o "lowerdir=$folder,upperdir=$own${folder}upper,workdir=$own${folder}work" "$folder"
 done
 mount -t tmpfs local /usr/local
 manage --purge tavischeduler-dev tavischeduler # where the machine has them
@@ -88,8 +90,8 @@ touch /usr/tavi/bin/of-the-machine
 printf '%s\n' 'SHELL=/bin/sh' '# tavischedtask' '0 5 * * * root /opt/tavischedtask' > $crontab
 chown root:adm $crontab
 chmod 640 $crontab
-cp $crontab /mnt/crontab.own
-files > /mnt/files
+cp $crontab $own/crontab.own
+files > $own/files
 
 step "installation"
 manage -i "$debs"/now/*.deb
@@ -119,15 +121,15 @@ flags=$(pkg-config --cflags --libs tavischeduler | xargs)
 expect "pkg-config says: $flags" [ "$flags" = "-ltavischeduler -ltaviplatform" ]
 examples=/usr/share/doc/tavischeduler-dev/examples
 # shellcheck disable=SC2086 # a list of words
-quietly cc $examples/task.c -o /mnt/task $flags
-quietly cmake -S $examples -B /mnt/example
-quietly cmake --build /mnt/example
+quietly cc $examples/task.c -o $own/task $flags
+quietly cmake -S $examples -B $own/example
+quietly cmake --build $own/example
 
 step "tasks"
 id=$(tavisched add -q --name Nightly --command 'id -un > /tmp/ran' --daily --at 03:00 --owner nobody)
 quietly tavisched add --power off --weekly Mon --at 04:00
 expect "the task is not listed" grep -q Nightly <(tavisched list)
-expect "a program built over the package does not find the task" grep -q Nightly <(/mnt/task show "$id")
+expect "a program built over the package does not find the task" grep -q Nightly <($own/task show "$id")
 quietly tavisched run "$id" --wait
 expect "the task did not run as its owner" grep -qx nobody /tmp/ran
 rm /tmp/ran
@@ -140,26 +142,26 @@ quietly systemd-tmpfiles --create tavischeduler.conf
 expect "the power-off check is not made" cmp $check /usr/share/tavischeduler/${check##*/}
 echo '# changed on this machine' >> $check
 chmod 700 $check
-cp $check $tasks $crontab /mnt
+cp $check $tasks $crontab $own
 quietly systemd-tmpfiles --create tavischeduler.conf
 expect_same boot $check
 expect "boot changed the mode of $check" [ "$(stat -c %a $check)" = 700 ]
 
 step "boot: what was cut off comes back whole"
 # Copies one half and is killed with its caller where it is to write what CUT names.
-mv /usr/bin/cp /mnt/cp
+mv /usr/bin/cp /home/package_test/cp
 cat > /usr/bin/cp << 'END'
 #!/bin/sh
-[ "$3" = "${CUT:-nothing}" ] || exec /mnt/cp "$@"
+[ "$3" = "${CUT:-nothing}" ] || exec /home/package_test/cp "$@"
 head -c 400 "$2" > "$3"
 kill -9 $PPID
 END
 chmod 755 /usr/bin/cp
 printf '{"id": "\\"-1\\""%s}' "$(printf ', "%s": "\\"%s\\""' 'run hour' 5 'run min' 0 name New app '' 'app name' '' \
-    action '' cmd dHJ1ZQ== state enabled type daily)" > /mnt/new.json
+    action '' cmd dHJ1ZQ== state enabled type daily)" > /home/package_test/new.json
 while read -r CUT stored record tmp; do
     row="a change cut off at $CUT with $stored tasks, $record record and /tmp that $tmp"
-    CUT=$CUT bash -c '/mnt/task save /mnt/new.json; true' &>"$log"
+    CUT=$CUT bash -c '/home/package_test/task save /home/package_test/new.json; true' &>"$log"
     expect "$row: nothing was recorded" [ -s $tasks.journal ]
     spoil $tasks "$stored"
     spoil $tasks.journal "$record"
@@ -177,8 +179,8 @@ $working whole whole is-lost
 $working torn whole stays
 $working empty whole is-lost
 END
-quietly /mnt/task save /mnt/new.json
-mv /mnt/cp /usr/bin/cp
+quietly /home/package_test/task save /home/package_test/new.json
+mv /home/package_test/cp /usr/bin/cp
 expect "no change is possible afterwards" grep -q '^name=New$' $tasks
 quietly tavisched remove --yes 2
 expect_same "a task that came and went" $tasks
@@ -186,8 +188,8 @@ rm $tasks # lines of tasks that are nowhere else are the last trace of them
 boot is-lost
 expect_same "a boot without tasks" $crontab
 expect_working_copy "a boot without tasks" /dev/null
-cp /mnt/${tasks##*/} $tasks
-install -o nobody /mnt/new.json $working # and a user's file at the name is not believed
+cp /home/package_test/${tasks##*/} $tasks
+install -o nobody /home/package_test/new.json $working # and a user's file at the name is not believed
 boot stays
 expect_working_copy boot $tasks
 
@@ -205,12 +207,12 @@ expect "removal left the runner's link" [ ! -L /tmp/tavischedtask ]
 
 step "re-installation"
 manage -i "$debs"/later/*.deb
-expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort /mnt/crontab)
+expect "re-installation does not bring lines back" cmp <(sort $crontab) <(sort $own/crontab)
 expect_same re-installation $check
 expect_only_cron_missing
 
 step "purge"
 manage --purge tavischeduler-dev tavischeduler
 expect_own_crontab purge
-expect "purge left or took files" diff /mnt/files <(files)
+expect "purge left or took files" diff $own/files <(files)
 step "passed"

@@ -66,14 +66,15 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
     signal(SIGCHLD, SIG_DFL);
     close(leaked);
     close(high);
-    EXPECT_EQ(readFile("/tmp/home/seen"),
-              "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
-              "Groups:\t4242 4343 \nSigIgn:\t" +
-                  std::string(ignored.data()) +
-                  "\nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
-                  "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
-                  "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTZ=UTC\n"
-                  "USER=tavitest\n");
+    EXPECT_EQ(
+        readFile("/tmp/home/seen"),
+        "Uid:\t4242\t4242\t4242\t4242\nGid:\t4242\t4242\t4242\t4242\n"
+        "Groups:\t4242 4343 \nSigIgn:\t" +
+            std::string(ignored.data()) +
+            "\nCapPrm:\t0000000000000000\n/usr/bin/dash\n/tmp/home\n0\n"
+            "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
+            "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\nTAVI_RUN_ID=1\n"
+            "TAVI_TASK_ID=1\nTAVI_TASK_NAME=Task 1\nTZ=UTC\nUSER=tavitest\n");
     EXPECT_EQ(rows(), "1:3: ");
     EXPECT_EQ(statusOf("/tmp/sched_status.sqlite").st_uid, 0U);
     EXPECT_THAT(logs(), IsEmpty());
@@ -204,7 +205,7 @@ TEST_F(Run, ConflictingRunsFollowEachOther) {
         TAVISchedCTaskSetCanRunAppSameTime(task.get(), 0);
         ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     }
-    fakes.pauseMicroseconds = 60000;
+    fakes.pauseMicroseconds = 400000; // twenty are enough also for runs that are slow to start
     for (const int id : {1, 1, 2, 1}) {
         EXPECT_EQ(TAVISchedTaskRun(id, 0, 0), 0);
     }
@@ -222,7 +223,8 @@ TEST_F(Run, WaitsForTheLockOfAnotherRunner) {
     const int other = open("/tmp/lock/lock_sched_run", O_CREAT | O_RDWR, 0600);
     flock(other, LOCK_SH);
     EXPECT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
-    shell("sleep 0.2");
+    EXPECT_TRUE(
+        waitFor("grep -q -- \"-> .*:$(stat -c %i /tmp/lock/lock_sched_run) \" /proc/locks"));
     EXPECT_EQ(rows(), "");
     flock(other, LOCK_UN);
     waitForChildren();

@@ -210,7 +210,8 @@ TEST_F(StatusDatabase, WhatOthersPutThereIsNotFollowed) {
 TEST_F(StatusDatabase, ManyMayOpenItFirst) {
     sqlite3_close(db_);
     db_ = nullptr;
-    fakes.pauseMicroseconds = 10000; // a process that is not on the CPU holds its lock for longer
+    fakes.pauseMicroseconds =
+        20000; // without, a hundred are over while the lock's holder waits for a core
     for (int round = 0; round < 20; ++round) {
         shell("rm -f /tmp/sched_status.sqlite*");
         for (int i = 0; i < 8; ++i) {

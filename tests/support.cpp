@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 #include <cstring>
@@ -27,9 +28,11 @@ namespace {
 // Shared with forked children.
 struct Journal {
     std::atomic<size_t> logLength;
+    std::atomic<size_t> noticeLength;
     std::atomic<size_t> pauseCount;
     long pauses[4096];
     char log[4 << 20];
+    char notices[1 << 20];
 };
 
 Journal &journal() {
@@ -54,11 +57,19 @@ void recordPause(long microseconds) {
 
 std::vector<std::string> logs(bool stable) {
     std::vector<std::string> lines;
-    const size_t length = journal().logLength.exchange(0);
-    std::istringstream text(std::string(journal().log, length));
+    std::istringstream text(std::string(journal().log, journal().logLength.exchange(0)));
     for (std::string line; std::getline(text, line, '\0');) {
         static const std::regex number("(\\.(?:cpp|h)):\\d+");
         lines.push_back(stable ? line : std::regex_replace(line, number, "$1:*"));
+    }
+    return lines;
+}
+
+std::vector<std::string> notices() {
+    std::vector<std::string> lines;
+    std::istringstream text(std::string(journal().notices, journal().noticeLength.exchange(0)));
+    for (std::string line; std::getline(text, line, '\0');) {
+        lines.push_back(line);
     }
     return lines;
 }
@@ -109,6 +120,11 @@ std::string query(const std::string &sql) {
 int shell(const std::string &command) {
     const int status = std::system(command.c_str());
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+bool waitFor(const std::string &condition) {
+    return shell("for i in $(seq 12000); do ! { " + condition +
+                 "; } || exit 0; sleep 0.01; done; exit 1") == 0;
 }
 
 void waitForChildren() {
@@ -171,11 +187,13 @@ Task taskOf(const When &row) {
 
 void SchedTest::SetUp() {
     // Never across a mount point: a checkout below /tmp is there, as it is on the machine.
-    shell("find /tmp /usr/tavi/etc /run -xdev -mindepth 1 -delete 2>/dev/null");
+    shell(
+        "find /tmp /usr/tavi/etc /run /var/lib/tavischeduler -xdev -mindepth 1 -delete 2>/dev/null");
     writeFile(kCrontab, kForeignCrontab);
     symlink(RUNNER, "/tmp/tavischedtask");
     setenv("TZ", "UTC", 1);
     logs();
+    notices();
     pauses();
 }
 
@@ -202,7 +220,7 @@ tm *localtime(const time_t *time) noexcept {
 void syslog(int priority, const char *format, ...) {
     const int savedErrno = errno; // also for %m
     char line[80000] = "wrong priority";
-    if (priority == LOG_ERR) {
+    if (priority == LOG_ERR || priority == LOG_INFO) {
         va_list arguments;
         va_start(arguments, format);
         vsnprintf(line, sizeof line, format, arguments);
@@ -210,7 +228,11 @@ void syslog(int priority, const char *format, ...) {
     }
     auto &journal = support::journal();
     const size_t size = std::strlen(line) + 1;
-    std::memcpy(journal.log + journal.logLength.fetch_add(size), line, size);
+    if (priority == LOG_INFO) {
+        std::memcpy(journal.notices + journal.noticeLength.fetch_add(size), line, size);
+    } else {
+        std::memcpy(journal.log + journal.logLength.fetch_add(size), line, size);
+    }
     errno = savedErrno;
 }
 
@@ -259,6 +281,11 @@ int fsync(int fd) {
 } // extern "C"
 
 int main(int argc, char **argv) {
+    // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may
+    // not.
+    for (const int number : {SIGHUP, SIGINT, SIGQUIT, SIGPIPE, SIGTERM, SIGCHLD, SIGALRM}) {
+        signal(number, SIG_DFL);
+    }
     const char *const sandbox = std::getenv("TAVI_SANDBOX");
     const bool onlyList = std::any_of(argv + 1, argv + argc, [](const char *argument) {
         return std::strncmp(argument, "--gtest_list_tests", 18) == 0;

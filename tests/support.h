@@ -49,6 +49,8 @@ extern Fakes fakes;
 std::vector<std::string> logs(bool stable = false);
 // The last of them, or "".
 std::string lastLog(bool stable = false);
+// The same for lines at LOG_INFO, which tell of no failure.
+std::vector<std::string> notices();
 // The arguments of all calls of sleep() and usleep() since the last call, in microseconds.
 std::vector<long> pauses();
 
@@ -64,6 +66,8 @@ void writeFile(const std::string &path, const std::string &content);
 struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Waits until a shell command succeeds, for two minutes at most.
+bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.
 std::string query(const std::string &sql);
 // Waits until all detached children of this process have ended.

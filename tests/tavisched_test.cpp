@@ -273,15 +273,19 @@ TEST_F(CommandLine, ChangesFollowOneAnother) {
     shell(
         "mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
         "printf '#!/bin/sh\n/usr/tavi/bin/tavisched disable 2 >> /tmp/inner 2>&1\n"
-        "/usr/tavi/bin/tavisched run 3 --wait >> /tmp/inner\nsleep 0.3\n' > nest; chmod 755 nest");
+        "/usr/tavi/bin/tavisched run 3 --wait >> /tmp/inner\nuntil [ -e /tmp/sent ]; do sleep 0.01; done\n' > nest; "
+        "chmod 755 nest");
     done("add --command '/usr/tavi/bin/tavisched list >> /tmp/inner'");
     // A handler may read; its own change is refused at once. What a signal ends is whole.
+    shell("touch /tmp/sent");
     done("edit 1 --at 05:00");
     EXPECT_THAT(readFile("/tmp/inner"),
                 AllOf(HasSubstr("a change is going on in process"), HasSubstr("daily 0")));
-    EXPECT_EQ(shell("/usr/tavi/bin/tavisched edit 1 --at 06:00 > /tmp/out & sleep 0.2; "
-                    "kill -TERM $!; wait $!"),
-              128 + SIGTERM);
+    EXPECT_EQ(
+        shell(
+            "rm /tmp/sent /tmp/inner; /usr/tavi/bin/tavisched edit 1 --at 06:00 > /tmp/out & "
+            "until [ -s /tmp/inner ]; do sleep 0.01; done; kill -TERM $!; touch /tmp/sent; wait $!"),
+        128 + SIGTERM);
     EXPECT_THAT(done("list"), HasSubstr("daily 05:00"));
     // A reader that goes away ends nothing half done.
     shell("rm -r /usr/tavi/etc/plugins; /usr/tavi/bin/tavisched disable 1 2 | true");
@@ -533,8 +537,9 @@ TEST_F(CommandLine, FitsTheTerminal) {
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     const auto widest = [&](int columns) {
         const std::string width = std::to_string(columns);
-        shell("script -qec 'stty cols " + width +
-              "; TERM=dumb /usr/tavi/bin/tavisched list' /dev/null | tr -d '\\r' | sed 's/…/./g' > /tmp/out");
+        shell(
+            "script -qec 'stty cols " + width +
+            "; TERM=dumb /usr/tavi/bin/tavisched list' /dev/null | tr -d '\\r' | sed 's/…/./g' > /tmp/out");
         return shell("awk 'length > " + width + "' /tmp/out | grep -q .") == 1;
     };
     Task hidden = newTask();
@@ -683,6 +688,9 @@ TEST_F(CommandLine, TellsWhenNothingRuns) {
             const bool reports = c.listStatus != 0 || std::string(command) == "sync";
             EXPECT_EQ(status_, reports ? 1 : 0) << command << said;
         }
+        // What only one of the files has is not taken out of the crontab.
+        run("check --repair");
+        EXPECT_THAT(readFile(kCrontab), HasSubstr("id=2\n")) << c.harm;
     }
 }
 

@@ -654,11 +654,7 @@ int taviautopower_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) 
                   sched::LogText(szName).c_str());
         return -1;
     }
-    static const bool joined = [] {
-        sched::joinBatches({isTouched, describe, store, applyConfiguration, forget});
-        return true;
-    }();
-    static_cast<void>(joined);
+    sched::joinBatches({isTouched, describe, store, applyConfiguration, forget});
     *pBackend = {.id = pBackend->id,
                  .name = szName,
                  .sync = Sync,

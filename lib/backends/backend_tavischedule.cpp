@@ -92,9 +92,8 @@ struct Synced {
     int unreadable; // sections whose lines stayed as they were
 };
 
-Synced syncCrontab(unsigned int openFailure) {
+Synced syncCrontab() {
     sched::RunnerLines lines;
-    lines.openFailure = openFailure;
     int unreadable = 0;
     const int count = gatherLines(lines, unreadable);
     if (count < 0) {
@@ -112,7 +111,7 @@ Synced syncCrontab(unsigned int openFailure) {
 // A failed rewrite answers the number of tasks, not -1: the change itself is stored, and the front
 // ends take only a negative answer for a change that is not. Only the log and the error state tell.
 int SyncCrontab() {
-    const Synced synced = sched::guarded(SCHED_SITE, [] { return syncCrontab(0); }, {-1, false, 0});
+    const Synced synced = sched::guarded(SCHED_SITE, syncCrontab, {-1, false, 0});
     return synced.isWritten && synced.unreadable == 0 ? 0 : synced.count;
 }
 
@@ -194,21 +193,25 @@ bool isTouched() {
     return crontabIsStaged || sched::isAnyTaskStaged();
 }
 
-int unreadableBefore = 0; // sections that no batch can be blamed for
+sched::RunnerLines batchLines; // as they are to be, gathered from what is staged
 
-int countUnreadable() {
-    int count = 0;
-    return sched::forEachStoredTask({.onTask = [](const char *, TAVI_SCHED_TASK *) { return true; },
-                                     .onUnreadable = [&](const char *) { ++count; }}) == 0
-               ? count
-               : -1;
-}
-
+// The line of a task that cannot be read stays, which is right unless the batch has changed it.
 int describe(sched::Before &before) {
-    unreadableBefore = countUnreadable();
-    return unreadableBefore < 0 || (sched::isAnyTaskStaged() && sched::describeStaged(before) != 0)
-               ? -1
-               : 0;
+    batchLines = {};
+    batchLines.openFailure = sched::kOpenFailed;
+    int unreadable = 0;
+    if (gatherLines(batchLines, unreadable) < 0) {
+        SCHED_LOG_AT(272, "get task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+        return -1;
+    }
+    if (unreadable > 0) {
+        SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    }
+    if (std::any_of(batchLines.unreadable.begin(), batchLines.unreadable.end(),
+                    sched::isTaskStaged)) {
+        return -1;
+    }
+    return sched::isAnyTaskStaged() ? sched::describeStaged(before) : 0;
 }
 
 int store() {
@@ -218,14 +221,18 @@ int store() {
 // Unlike outside of a batch, a crontab that cannot be written is a failure.
 int apply() {
     sched::forgetStaged();
-    const Synced synced =
-        sched::guarded(SCHED_SITE, [] { return syncCrontab(sched::kOpenFailed); }, {-1, false, 0});
-    return synced.isWritten && synced.unreadable <= unreadableBefore ? 0 : -1;
+    const int written =
+        sched::guarded(SCHED_SITE, [] { return sched::rewriteCrontab(batchLines); });
+    if (written != 0) {
+        SCHED_LOG_AT(280, "sync task list failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
+    }
+    return written;
 }
 
 void forget() {
     sched::forgetStaged();
     crontabIsStaged = false;
+    batchLines = {};
 }
 
 // ---- New tasks ----
@@ -298,11 +305,7 @@ int tavischedule_init(const char *szName, TAVI_SCHED_BACKEND_RECORD *pBackend) {
                      LogText(szName).c_str());
         return -1;
     }
-    static const bool joined = [] {
-        sched::joinBatches({isTouched, describe, store, apply, forget});
-        return true;
-    }();
-    static_cast<void>(joined);
+    sched::joinBatches({isTouched, describe, store, apply, forget});
     // There is no owns_id: every look-up by id asks this backend.
     *pBackend = {.id = pBackend->id,
                  .name = szName,

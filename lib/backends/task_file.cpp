@@ -561,6 +561,10 @@ int setTaskSection(int32_t id, const TAVI_SCHED_TASK *task) {
         -1);
 }
 
+bool isTaskStaged(const std::string &section) {
+    return staged.find(section) != nullptr;
+}
+
 bool isAnyTaskStaged() {
     return staged.any();
 }

@@ -44,6 +44,8 @@ int setTaskSection(int32_t id, const TAVI_SCHED_TASK *task);
 
 // The schedule backend's part in a batch but for the crontab.
 bool isAnyTaskStaged();
+// The batch stores the section.
+bool isTaskStaged(const std::string &section);
 int describeStaged(Before &before);
 int storeStaged();
 void forgetStaged();

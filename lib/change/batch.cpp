@@ -4,6 +4,7 @@
 #include "sched_backend.h"
 #include "sched_guard.h"
 
+#include <algorithm>
 #include <array>
 #include <memory>
 #include <pthread.h>
@@ -99,7 +100,11 @@ void dropOpenBatch() {
 } // namespace
 
 void sched::joinBatches(const BatchPart &part) {
-    if (partCount < allParts.size()) {
+    const auto joined = parts();
+    const bool isNew = std::none_of(joined.begin(), joined.end(), [&](const BatchPart &other) {
+        return other.store == part.store;
+    });
+    if (isNew && partCount < allParts.size()) {
         allParts[partCount++] = part;
     }
 }

@@ -16,7 +16,7 @@ struct BatchPart {
     void (*forget)();                // drops what was staged
 };
 
-// To be called once by each backend.
+// Each backend takes part; once is enough.
 void joinBatches(const BatchPart &part);
 
 // A batch of this process goes on.

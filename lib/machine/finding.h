@@ -12,7 +12,7 @@ struct Finding {
     std::string what;
     std::string advice;
     std::function<bool()> repair = nullptr; // empty when it is not safe without a person
-    std::string repaired = "";              // what the repair has done
+    std::string repaired{};                 // what the repair has done
     bool isNote = false;                    // nothing is wrong yet
 };
 

@@ -10,7 +10,11 @@ _tavisched() {
     fi
     for word in "${COMP_WORDS[@]:1:COMP_CWORD-1}"; do
         if [[ $word != -* ]]; then
-            command=$word
+            case $word in
+            ls) command=list ;;
+            rm) command=remove ;;
+            *) command=$word ;;
+            esac
             break
         fi
     done
@@ -23,17 +27,17 @@ _tavisched() {
     --weekly)
         compopt -o nospace 2>/dev/null # a comma and another day may follow
         head=${cur%"${cur##*,}"}
-        mapfile -t COMPREPLY < <(compgen -P "$head" -W 'Sun Mon Tue Wed Thu Fri Sat' -- "${cur##*,}")
+        mapfile -t COMPREPLY < <(compgen -P "$head" -W 'Sun Mon Tue Wed Thu Fri Sat weekdays weekend daily' -- "${cur##*,}")
         return
         ;;
-    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit) return ;;
+    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit | --next) return ;;
     *)
         case $command in
         '')
             options='--version --verbose'
             words='list show history export add edit enable disable remove import run sync check'
             ;;
-        list) options='--all --sort --reverse --json' ;;
+        list) options='--all --failed --owner --next --sort --reverse --json' ;;
         show) options='--json' ;;
         history) options='--limit --json' ;;
         add | edit)
@@ -41,10 +45,14 @@ _tavisched() {
                 --owner --app --enabled --disabled --allow-overlap --no-overlap --power --quiet'
             [[ $command == edit ]] || options+=' --dry-run'
             ;;
+        export) options='--web' ;;
         remove) options='--yes' ;;
         run) options='--wait' ;;
         check) options='--repair' ;;
-        import) [[ $cur == -* ]] || compopt -o default 2>/dev/null ;; # names of files
+        import)
+            options='--replace --dry-run'
+            [[ $cur == -* ]] || compopt -o default 2>/dev/null # names of files
+            ;;
         esac
         case $command in
         show | history | export | edit | enable | disable | remove | run)

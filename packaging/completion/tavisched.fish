@@ -19,16 +19,20 @@ complete -c tavisched -n __fish_use_subcommand -a run -d 'Run tasks now'
 complete -c tavisched -n __fish_use_subcommand -a sync -d 'Write the lines of /etc/crontab anew'
 complete -c tavisched -n __fish_use_subcommand -a check -d 'Look for what is wrong with this machine'
 
-complete -c tavisched -n '__fish_seen_subcommand_from show history export edit enable disable remove run' \
+complete -c tavisched -n '__fish_seen_subcommand_from show history export edit enable disable remove rm run' \
     -k -a '(tavisched complete-ids 2>/dev/null)'
 complete -c tavisched -n '__fish_seen_subcommand_from import' -F
 
 complete -c tavisched -n '__fish_seen_subcommand_from list' -l all -d 'Also those that are not listable'
+complete -c tavisched -n '__fish_seen_subcommand_from list' -l failed -d 'Only those whose last run failed'
+complete -c tavisched -n '__fish_seen_subcommand_from list' -l owner -d 'Only those of this user' \
+    -x -a '(__fish_complete_users)'
+complete -c tavisched -n '__fish_seen_subcommand_from list' -l next -x -d 'Only those that run within this time, 24h'
 complete -c tavisched -n '__fish_seen_subcommand_from list' -l sort -d 'Field to sort by' \
     -x -a 'id name state schedule next owner last'
 complete -c tavisched -n '__fish_seen_subcommand_from list' -l reverse -d 'The other way round'
-complete -c tavisched -n '__fish_seen_subcommand_from list history' -l json -d 'As JSON for scripts'
-complete -c tavisched -n '__fish_seen_subcommand_from show' -l json -d 'As the web back end exchanges it'
+complete -c tavisched -n '__fish_seen_subcommand_from list show history' -l json -d 'As JSON for scripts'
+complete -c tavisched -n '__fish_seen_subcommand_from export' -l web -d 'As the web back end exchanges them'
 complete -c tavisched -n '__fish_seen_subcommand_from history' -l limit -x -d 'At most so many'
 
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l name -x -d 'What the task is called'
@@ -36,7 +40,7 @@ complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l command -x -d
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l at -x -d 'Time of the day, HH:MM'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l daily -d 'Every day'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l weekly -d 'These days of the week' \
-    -x -a '(__fish_append , Sun Mon Tue Wed Thu Fri Sat)'
+    -x -a '(__fish_append , Sun Mon Tue Wed Thu Fri Sat weekdays weekend daily)'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l monthly -x -d 'This day of the month'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l yearly -x -d 'This day of the year, MM-DD'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l once -x -d 'This day alone, YYYY-MM-DD'
@@ -51,8 +55,10 @@ complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l allow-overlap
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l no-overlap -d 'Wait for an earlier run'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l power -d 'Switch the machine on or off' -x -a 'on off'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -s q -l quiet -d 'Print the id alone'
-complete -c tavisched -n '__fish_seen_subcommand_from add' -l dry-run -d 'Show crontab line and next run, store nothing'
+complete -c tavisched -n '__fish_seen_subcommand_from add' -l dry-run -d 'Show what would come of it, store nothing'
+complete -c tavisched -n '__fish_seen_subcommand_from import' -l replace -d 'Overwrite tasks of the same id and name'
+complete -c tavisched -n '__fish_seen_subcommand_from import' -l dry-run -d 'Show what would come of it, store nothing'
 
 complete -c tavisched -n '__fish_seen_subcommand_from remove' -s y -l yes -d 'Do not ask'
 complete -c tavisched -n '__fish_seen_subcommand_from run' -l wait -d 'Wait for the end'
-complete -c tavisched -n '__fish_seen_subcommand_from check' -l repair -d 'Mend what is safe to mend'
+complete -c tavisched -n '__fish_seen_subcommand_from check' -l repair -d 'Repair what needs no person'

@@ -68,8 +68,8 @@ PLATC_API int TAVIAutoPowerConfSet(int kind, int count, const TAVIAUTOPOWER *rgE
  * but no clock that can. */
 PLATC_API int TAVIAutoPoweronSet(void);
 
-/* Whether the machine has a clock that can switch it on: 0, or -1 with the reason in the buffer (error
- * state untouched). */
+/* Whether the machine has a clock that can switch it on: 0, or -1 with the reason in the buffer
+ * (error state untouched). */
 PLATC_API int TAVIAutoPoweronCheck(char *szReason, size_t cbReason);
 
 /* A program that cron runs as root. */

@@ -27,8 +27,8 @@ namespace {
 constexpr const char *kPluginRoot = "/usr/tavi/etc/plugins";
 
 void logSkipped(const char *what, const std::filesystem::path &path, const char *kind) {
-    PLATFORM_LOG("plug-in %s %s skipped: it must be a %s of root's that nobody else may write", what,
-                 path.c_str(), kind);
+    PLATFORM_LOG("plug-in %s %s skipped: it must be a %s of root's that nobody else may write",
+                 what, path.c_str(), kind);
 }
 
 int failToRead(const std::filesystem::path &path, const char *why) {

@@ -30,23 +30,17 @@ int history(std::optional<int32_t> id, size_t limit, bool json) {
     const std::vector<Run> runs = readRuns(id, limit);
     Tasks tasks;
     Task one;
-    TaskPointers shown;
-    if (!id) {
-        tasks = Tasks::read();
-        shown = tasks.all();
-    } else if (runs.empty()) {
+    if (id && runs.empty()) {
         one = readTask(*id); // refused when there is no such task
-        shown = {one.get()};
     } else {
         tasks = Tasks::read();
-        shown = tasks.all();
     }
     if (runs.empty() && !json) {
         std::printf("%s since the machine was started.\n",
                     one ? (called(*one) + " has not run").c_str() : "There were no runs");
         return 0;
     }
-    return printRuns(runs, shown, json);
+    return printRuns(runs, tasks.all(), json);
 }
 
 } // namespace tavisched

@@ -52,7 +52,8 @@ PLATCSZHASH *readSection(const char *path, const char *section, Hash &hash, int 
 }
 
 // Fills the task from its section; a failure is logged.
-bool readTask(const char *path, const char *section, Hash &hash, TAVI_SCHED_TASK &task) {
+bool readTask(const char *path, const char *section, Hash &hash, TAVI_SCHED_TASK &task,
+              bool withTime) {
     int found = 0;
     PLATCSZHASH *const form = readSection(path, section, hash, found);
     if (!form) {
@@ -64,7 +65,7 @@ bool readTask(const char *path, const char *section, Hash &hash, TAVI_SCHED_TASK
         SCHED_LOG_AT(60, "Init task from hash failed. [0x%04X %s:%d]", SCHED_LAST_ERROR);
         return false;
     }
-    if (TAVISchedNextTriggerTime(&task) != 0) {
+    if (withTime && TAVISchedNextTriggerTime(&task) != 0) {
         SCHED_LOG_AT(65, "Failed to obtain next trigger time. id:[%ld]. [0x%04X %s:%d]",
                      static_cast<long>(task.id), SCHED_LAST_ERROR);
         return false;
@@ -131,7 +132,7 @@ int pass(const sched::TaskPass &how) {
             return -1;
         }
         makeFresh(*task);
-        if (!readTask(reading.path(), name.c_str(), hash, *task)) {
+        if (!readTask(reading.path(), name.c_str(), hash, *task, how.fresh)) {
             *task = {}; // what it has of this section is nobody's
             how.onUnreadable(name.c_str());
         } else if (!how.onTask(name.c_str(), how.fresh ? task.release() : task.get())) {

@@ -391,8 +391,9 @@ TAVI_SCHED_API int TAVISchedTaskListSort(TAVI_SCHED_TASK **pTaskList, const char
 TAVI_SCHED_API int TAVISchedTaskRun(int32_t id, int32_t mode, int32_t enabledOnly);
 /* The same, for callers that follow the run. `pPid` is given the id of the child, which the run's
  * row bears, and `pEnd` a descriptor that reads end-of-file once the run has ended and its result
- * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes it.
- * What the command left behind may keep the child longer. Both are -1 when the task was skipped. */
+ * is stored, also when it recorded nothing; the caller waits for it with read or poll and closes
+ * it. What the command left behind may keep the child longer. Both are -1 when the task was
+ * skipped. */
 TAVI_SCHED_API int TAVISchedTaskRunFollowed(int32_t id, int32_t mode, int32_t enabledOnly,
                                             int32_t *pPid, int *pEnd);
 
@@ -465,9 +466,6 @@ TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
 /* The same for the newest run of every task that has one, in the order of their ids. */
 TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
                                              void *pContext);
-/* When the run of a row ended (seconds since the epoch): 1 known, 0 it goes on or that is not
- * known, -1. */
-TAVI_SCHED_API int TAVISchedDBGetEnd(struct sqlite3 *db, int32_t statusId, int32_t *pTimestamp);
 
 /* ---- Records of runs: what a run did, beyond the machine's next start ----
  *

@@ -466,9 +466,6 @@ TAVI_SCHED_API int TAVISchedDBListStatus(struct sqlite3 *db, int32_t taskId,
 /* The same for the newest run of every task that has one, in the order of their ids. */
 TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STATUS_READER reader,
                                              void *pContext);
-/* When the run of a row ended (seconds since the epoch): 1 known, 0 it goes on or that is not
- * known, -1. */
-TAVI_SCHED_API int TAVISchedDBGetEnd(struct sqlite3 *db, int32_t statusId, int32_t *pTimestamp);
 
 /* ---- Records of runs: what a run did, beyond the machine's next start ----
  *

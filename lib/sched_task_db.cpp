@@ -5,7 +5,6 @@
 #include "sched_error.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
-#include "sched_run_end.h"
 #include "sched_shared_file.h"
 #include "sched_text.h"
 #include "tavischeduler.h"
@@ -29,9 +28,6 @@ using sched::SqlText;
 constexpr const char *kCreateTable =
     "CREATE TABLE if not exists task_status(status_id INTEGER PRIMARY KEY ASC, pid INTEGER, "
     "timestamp INTEGER, app STRING, task_id INTEGER, status_code INTEGER, comment STRING);";
-// When runs ended: a table of its own, as others read the first one by its columns.
-constexpr const char *kCreateEnds = "CREATE TABLE if not exists task_status_end(status_id INTEGER "
-                                    "PRIMARY KEY, timestamp INTEGER);";
 // Keeps the journal's file, which is claimed beside the database, in place.
 constexpr const char *kKeepJournal = "PRAGMA journal_mode=TRUNCATE;";
 constexpr int kMaxRetries = 100;
@@ -332,31 +328,6 @@ int TAVISchedDBSetStatus(sqlite3 *db, int32_t statusId, int32_t orgStatusCode,
         return -1;
     }
     return execute(db, sql.c_str());
-}
-
-int sched::recordEnd(sqlite3 *db, int32_t statusId) {
-    return execute(db, kCreateEnds) != 0
-               ? -1
-               : executeBuilt(db, format("INSERT OR REPLACE INTO task_status_end VALUES (%d, %ld);",
-                                         statusId, static_cast<long>(std::time(nullptr))));
-}
-
-// Before the first run has ended there is no table, which is no failure.
-int TAVISchedDBGetEnd(sqlite3 *db, int32_t statusId, int32_t *pTimestamp) {
-    SCHED_REQUIRE(db, "((void *)0) != db", -1);
-    SCHED_REQUIRE(pTimestamp, "((void *)0) != pTimestamp", -1);
-    TAVI_SCHED_STATUS table{};
-    TAVI_SCHED_STATUS end{};
-    if (execute(db, "SELECT 1 FROM sqlite_master WHERE name = 'task_status_end'", readFirstRow,
-                &table) != 0 ||
-        (table.found != 0 &&
-         executeBuilt(
-             db, format("SELECT timestamp FROM task_status_end WHERE status_id = %d", statusId),
-             readFirstRow, &end) != 0)) {
-        return -1;
-    }
-    *pTimestamp = end.timestamp;
-    return end.found;
 }
 
 int TAVISchedDBGetStatusByTaskID(sqlite3 *db, int32_t taskId, int32_t *pTimestamp,

@@ -10,7 +10,6 @@
 #include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
-#include "sched_run_end.h"
 #include "sched_shared_file.h"
 #include "tavischeduler.h"
 #include "tavisdk.h"
@@ -360,7 +359,6 @@ class TaskRun {
             SCHED_LOG("Update status record failed. id:[%ld][0x%04X %s:%d]", id(),
                       SCHED_LAST_ERROR);
         }
-        sched::recordEnd(database_.get(), statusId_);
     }
 
     TAVI_SCHED_TASK &task_;

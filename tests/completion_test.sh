@@ -37,7 +37,7 @@ while IFS=: read -r line words; do # what is typed, and what the last word may b
     completion=$(completed tavisched $line | xargs)
     [ "$completion" = "$words" ] || { echo "bash completes $line to: $completion"; status=1; }
 done << 'END'
-s:show sync
+s:show stop sync
 add --name list --d:--daily --disabled --dry-run
 add --weekly Mon,T:Mon,Tue Mon,Thu
 --verbose remove 2 1:1 12

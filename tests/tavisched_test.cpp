@@ -2,6 +2,7 @@
 #include "support.h"
 
 #include <csignal>
+#include <sqlite3.h>
 #include <sys/prctl.h>
 
 namespace {
@@ -117,6 +118,13 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"edit 4 --at 08:00", "task 4 (Task 4) is kept under another number"},
         {"remove 01x --yes", "\"01x\" is no id; accepted"},
         {"history --limit 0", "--limit: Value 0 not in range"},
+        {"history --since 2026-02-30", "--since: \"2026-02-30\" is not accepted; accepted: a time"},
+        {"log 9", "there is no task 9"},
+        {"log 1 --run 7", "task 1 has no run 7; \"tavisched history 1\" lists its runs"},
+        {"log 1 --run=-1", "task 1 has no run -1"},
+        {"log 1 --run 1x", "\"1x\" is no run"},
+        {"stop 1", "task 1 (Task 1) is not running"},
+        {"stop 1 --after -1", "--after: Value -1 not in range"},
         {"frobnicate", "there is no command \"frobnicate\"\n\"tavisched --help\""},
         {"lsit 3", "there is no command \"lsit\"; did you mean \"list\"?"},
         {"add --nmae foo --bar",
@@ -321,11 +329,13 @@ TEST_F(CommandLine, ShowsTasksForScripts) {
           "\"nextRun\": null,", "\"owner\": \"bin\",", "\"ownerId\": 2,",
           "\"schedule\": \"Mon 05:00\",", "\"state\": \"disabled\",", "\"type\": \"weekly\"",
           "\"nextRun\": \"2099-12-24 00:00\",", "\"result\": \"exit 3\",", "\"statusCode\": 7,",
-          "\"comment\": \"3\","}) {
+          "\"number\": 3,"}) {
         EXPECT_THAT(json, HasSubstr(member));
     }
     EXPECT_LT(json.find("\"b\""), json.find("\"A\""));
-    EXPECT_THAT(done("history 2 --json"), HasSubstr("\"task\": 2"));
+    EXPECT_THAT(done("history 2 --json"),
+                testing::MatchesRegex(
+                    "\\{.*\"asked\": ?\"....-..-..T..:..:..[+-]..:..\".*\"task\": ?2,.*\\}\n"));
     EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
     // What the web back end exchanges can be saved as it is.
     EXPECT_EQ(TAVISchedTaskSaveFromJson(done("export --web 2 | sed '1d;$d'").c_str(), 0), 2);
@@ -486,32 +496,41 @@ TEST_F(CommandLine, RunsNowAndFollows) {
     EXPECT_EQ(done("run 1"), "task 1 (Task 1): started\n");
     EXPECT_THAT(
         done("history 3"),
-        testing::ContainsRegex("3  Task 3  2[-: 0-9]+  2[-: 0-9]+  0 s  killed by signal 9 "));
-    EXPECT_THAT(done("show 3"), testing::ContainsRegex("PID\n3  Task 3 .*\n3  Task 3 .*[0-9]\n$"));
-    EXPECT_EQ(done("history 6"), "task 6 (Task 6) has not run since the machine was started.\n");
+        testing::ContainsRegex(
+            "\n6  3  Task 3  2[-: 0-9]+  2[-: 0-9]+  0 s  -  [a-z]+  killed by signal 9\n"));
+    EXPECT_THAT(done("show 3"),
+                testing::ContainsRegex("RESULT\n6  3  Task 3 .*\n3  3  Task 3 .* 9\n$"));
+    EXPECT_EQ(done("history 6"), "There are no runs of task 6 (Task 6) on record.\n");
     EXPECT_THAT(done("history --limit 1 --json"), HasSubstr("\"statusCode\""));
     shell("pkill -x sleep");
 }
 
 TEST_F(CommandLine, TellsHowRunsEnded) {
     const time_t now = time(nullptr);
-    const auto row = [&](int task, int age, int pid, int code, const char *comment) {
-        query(
-            "INSERT INTO task_status (pid, timestamp, task_id, app, status_code, comment) VALUES (" +
-            std::to_string(pid) + "," + std::to_string(now - age) + "," + std::to_string(task) +
-            ",''," + std::to_string(code) + ",'" + comment + "')");
-    };
     for (int i = 0; i < 5; ++i) {
         done("add --command x");
     }
-    row(1, 7300, 1, 3, "");
-    row(2, 200, 1, 7, "2");
-    row(2, 99999, 1, 3, "");
-    row(3, 5, getpid(), 2, "");
-    row(4, 400, 999999, 2, "");
-    row(5, 50L * 3600, 1, 6, "9");
-    row(6, 5, 999999, 2, "");
-    row(7, 5, 1, 3, "");
+    run("run 3 --wait"); // makes the database
+    EXPECT_EQ(status_, 127);
+    std::string rows;
+    const auto row = [&](int task, int age, int result, int number) {
+        const std::string asked = std::to_string((now - age) * 1000L);
+        rows += "INSERT INTO runs SELECT 1+max(run)," + std::to_string(task) + ",0,0,0," +
+                std::to_string(result) + "," + std::to_string(number) + ",0," + asked + "," +
+                (result < 32 ? asked : "0") + ",0,0," + asked + ",0,9,0,1,0,'','x' FROM runs;";
+    };
+    row(1, 7300, 3, 0);
+    row(2, 200, 7, 2);
+    row(2, 99999, 34, 0);
+    row(3, -5, 40, 0);
+    row(4, 400, 2, 0);
+    row(5, 50 * 3600, 6, 9);
+    row(6, 5, 37, 0);
+    row(7, 5, 3, 0);
+    sqlite3 *database = nullptr;
+    ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(database, rows.c_str(), nullptr, nullptr, nullptr), SQLITE_OK);
+    sqlite3_close(database);
     shell("useradd ghost 2>/dev/null; echo ghost:x:4242:4242::/:/bin/sh >> /etc/passwd");
     done("add --command x --owner ghost");
     shell("sed -i /^ghost:/d /etc/passwd");
@@ -521,14 +540,59 @@ TEST_F(CommandLine, TellsHowRunsEnded) {
           "/usr/tavi/etc/scheduled_tasks");
     const std::string list = done("list");
     for (const char *const words :
-         {" 1 .* ok 2 h ago\n", " 2 .* exit 2 3 min ago\n", " 3 .* running\n",
-          " 4 .* interrupted 6 min ago\n", " 5 .* killed by signal 9 [23] days ago\n",
+         {" 1 .* ok 2 h ago\n", " 2 .* failed: exit 2 3 min ago\n", " 3 .*  missed just now\n",
+          " 4 .* failed: interrupted 6 min ago\n", " 5 .* killed by signal 9 [23] days ago\n",
           "6 .* not started: no such user just now\n", "7  Task 7  done  once on 2020"}) {
         EXPECT_THAT(list, testing::ContainsRegex(words));
     }
-    EXPECT_THAT(done("list --sort last"),
-                testing::ContainsRegex("running.*\n.*exit 2.*\n.*interr"));
-    EXPECT_THAT(done("history 2"), testing::ContainsRegex("exit 2 .*\n *2 .* ok "));
+    EXPECT_THAT(done("list --sort last"), testing::ContainsRegex("missed.*\n.*exit 2.*\n.*interr"));
+    const struct {
+        const char *options, *results;
+    } kCases[] = {
+        {"2", "exit 2, given up, task 9 was running, "},
+        {"2 --since 24h", "exit 2, "},
+        {"1 --since 2020-01-01", "ok, "},
+        {"--failed --limit 2", "missed, not started: no such user, "},
+        {"1 --failed", "There are no such runs of task 1 (Task 1) on record., "},
+    };
+    for (const auto &c : kCases) {
+        EXPECT_EQ(done("history " + std::string(c.options) +
+                       " | sed '/RESULT/d; s/.*  //' | sed 's/$/, /' | tr -d '\\n'"),
+                  std::string(c.results))
+            << c.options;
+    }
+}
+
+// Outputs, stopping and waiting, with real commands.
+TEST_F(CommandLine, ShowsOutputsAndStops) {
+    done("add --command \"printf 'a\\tb\\033[2J\\377'; echo err >&2; head -c 200000 /dev/zero\"");
+    done("add --command 'echo up; sleep 1000' --app x");
+    done("add --command 'echo two' --app x");
+    EXPECT_THAT(done("run 1 --wait"), AllOf(HasSubstr("a\tb\033[2J\377err\n"),
+                                            HasSubstr("[... 68942 bytes cut out ...]")));
+    EXPECT_EQ(done("log 1 2> /dev/null | wc -c"), "131072\n");
+    shell(
+        "script -qec '/usr/tavi/bin/tavisched log 1' /dev/null < /dev/null | head -c 30 > /tmp/out");
+    EXPECT_THAT(readFile("/tmp/out"), HasSubstr("a\tb\\u001b[2J\uFFFDerr\r\n"));
+    // Interrupted, it leaves the run alone.
+    shell("setsid sh -c 'exec /usr/tavi/bin/tavisched run 2 --wait' > /tmp/wait 2>&1 & pid=$!; "
+          "until grep -q up /tmp/wait; do sleep 0.1; done; kill -INT $pid; wait $pid; "
+          "echo $? >> /tmp/wait");
+    EXPECT_THAT(readFile("/tmp/wait"), HasSubstr("goes on (\"tavisched stop\" ends it)\n130\n"));
+    done("run 3");
+    EXPECT_TRUE(waitFor("/usr/tavi/bin/tavisched list | grep '^ *3 .*waiting for task 2 since'"));
+    shell("/usr/tavi/bin/tavisched log 2 --follow > /tmp/followed & echo $! > /tmp/pid");
+    EXPECT_THAT(done("stop 2 3 --after 1"), HasSubstr("(Task 2), run 2: asked to end; what"));
+    EXPECT_TRUE(waitFor("! kill -0 $(cat /tmp/pid)"));
+    EXPECT_EQ(readFile("/tmp/followed"), "up\n");
+    EXPECT_TRUE(waitFor("/usr/tavi/bin/tavisched history 3 | grep 'stopped by a person'"));
+    EXPECT_THAT(done("history 2"), HasSubstr("stopped by a person"));
+    EXPECT_THAT(run("stop 3 2"), HasSubstr("task 3 (Task 3) is not running"));
+    EXPECT_THAT(run("log 3"), HasSubstr("that printed anything"));
+    EXPECT_EQ(status_, 1);
+    shell("rm /var/lib/tavischeduler/*/*");
+    EXPECT_THAT(run("log 2 --run 2"), HasSubstr("the output of run 2 is no longer kept"));
+    EXPECT_EQ(status_, 1);
 }
 
 TEST_F(CommandLine, FitsTheTerminal) {

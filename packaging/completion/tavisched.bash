@@ -30,16 +30,17 @@ _tavisched() {
         mapfile -t COMPREPLY < <(compgen -P "$head" -W 'Sun Mon Tue Wed Thu Fri Sat weekdays weekend daily' -- "${cur##*,}")
         return
         ;;
-    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit | --next) return ;;
+    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit | --next | --since | --run | --after) return ;;
     *)
         case $command in
         '')
             options='--version --verbose'
-            words='list show history export add edit enable disable remove import run sync check'
+            words='list show history log export add edit enable disable remove import run stop sync check'
             ;;
         list) options='--all --failed --owner --next --sort --reverse --json' ;;
         show) options='--json' ;;
-        history) options='--limit --json' ;;
+        history) options='--failed --since --limit --json' ;;
+        log) options='--run --follow' ;;
         add | edit)
             options='--name --command --at --daily --weekly --monthly --yearly --once --every --until
                 --owner --app --enabled --disabled --allow-overlap --no-overlap --power --quiet'
@@ -48,6 +49,7 @@ _tavisched() {
         export) options='--web' ;;
         remove) options='--yes' ;;
         run) options='--wait' ;;
+        stop) options='--after' ;;
         check) options='--repair' ;;
         import)
             options='--replace --dry-run'
@@ -55,7 +57,7 @@ _tavisched() {
             ;;
         esac
         case $command in
-        show | history | export | edit | enable | disable | remove | run)
+        show | history | log | export | edit | enable | disable | remove | run | stop)
             words=$(tavisched complete-ids 2>/dev/null | cut -f 1)
             ;;
         esac

@@ -7,7 +7,8 @@ complete -c tavisched -n __fish_use_subcommand -s v -l verbose -d 'Show the libr
 
 complete -c tavisched -n __fish_use_subcommand -a list -d 'Show the tasks'
 complete -c tavisched -n __fish_use_subcommand -a show -d 'Show every field of a task'
-complete -c tavisched -n __fish_use_subcommand -a history -d 'Show how runs ended'
+complete -c tavisched -n __fish_use_subcommand -a history -d 'Show what runs did'
+complete -c tavisched -n __fish_use_subcommand -a log -d 'Show what the last run printed'
 complete -c tavisched -n __fish_use_subcommand -a export -d 'Write tasks as a JSON array'
 complete -c tavisched -n __fish_use_subcommand -a add -d 'Store a new task'
 complete -c tavisched -n __fish_use_subcommand -a edit -d 'Change a task'
@@ -16,10 +17,11 @@ complete -c tavisched -n __fish_use_subcommand -a disable -d 'Keep tasks without
 complete -c tavisched -n __fish_use_subcommand -a remove -d 'Remove tasks'
 complete -c tavisched -n __fish_use_subcommand -a import -d 'Store the tasks of a JSON array'
 complete -c tavisched -n __fish_use_subcommand -a run -d 'Run tasks now'
+complete -c tavisched -n __fish_use_subcommand -a stop -d 'End running tasks'
 complete -c tavisched -n __fish_use_subcommand -a sync -d 'Write the lines of /etc/crontab anew'
 complete -c tavisched -n __fish_use_subcommand -a check -d 'Look for what is wrong with this machine'
 
-complete -c tavisched -n '__fish_seen_subcommand_from show history export edit enable disable remove rm run' \
+complete -c tavisched -n '__fish_seen_subcommand_from show history log export edit enable disable remove rm run stop' \
     -k -a '(tavisched complete-ids 2>/dev/null)'
 complete -c tavisched -n '__fish_seen_subcommand_from import' -F
 
@@ -34,6 +36,10 @@ complete -c tavisched -n '__fish_seen_subcommand_from list' -l reverse -d 'The o
 complete -c tavisched -n '__fish_seen_subcommand_from list show history' -l json -d 'As JSON for scripts'
 complete -c tavisched -n '__fish_seen_subcommand_from export' -l web -d 'As the web back end exchanges them'
 complete -c tavisched -n '__fish_seen_subcommand_from history' -l limit -x -d 'At most so many'
+complete -c tavisched -n '__fish_seen_subcommand_from history' -l failed -d 'Only those without a good end'
+complete -c tavisched -n '__fish_seen_subcommand_from history' -l since -x -d 'Only those since then, 7d or YYYY-MM-DD'
+complete -c tavisched -n '__fish_seen_subcommand_from log' -l run -x -d 'That run instead of the last one'
+complete -c tavisched -n '__fish_seen_subcommand_from log' -l follow -d 'Go on until the run ends'
 
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l name -x -d 'What the task is called'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l command -x -d 'Shell command to run'
@@ -61,4 +67,5 @@ complete -c tavisched -n '__fish_seen_subcommand_from import' -l dry-run -d 'Sho
 
 complete -c tavisched -n '__fish_seen_subcommand_from remove' -s y -l yes -d 'Do not ask'
 complete -c tavisched -n '__fish_seen_subcommand_from run' -l wait -d 'Wait for the end'
+complete -c tavisched -n '__fish_seen_subcommand_from stop' -l after -x -d 'Kill what is left after so many seconds'
 complete -c tavisched -n '__fish_seen_subcommand_from check' -l repair -d 'Repair what needs no person'

@@ -11,7 +11,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <functional>
-#include <limits>
+#include <optional>
 #include <string>
 #include <sys/stat.h>
 #include <syslog.h>
@@ -37,15 +37,25 @@ CLI::App *subcommand(CLI::App &app, Command &command, const char *name, const ch
 
 // ---- Options of several subcommands ----
 
-// An id as it was typed; digits alone, as lists show it.
-int32_t parseId(const std::string &text) {
-    int32_t id = 0;
-    const auto parsed = std::from_chars(text.data(), text.data() + text.size(), id);
+// A number as it was typed; digits alone, as lists show it.
+template <typename Number>
+Number parseNumber(const std::string &text, const char *what, const char *command) {
+    Number number = 0;
+    const auto parsed = std::from_chars(text.data(), text.data() + text.size(), number);
     if (parsed.ec != std::errc() || parsed.ptr != text.data() + text.size()) {
-        throw Refusal("\"" + printable(text) + "\" is no id; accepted: a number as \"tavisched " +
-                      "list\" shows it");
+        throw Refusal("\"" + printable(text) + "\" is no " + what +
+                      "; accepted: a number as \"tavisched " + command + "\" shows it");
     }
-    return id;
+    return number;
+}
+
+int32_t parseId(const std::string &text) {
+    return parseNumber<int32_t>(text, "id", "list");
+}
+
+std::optional<int64_t> parseRun(const std::string &text) {
+    return text.empty() ? std::nullopt
+                        : std::optional(parseNumber<int64_t>(text, "run", "history"));
 }
 
 Ids parseIds(const std::vector<std::string> &texts) {
@@ -94,9 +104,11 @@ struct Settings {
     ImportOptions import;
     std::vector<std::string> ids;
     std::string id;
-    int limit = std::numeric_limits<int>::max();
+    HistoryOptions history;
+    std::string run;
+    int after = 10;
     bool json = false, web = false, dryRun = false, quiet = false, yes = false, wait = false,
-         repair = false;
+         repair = false, follow = false;
 };
 
 void addListCommand(CLI::App &app, Settings &given, Command &command) {
@@ -116,6 +128,31 @@ void addListCommand(CLI::App &app, Settings &given, Command &command) {
     jsonOption(listing, given.list.json, "as JSON for scripts");
 }
 
+void addRunReadingCommands(CLI::App &app, Settings &given, Command &command) {
+    auto *const past = subcommand(app, command, "history", "show what runs did, newest first",
+                                  "tavisched history 3 --since 7d", [&] {
+                                      if (!given.ids.empty()) {
+                                          given.history.id = parseId(given.ids.front());
+                                      }
+                                      return history(given.history);
+                                  });
+    past->add_option("ID", given.ids, "id of a task; without it, of all")->expected(0, 1);
+    past->add_flag("--failed", given.history.failed, "only those without a good end");
+    past->add_option("--since", given.history.since, "only those since then")
+        ->type_name("7d|YYYY-MM-DD");
+    past->add_option("--limit", given.history.limit, "at most so many")
+        ->type_name("NUMBER")
+        ->check(CLI::Range(1, 1000000));
+    jsonOption(past, given.history.json, "as JSON for scripts, a line each");
+
+    auto *const output = subcommand(
+        app, command, "log", "show what the last run of a task printed", "tavisched log 3 --follow",
+        [&] { return log(parseId(given.id), parseRun(given.run), given.follow); });
+    output->add_option("ID", given.id, "id of the task")->required();
+    output->add_option("--run", given.run, "that run instead of the last one")->type_name("NUMBER");
+    output->add_flag("--follow", given.follow, "go on until the run ends");
+}
+
 void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
     addListCommand(app, given, command);
 
@@ -125,18 +162,7 @@ void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
     showing->add_option("ID", given.id, "id of the task")->required();
     jsonOption(showing, given.json, "as JSON for scripts");
 
-    auto *const past =
-        subcommand(app, command, "history", "show how runs ended, newest first",
-                   "tavisched history 3 --limit 10", [&] {
-                       return history(given.ids.empty() ? std::nullopt
-                                                        : std::optional(parseId(given.ids.front())),
-                                      static_cast<size_t>(given.limit), given.json);
-                   });
-    past->add_option("ID", given.ids, "id of a task; without it, of all")->expected(0, 1);
-    past->add_option("--limit", given.limit, "at most so many")
-        ->type_name("NUMBER")
-        ->check(CLI::Range(1, 1000000));
-    jsonOption(past, given.json, "as JSON for scripts");
+    addRunReadingCommands(app, given, command);
 
     auto *const exporting = subcommand(app, command, "export", "write tasks as a JSON array",
                                        "tavisched export > tasks.json",
@@ -194,7 +220,16 @@ void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
         subcommand(app, command, "run", "run tasks now, in the background",
                    "tavisched run 3 --wait", [&] { return run(parseIds(given.ids), given.wait); });
     idsOption(running, given.ids, true);
-    running->add_flag("--wait", given.wait, "wait for the end and exit with the command's result");
+    running->add_flag("--wait", given.wait,
+                      "wait for the end, show the output and exit as the command");
+
+    auto *const stopping =
+        subcommand(app, command, "stop", "end running tasks", "tavisched stop 3 --after 60",
+                   [&] { return stop(parseIds(given.ids), given.after); });
+    idsOption(stopping, given.ids, true);
+    stopping->add_option("--after", given.after, "kill what is left after so many seconds")
+        ->type_name("SECONDS")
+        ->check(CLI::Range(0, 86400));
 
     subcommand(app, command, "sync", "write the lines of /etc/crontab anew", "tavisched sync",
                [] { return syncTasks(); });

@@ -29,7 +29,15 @@ const std::vector<std::string> &sortFields();
 int list(const ListOptions &options);
 
 int show(int32_t id, bool json);
-int history(std::optional<int32_t> id, size_t limit, bool json);
+struct HistoryOptions {
+    std::optional<int32_t> id; // without it, of all tasks, removed ones too
+    std::string since;         // such as "24h" or "2026-12-24"
+    int limit = 0;             // 0 = all
+    bool failed = false;
+    bool json = false;
+};
+int history(const HistoryOptions &options);
+int log(int32_t id, std::optional<int64_t> number, bool follow);
 int exportTasks(const Ids &ids, bool web);
 
 int add(const TaskOptions &options, bool dryRun, bool quiet);
@@ -44,6 +52,7 @@ struct ImportOptions {
 int importTasks(const ImportOptions &options);
 
 int run(const Ids &ids, bool wait);
+int stop(const Ids &ids, int graceSeconds);
 int syncTasks();
 int check(bool repair);
 

@@ -1,6 +1,10 @@
-// The subcommand "history": how runs ended.
+// The subcommand "history": what runs did, and why some did not happen.
 #include "commands/commands.h"
+#include "failure.h"
 #include "tasks/runs_table.h"
+#include "tasks/tasks.h"
+#include "text/moments.h"
+#include "text/utf8.h"
 #include "json/json.h"
 #include "json/plain.h"
 
@@ -10,37 +14,40 @@ namespace tavisched {
 
 namespace {
 
-// The name of a run's task is the one that it has now; a task that was removed has none.
-int printRuns(const std::vector<Run> &runs, const TaskPointers &tasks, bool json) {
-    if (!json) {
-        printRunsTable(runs, tasks);
-        return 0;
+constexpr int64_t kSecond = 1000;
+
+int64_t sinceOf(const std::string &text) {
+    const auto moment = parseMoment(text);
+    const auto span = moment ? std::nullopt : parseSpan(text);
+    if (!moment && !span) {
+        throw Refusal("--since: \"" + printable(text) +
+                      "\" is not accepted; accepted: a time such as 30m, 24h, 7d or 2w, or a date "
+                      "such as 2026-12-24 or \"2026-12-24 18:00\"");
     }
-    Json::Value values(Json::arrayValue);
-    for (const Run &run : runs) {
-        values.append(plainRun(run, taskOf(run, tasks)));
-    }
-    printJson(values);
-    return 0;
+    return (moment ? *moment : time(nullptr) - *span) * kSecond;
 }
 
 } // namespace
 
-int history(std::optional<int32_t> id, size_t limit, bool json) {
-    const std::vector<Run> runs = readRuns(id, limit);
-    Tasks tasks;
-    Task one;
-    if (id && runs.empty()) {
-        one = readTask(*id); // refused when there is no such task
+int history(const HistoryOptions &options) {
+    TAVI_SCHED_RUN_FILTER filter = options.id ? runsOf(*options.id) : kAllRuns;
+    filter.failedOnly = options.failed ? 1 : 0;
+    filter.limit = options.limit;
+    filter.since = options.since.empty() ? 0 : sinceOf(options.since);
+    const std::vector<Run> runs = readRuns(filter);
+    const bool isNarrowed = options.failed || !options.since.empty();
+    const Task task = options.id && runs.empty() ? readTask(*options.id) : nullptr; // or refused
+    if (options.json) {
+        for (const Run &run : runs) {
+            printJsonLine(plainRun(run));
+        }
+    } else if (!runs.empty()) {
+        printRunsTable(runs);
     } else {
-        tasks = Tasks::read();
+        std::printf("There are no %sruns%s on record.\n", isNarrowed ? "such " : "",
+                    task ? (" of " + called(*task)).c_str() : "");
     }
-    if (runs.empty() && !json) {
-        std::printf("%s since the machine was started.\n",
-                    one ? (called(*one) + " has not run").c_str() : "There were no runs");
-        return 0;
-    }
-    return printRuns(runs, tasks.all(), json);
+    return 0;
 }
 
 } // namespace tavisched

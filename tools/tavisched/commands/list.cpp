@@ -3,13 +3,13 @@
 #include "failure.h"
 #include "tasks/findings.h"
 #include "tasks/runs_table.h"
+#include "text/moments.h"
 #include "text/utf8.h"
 #include "text/words.h"
 #include "json/json.h"
 #include "json/plain.h"
 
 #include <algorithm>
-#include <charconv>
 #include <cstdio>
 #include <functional>
 #include <map>
@@ -37,24 +37,12 @@ bool hasWord(const TAVI_SCHED_TASK &task, const Run *run, const std::string &wor
 
 // The end of a time such as "24h" from now, as next runs are written.
 std::string endOf(const std::string &span) {
-    constexpr struct {
-        char letter;
-        time_t seconds;
-    } kUnits[] = {{'m', 60}, {'h', 3600}, {'d', 86400}, {'w', 7 * 86400}};
-    unsigned int count = 0;
-    const char *const end = span.data() + span.size();
-    const auto parsed = std::from_chars(span.data(), end, count);
-    const auto *const unit =
-        std::find_if(std::begin(kUnits), std::end(kUnits), [&](const auto &row) {
-            return parsed.ptr + 1 == end && row.letter == *parsed.ptr;
-        });
-    constexpr unsigned int kMost = 100000;
-    if (parsed.ec != std::errc() || unit == std::end(kUnits) || count > kMost) {
+    const auto seconds = parseSpan(span);
+    if (!seconds) {
         throw Refusal("--next: \"" + printable(span) +
                       "\" is not accepted; accepted: a time such as 30m, 24h, 7d or 2w");
     }
-    return localTime(time(nullptr) + count * unit->seconds)
-        .substr(0, sizeof "YYYY-MM-DD hh:mm" - 1);
+    return localTime(time(nullptr) + *seconds).substr(0, sizeof "YYYY-MM-DD hh:mm" - 1);
 }
 
 // Whether a task is to be listed.
@@ -89,7 +77,7 @@ using Before = std::function<bool(const TAVI_SCHED_TASK &, const TAVI_SCHED_TASK
 
 time_t lastStart(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
     const Run *const run = lastRunOf(task, runs);
-    return run ? run->start : 0;
+    return run ? startOf(*run) : 0;
 }
 
 std::map<std::string, Before> orders(const LatestRuns &runs) {
@@ -127,10 +115,11 @@ void sort(TaskPointers &tasks, const ListOptions &options, const LatestRuns &run
 
 // ---- As a table ----
 
-std::string resultWithTime(const Run &run, const TAVI_SCHED_TASK &task) {
-    const std::string result = resultInWords(run, &task);
-    return run.code == SCHED_STATUS_CODE_RUNNING ? result
-                                                 : result + " " + ago(run.start, time(nullptr));
+// What needs a person says so without colours too.
+std::string resultWithTime(const Run &run) {
+    const bool isMissed = run.result == TAVI_SCHED_RUN_MISSED;
+    return (hasFailed(run) && !isMissed ? "failed: " : "") + resultInWords(run) +
+           (goesOn(run) ? "" : " " + ago(startOf(run), time(nullptr)));
 }
 
 Row rowOf(const TAVI_SCHED_TASK &task, const Run *run) {
@@ -140,7 +129,7 @@ Row rowOf(const TAVI_SCHED_TASK &task, const Run *run) {
             {scheduleInWords(task)},
             {nextRun(task).value_or("-")},
             {printable(ownerName(task.owner))},
-            run ? Cell{printable(resultWithTime(*run, task)), styleOf(*run)} : Cell{"-"}};
+            run ? Cell{printable(resultWithTime(*run)), styleOf(*run)} : Cell{"-"}};
 }
 
 void printTasks(const TaskPointers &tasks, const LatestRuns &runs) {

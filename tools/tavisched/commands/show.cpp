@@ -14,7 +14,7 @@ namespace tavisched {
 
 namespace {
 
-constexpr size_t kRuns = 5;
+constexpr int32_t kRuns = 5;
 
 void printField(const char *title, const std::string &text) {
     std::printf("%s  %s\n",
@@ -59,10 +59,10 @@ std::string overlapInWords(const TAVI_SCHED_TASK &task) {
            " while another task of its application runs";
 }
 
-std::string lastRunInWords(const TAVI_SCHED_TASK &task, const Run *run) {
-    return run ? resultInWords(*run, &task) + ", started " + localTime(run->start) + " (" +
-                     ago(run->start, time(nullptr)) + ")"
-               : "none known since the machine was started";
+std::string lastRunInWords(const Run *run) {
+    return run ? resultInWords(*run) + (run->began != 0 ? ", started " : ", due ") +
+                     localTime(startOf(*run)) + " (" + ago(startOf(*run), time(nullptr)) + ")"
+               : "none on record";
 }
 
 // Looked at by once, monthly and yearly schedules.
@@ -85,7 +85,7 @@ void printTask(const TAVI_SCHED_TASK &task, const Run *lastRun) {
     printField("State", stateInWords(task, lastRun));
     printField("Schedule", scheduleInWords(task));
     printField("Next run", nextRun(task).value_or(never));
-    printField("Last run", printable(lastRunInWords(task, lastRun)));
+    printField("Last run", printable(lastRunInWords(lastRun)));
     printField("Owner", printable(ownerName(task.owner)) + " (" + std::to_string(task.owner) + ")");
     printField("Command", commandInLines(task.command));
     printField("Action", orDash(task.action));
@@ -104,7 +104,9 @@ void printTask(const TAVI_SCHED_TASK &task, const Run *lastRun) {
 
 std::vector<Run> lastRuns(int32_t id) {
     try {
-        return readRuns(id, kRuns);
+        TAVI_SCHED_RUN_FILTER filter = runsOf(id);
+        filter.limit = kRuns;
+        return readRuns(filter);
     } catch (const std::exception &failure) {
         std::cerr << "tavisched: warning: " << failure.what() << "\n";
         return {};
@@ -123,7 +125,7 @@ int show(int32_t id, bool json) {
     printTask(*task, runs.empty() ? nullptr : &runs.front());
     if (!runs.empty()) {
         std::printf("\n");
-        printRunsTable(runs, {task.get()});
+        printRunsTable(runs);
     }
     return 0;
 }

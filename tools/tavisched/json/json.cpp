@@ -27,12 +27,25 @@ std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json
     return printable(errors);
 }
 
-void printJson(const Json::Value &value) {
+namespace {
+
+void print(const Json::Value &value, const char *indentation) {
     Json::StreamWriterBuilder builder;
-    builder["indentation"] = "  ";
+    builder["indentation"] = indentation;
+    builder["precision"] = 15;
     builder["emitUTF8"] = true;
     builder["enableYAMLCompatibility"] = true; // no blank before a colon
     std::printf("%s\n", printableLines(Json::writeString(builder, value)).c_str());
+}
+
+} // namespace
+
+void printJson(const Json::Value &value) {
+    print(value, "  ");
+}
+
+void printJsonLine(const Json::Value &value) {
+    print(value, "");
 }
 
 } // namespace tavisched

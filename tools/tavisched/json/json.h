@@ -12,5 +12,7 @@ namespace tavisched {
 std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json::Value &value);
 // Characters that could do harm on a terminal are written as escapes.
 void printJson(const Json::Value &value);
+// The same on one line.
+void printJsonLine(const Json::Value &value);
 
 } // namespace tavisched

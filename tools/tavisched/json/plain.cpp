@@ -2,6 +2,7 @@
 #include "json/plain.h"
 #include "failure.h"
 #include "text/days.h"
+#include "text/moments.h"
 #include "text/utf8.h"
 #include "text/words.h"
 #include "json/stored_form.h"
@@ -204,18 +205,36 @@ Json::Value plainStored(const TAVI_SCHED_TASK &task) {
     return value;
 }
 
-Json::Value plainRun(const Run &run, const TAVI_SCHED_TASK *task) {
+Json::Value plainRun(const Run &run) {
+    const auto timeOf = [](int64_t milliseconds) {
+        return milliseconds == 0 ? Json::Value() : Json::Value(isoTime(seconds(milliseconds)));
+    };
+    const auto number = [](int64_t value) { return static_cast<Json::Int64>(value); };
+    constexpr double kSecond = 1000;
+    const bool hasRun = run.began != 0 && run.ended != 0;
+    const bool hasWaited = run.waitingSince != 0;
     Json::Value value;
+    value["run"] = number(run.run);
     value["task"] = run.taskId;
-    value["name"] = task ? Json::Value(utf8(task->name)) : Json::Value();
-    value["start"] = localTime(run.start);
-    value["startTime"] = static_cast<Json::Int64>(run.start);
-    value["end"] = run.end ? Json::Value(localTime(*run.end)) : Json::Value();
+    value["name"] = utf8(run.name);
+    value["taskRemoved"] = run.isOfRemovedTask == 1;
+    value["owner"] = ownerName(run.owner);
+    value["startedBy"] = run.mode == 1 ? Json::Value() : Json::Value(startInWords(run));
+    value["byCron"] = run.mode == 1;
+    value["due"] = timeOf(run.due);
+    value["asked"] = timeOf(run.asked);
+    value["start"] = timeOf(run.began);
+    value["end"] = timeOf(run.ended);
     value["duration"] =
-        run.end ? Json::Value(static_cast<Json::Int64>(*run.end - run.start)) : Json::Value();
-    value["result"] = printable(resultInWords(run, task));
-    value["statusCode"] = run.code;
-    value["comment"] = printable(run.comment);
+        hasRun ? Json::Value(static_cast<double>(run.duration) / kSecond) : Json::Value();
+    value["waitingSince"] = timeOf(run.waitingSince);
+    value["waited"] = run.waited;
+    value["waitedFor"] = hasWaited ? Json::Value(run.waitedFor) : Json::Value();
+    value["result"] = resultInWords(run);
+    value["statusCode"] = run.result;
+    value["number"] = run.number;
+    value["outputSize"] = number(run.outputSize);
+    value["outputKept"] = number(run.outputKept);
     value["pid"] = run.pid;
     return value;
 }
@@ -226,7 +245,7 @@ Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns)
     Json::Value value = plainStored(task);
     value["schedule"] = scheduleInWords(task);
     value["nextRun"] = next ? Json::Value(*next) : Json::Value();
-    value["lastRun"] = run == latestRuns.end() ? Json::Value() : plainRun(run->second, &task);
+    value["lastRun"] = run == latestRuns.end() ? Json::Value() : plainRun(run->second);
     return value;
 }
 

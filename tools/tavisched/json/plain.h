@@ -14,8 +14,7 @@ namespace tavisched {
 Json::Value plainStored(const TAVI_SCHED_TASK &task);
 // The same with what follows from it: the schedule in words, the next run, the last one.
 Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns);
-// The task may be nullptr.
-Json::Value plainRun(const Run &run, const TAVI_SCHED_TASK *task);
+Json::Value plainRun(const Run &run);
 
 // A task that was read, and what a person should know of it; no task when it has faults.
 struct Imported {

@@ -1,13 +1,14 @@
-// Runs as the status database remembers them.
+// Runs as their records tell them.
 #include "tasks/runs.h"
 #include "failure.h"
+#include "text/utf8.h"
 
-#include <charconv>
+#include <array>
+#include <cstdio>
 #include <exception>
 #include <iostream>
-#include <memory>
-#include <pwd.h>
 #include <string_view>
+#include <unistd.h>
 
 namespace tavisched {
 
@@ -16,88 +17,130 @@ namespace {
 constexpr int kAnyFailure = 1;
 constexpr int kNotStarted = 127;
 constexpr int kSignalBase = 128;
+constexpr unsigned int kNotFound = 0x2000;
+constexpr int kLongestWait = 1000; // milliseconds
 
-using Database = std::unique_ptr<sqlite3, decltype(&TAVISchedDBClose)>;
-
-[[noreturn]] void failToRead() {
-    throw Failure("how runs ended cannot be read: " + libraryError());
-}
-
-// Nothing before the first run since the machine's start.
-Database openDatabase() {
-    sqlite3 *database = nullptr;
-    if (TAVISchedDBOpenForReading(&database) < 0) {
-        failToRead();
-    }
-    return {database, TAVISchedDBClose};
-}
-
-// Collects rows; no exception may pass through the library.
+// No exception may pass through the library.
 struct Collector {
-    size_t most = std::numeric_limits<size_t>::max();
     std::vector<Run> runs{};
     std::exception_ptr failure{};
 
-    static int add(void *collector, const TAVI_SCHED_STATUS *row) {
+    static int add(void *collector, const Run *run) {
         auto &self = *static_cast<Collector *>(collector);
         try {
-            self.runs.push_back({.statusId = row->statusId,
-                                 .taskId = row->taskId,
-                                 .start = row->timestamp,
-                                 .pid = row->pid,
-                                 .code = row->statusCode,
-                                 .comment = row->comment});
-            return self.runs.size() < self.most ? 0 : 1;
+            self.runs.push_back(*run);
+            return 0;
         } catch (...) {
             self.failure = std::current_exception();
             return -1;
         }
     }
-    std::vector<Run> result(int count, sqlite3 *database) {
-        if (failure) {
-            std::rethrow_exception(failure);
-        }
-        if (count < 0) {
-            failToRead();
-        }
-        for (Run &run : runs) {
-            int32_t end = 0;
-            const int found = TAVISchedDBGetEnd(database, run.statusId, &end);
-            if (found < 0) {
-                failToRead();
-            }
-            run.end = found > 0 ? std::optional<time_t>(end) : std::nullopt;
-        }
-        return std::move(runs);
-    }
 };
 
-int numberIn(std::string_view text) {
-    int number = 0;
-    std::from_chars(text.data(), text.data() + text.size(), number);
-    return number;
+// An output on its way to a person or a file.
+class Printer {
+  public:
+    void add(std::string_view bytes) {
+        if (!isTerminal_) {
+            write(bytes);
+            return;
+        }
+        held_ += bytes;
+        const std::string rest = held_.substr(held_.size() - startedCharacter());
+        held_.resize(held_.size() - rest.size());
+        flush();
+        held_ = rest;
+    }
+    void skip(int64_t bytes) {
+        flush();
+        std::fprintf(stderr, "[... %lld bytes cut out ...]\n", static_cast<long long>(bytes));
+    }
+    // What comes next begins on a line of its own on a terminal.
+    void end() {
+        flush();
+        if (isTerminal_ && last_ != '\n') {
+            write("\n");
+        }
+    }
+
+  private:
+    // Bytes at the end that are the beginning of a character.
+    size_t startedCharacter() const {
+        for (size_t length = 1; length <= 3 && length <= held_.size(); ++length) {
+            const auto byte = static_cast<unsigned char>(held_[held_.size() - length]);
+            if (byte >= 0xC0) {
+                const size_t whole = byte >= 0xF0 ? 4 : byte >= 0xE0 ? 3 : 2;
+                return whole > length ? length : 0;
+            }
+            if (byte < 0x80) {
+                return 0;
+            }
+        }
+        return 0;
+    }
+    void flush() {
+        std::vector<std::string> parts = split(held_, '\t');
+        for (std::string &part : parts) {
+            part = printableLines(part);
+        }
+        write(join(parts, "\t"));
+        held_.clear();
+    }
+    void write(std::string_view bytes) {
+        last_ = bytes.empty() ? last_ : bytes.back();
+        if (std::fwrite(bytes.data(), 1, bytes.size(), stdout) != bytes.size() ||
+            std::fflush(stdout) != 0) {
+            throw Failure("the output could not be written");
+        }
+    }
+
+    bool isTerminal_ = isatty(STDOUT_FILENO) == 1;
+    char last_ = '\n';
+    std::string held_{};
+};
+
+// What there is from the offset on. False when nothing is kept.
+bool printFrom(int64_t run, int64_t &offset, Printer &printer) {
+    std::array<char, 16384> buffer; // NOLINT: only what was read is looked at
+    for (;;) {
+        int64_t cut = 0;
+        const int64_t length =
+            TAVISchedRunOutputRead(run, &offset, buffer.data(), buffer.size(), &cut);
+        if (length < 0 && PLATCErrGet() != kNotFound) {
+            throw Failure("the output of run " + std::to_string(run) +
+                          " cannot be read: " + libraryError());
+        }
+        if (length >= 0 && cut > 0) {
+            printer.skip(cut);
+        }
+        if (length <= 0) {
+            return length == 0;
+        }
+        printer.add({buffer.data(), static_cast<size_t>(length)});
+    }
 }
 
 } // namespace
 
-std::vector<Run> readRuns(std::optional<int32_t> taskId, size_t most) {
-    const Database database = openDatabase();
-    Collector runs{.most = most};
-    return database ? runs.result(TAVISchedDBListStatus(database.get(), taskId.value_or(-1),
-                                                        Collector::add, &runs),
-                                  database.get())
-                    : std::vector<Run>();
+std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter) {
+    Collector found;
+    const int count = TAVISchedRunList(&filter, Collector::add, &found);
+    if (found.failure) {
+        std::rethrow_exception(found.failure);
+    }
+    if (count < 0) {
+        throw Failure("the records of runs cannot be read: " + libraryError());
+    }
+    return std::move(found.runs);
 }
 
 LatestRuns readLatestRuns() {
     LatestRuns latest;
     try {
-        if (const Database database = openDatabase()) {
-            Collector runs;
-            const int count = TAVISchedDBListLastStatus(database.get(), Collector::add, &runs);
-            for (Run &run : runs.result(count, database.get())) {
-                latest.try_emplace(run.taskId, std::move(run));
-            }
+        TAVI_SCHED_RUN_FILTER filter = kAllRuns;
+        filter.newestOnly = 1;
+        for (const Run &run : readRuns(filter)) {
+            latest.try_emplace(run.taskId, run);
         }
     } catch (const Failure &failure) {
         std::cerr << "tavisched: warning: " << failure.what() << "\n";
@@ -105,30 +148,55 @@ LatestRuns readLatestRuns() {
     return latest;
 }
 
-// The row of such a run is left as a running one, without its process.
-bool lackedOwner(const Run &run, const TAVI_SCHED_TASK *task) {
-    return run.code == SCHED_STATUS_CODE_INTERRUPTED && task && !getpwuid(task->owner);
+std::optional<Run> findRun(int64_t run) {
+    Run found{};
+    if (TAVISchedRunGet(run, &found) == 0) {
+        return found;
+    }
+    readRuns({.taskId = -1, .failedOnly = 0, .newestOnly = 0, .limit = 1, .since = 0}); // or fails
+    return std::nullopt;
 }
 
 bool hasFailed(const Run &run) {
-    return run.code != SCHED_STATUS_CODE_SUCCESS && run.code != SCHED_STATUS_CODE_RUNNING &&
-           run.code != SCHED_STATUS_CODE_NONE;
+    return run.result != TAVI_SCHED_RUN_SUCCESS && run.result != TAVI_SCHED_RUN_NONE &&
+           !goesOn(run);
 }
 
-int exitStatusOf(const Run &run, const TAVI_SCHED_TASK *task) {
-    switch (run.code) {
-    case SCHED_STATUS_CODE_SUCCESS:
+int exitStatusOf(const Run &run) {
+    switch (run.result) {
+    case TAVI_SCHED_RUN_SUCCESS:
         return 0;
-    case SCHED_STATUS_CODE_START_FAILED:
+    case TAVI_SCHED_RUN_START_FAILED:
+    case TAVI_SCHED_RUN_OWNER_UNKNOWN:
         return kNotStarted;
-    case SCHED_STATUS_CODE_EXIT_FAILED:
-        return numberIn(run.comment);
-    case SCHED_STATUS_CODE_STOPPED:
-    case SCHED_STATUS_CODE_SIGNALED:
-        return kSignalBase + numberIn(run.comment);
+    case TAVI_SCHED_RUN_EXIT_FAILED:
+        return run.number;
+    case TAVI_SCHED_RUN_STOPPED:
+    case TAVI_SCHED_RUN_SIGNALED:
+        return kSignalBase + run.number;
     default:
-        return lackedOwner(run, task) ? kNotStarted : kAnyFailure;
+        return kAnyFailure;
     }
+}
+
+bool printOutput(int64_t run, bool follow) {
+    Printer printer;
+    int64_t offset = 0;
+    bool isKept = false;
+    bool isOver = !follow;
+    for (;;) {
+        isKept = printFrom(run, offset, printer);
+        if (isOver) {
+            break; // what came before the end has been read
+        }
+        const auto record = findRun(run);
+        isOver = !record || !goesOn(*record);
+        if (!isOver && TAVISchedRunFollow(run, offset, kLongestWait) < 0) {
+            isOver = true; // its record is gone
+        }
+    }
+    printer.end();
+    return isKept;
 }
 
 } // namespace tavisched

@@ -1,43 +1,52 @@
-// Runs as the status database remembers them.
+// Runs as their records tell them.
 #pragma once
 
 #include "tavischeduler.h"
 
 #include <cstdint>
 #include <ctime>
-#include <limits>
 #include <map>
 #include <optional>
 #include <string>
-#include <sys/types.h>
 #include <vector>
 
 namespace tavisched {
 
-struct Run {
-    int32_t statusId;
-    int32_t taskId;
-    time_t start;
-    pid_t pid;
-    int32_t code;                // SCHED_STATUS_CODE_*
-    std::string comment;         // exit code or signal number, as the code tells
-    std::optional<time_t> end{}; // when that is known
-};
+using Run = TAVI_SCHED_RUN;
 using LatestRuns = std::map<int32_t, Run>; // by task
 
-// The runs of a task, or of all, newest first, at most so many. Empty before the first run since
-// the machine's start.
-std::vector<Run> readRuns(std::optional<int32_t> taskId = std::nullopt,
-                          size_t most = std::numeric_limits<size_t>::max());
+constexpr TAVI_SCHED_RUN_FILTER kAllRuns{
+    .taskId = -1, .failedOnly = 0, .newestOnly = 0, .limit = 0, .since = 0};
+constexpr TAVI_SCHED_RUN_FILTER runsOf(int32_t taskId) {
+    return {.taskId = taskId, .failedOnly = 0, .newestOnly = 0, .limit = 0, .since = 0};
+}
+// The runs that the filter keeps, newest first; none where there are no records.
+std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter);
 // The newest run of every task that has one. Nothing, with a warning, when they cannot be read:
 // tasks can be shown all the same.
 LatestRuns readLatestRuns();
+// One run, or nothing when it has no record.
+std::optional<Run> findRun(int64_t run);
 
-// The command was not started, as its owner does not exist. The task may be nullptr.
-bool lackedOwner(const Run &run, const TAVI_SCHED_TASK *task);
+inline time_t seconds(int64_t milliseconds) {
+    return static_cast<time_t>(milliseconds / 1000);
+}
+// When it began, or was asked for while its command has not begun.
+inline time_t startOf(const Run &run) {
+    return seconds(run.began != 0 ? run.began : run.asked);
+}
+// Waits, or its command runs.
+inline bool goesOn(const Run &run) {
+    return run.result == TAVI_SCHED_RUN_RUNNING || run.result == TAVI_SCHED_RUN_WAITING;
+}
 // A run that did not come to a good end.
 bool hasFailed(const Run &run);
 // How a command's shell would tell of the run: 0, its exit code, or 128 and the signal's number.
-int exitStatusOf(const Run &run, const TAVI_SCHED_TASK *task);
+int exitStatusOf(const Run &run);
+
+// Writes what the run prints to standard output: what is there, or, when it is followed, all until
+// its end. A terminal is sent escapes instead of what could control it. What was cut out is said on
+// standard error. False when nothing is kept of it.
+bool printOutput(int64_t run, bool follow);
 
 } // namespace tavisched

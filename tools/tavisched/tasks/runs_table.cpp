@@ -3,42 +3,39 @@
 #include "text/utf8.h"
 #include "text/words.h"
 
-#include <algorithm>
-
 namespace tavisched {
 
 Style styleOf(const Run &run) {
-    return run.code == SCHED_STATUS_CODE_SUCCESS   ? Style::Good
-           : run.code == SCHED_STATUS_CODE_RUNNING ? Style::Busy
-                                                   : Style::Bad;
+    return run.result == TAVI_SCHED_RUN_SUCCESS ? Style::Good
+           : goesOn(run)                        ? Style::Busy
+           : hasFailed(run)                     ? Style::Bad
+                                                : Style::Plain;
 }
 
-const TAVI_SCHED_TASK *taskOf(const Run &run, const TaskPointers &tasks) {
-    const auto found = std::find_if(tasks.begin(), tasks.end(),
-                                    [&](const auto *task) { return task->id == run.taskId; });
-    return found == tasks.end() ? nullptr : *found;
-}
-
-void printRunsTable(const std::vector<Run> &runs, const TaskPointers &tasks) {
+void printRunsTable(const std::vector<Run> &runs) {
     std::vector<Row> rows;
     rows.reserve(runs.size());
     for (const Run &run : runs) {
-        const TAVI_SCHED_TASK *const task = taskOf(run, tasks);
-        rows.push_back({{std::to_string(run.taskId)},
-                        {task && task->name[0] != '\0' ? printable(task->name) : "-"},
-                        {localTime(run.start)},
-                        {run.end ? localTime(*run.end) : "-"},
-                        {run.end ? durationInWords(*run.end - run.start) : "-"},
-                        {printable(resultInWords(run, task)), styleOf(run)},
-                        {std::to_string(run.pid)}});
+        const bool ended = run.ended != 0;
+        rows.push_back({{std::to_string(run.run)},
+                        {std::to_string(run.taskId)},
+                        {run.name[0] != '\0' ? printable(run.name) : "-"},
+                        {localTime(startOf(run))},
+                        {ended ? localTime(seconds(run.ended)) : "-"},
+                        {ended && run.began != 0 ? durationInWords(seconds(run.duration)) : "-"},
+                        {run.waited > 0 ? durationInWords(run.waited) : "-"},
+                        {printable(startInWords(run))},
+                        {printable(resultInWords(run)), styleOf(run)}});
     }
-    printTable({{"TASK", true},
-                {"NAME", false, true, 2},
+    printTable({{"RUN", true},
+                {"TASK", true},
+                {"NAME", false, true, 3},
                 {"START"},
-                {"END", false, false, 3},
-                {"DURATION", false, false, 4},
-                {"RESULT", false, true},
-                {"PID", true, false, 1}},
+                {"END", false, false, 4},
+                {"DURATION", false, false, 5},
+                {"WAITED", false, false, 1},
+                {"STARTED BY", false, true, 2},
+                {"RESULT", false, true}},
                std::move(rows));
 }
 

@@ -109,7 +109,7 @@ std::string remarkOn(const TAVI_SCHED_TASK &task) {
 
 std::string stateInWords(const TAVI_SCHED_TASK &task, const Run *run) {
     if (task.type == TAVI_SCHED_TYPE_ONCE && isEnabled(task) && !nextRun(task)) {
-        return run ? "done" : "past";
+        return run && run->began != 0 ? "done" : "past";
     }
     const char *const name = TAVISchedEnumToName(TAVISchedStateTable, task.state);
     return name ? name : std::to_string(task.state);
@@ -120,25 +120,50 @@ std::optional<std::string> nextRun(const TAVI_SCHED_TASK &task) {
     return runs ? std::optional<std::string>(task.nextTriggerTime) : std::nullopt;
 }
 
-std::string resultInWords(const Run &run, const TAVI_SCHED_TASK *task) {
-    switch (run.code) {
-    case SCHED_STATUS_CODE_INTERRUPTED:
-        return lackedOwner(run, task) ? "not started: no such user" : "interrupted";
-    case SCHED_STATUS_CODE_RUNNING:
+std::string resultInWords(const Run &run) {
+    const std::string number = std::to_string(run.number);
+    const std::string other =
+        run.waitedFor == 0 ? "the run lock" : "task " + std::to_string(run.waitedFor);
+    switch (run.result) {
+    case TAVI_SCHED_RUN_INTERRUPTED:
+        return "interrupted";
+    case TAVI_SCHED_RUN_RUNNING:
         return "running";
-    case SCHED_STATUS_CODE_SUCCESS:
+    case TAVI_SCHED_RUN_SUCCESS:
         return "ok";
-    case SCHED_STATUS_CODE_START_FAILED:
+    case TAVI_SCHED_RUN_START_FAILED:
         return "not started";
-    case SCHED_STATUS_CODE_STOPPED:
-        return "stopped by signal " + run.comment;
-    case SCHED_STATUS_CODE_SIGNALED:
-        return "killed by signal " + run.comment;
-    case SCHED_STATUS_CODE_EXIT_FAILED:
-        return "exit " + run.comment;
+    case TAVI_SCHED_RUN_STOPPED:
+        return "stopped by signal " + number;
+    case TAVI_SCHED_RUN_SIGNALED:
+        return "killed by signal " + number;
+    case TAVI_SCHED_RUN_EXIT_FAILED:
+        return "exit " + number;
+    case TAVI_SCHED_RUN_WAITING:
+        return "waiting for " + other + " since " + localTime(seconds(run.waitingSince));
+    case TAVI_SCHED_RUN_STOPPED_BY_USER:
+        return "stopped by a person";
+    case TAVI_SCHED_RUN_GIVEN_UP:
+        return "given up, " + other + " was running";
+    case TAVI_SCHED_RUN_LOCK_FAILED:
+        return "not run: no run lock";
+    case TAVI_SCHED_RUN_DATABASE_FAILED:
+        return "not run: status database failed";
+    case TAVI_SCHED_RUN_OWNER_UNKNOWN:
+        return "not started: no such user";
+    case TAVI_SCHED_RUN_TASK_REMOVED:
+        return "not run: removed meanwhile";
+    case TAVI_SCHED_RUN_TASK_DISABLED:
+        return "not run: disabled meanwhile";
+    case TAVI_SCHED_RUN_MISSED:
+        return "missed";
     default:
         return "no result";
     }
+}
+
+std::string startInWords(const Run &run) {
+    return run.mode == 1 ? "cron" : ownerName(run.startedBy);
 }
 
 std::string durationInWords(time_t seconds) {

@@ -20,8 +20,10 @@ std::string remarkOn(const TAVI_SCHED_TASK &task);
 std::string stateInWords(const TAVI_SCHED_TASK &task, const Run *run);
 // The next run as "2026-12-24 18:00"; nothing when there will be none or the task is disabled.
 std::optional<std::string> nextRun(const TAVI_SCHED_TASK &task);
-// "ok", "exit 2", "killed by signal 9", "running", ... The task may be nullptr.
-std::string resultInWords(const Run &run, const TAVI_SCHED_TASK *task);
+// "ok", "exit 2", "killed by signal 9", "running", "waiting for task 3 since ...", "missed", ...
+std::string resultInWords(const Run &run);
+// "cron", or the user who started it by hand.
+std::string startInWords(const Run &run);
 // "just now", "5 min ago", "2 h ago", "yesterday", "3 days ago", "2026-10-01"
 std::string ago(time_t then, time_t now);
 // "4 s", "2 min 5 s", "1 h 3 min"

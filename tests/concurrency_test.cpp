@@ -392,7 +392,6 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
     long changes = 0;
     tryOften("/tmp filled and freed", [&](long number) {
         const std::string name = "task " + std::to_string(number);
-        const std::string removed = "task " + std::to_string(number - 3);
         if (created(name.c_str()) == 0) {
             wanted.insert(name);
             ++changes;
@@ -401,9 +400,13 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
         const int count = TAVISchedTaskListGet(&list, nullptr);
         std::set<std::string> listed;
         int32_t toRemove = 0;
+        std::string removed;
         for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
             listed.insert(task->name);
-            toRemove = task->name == removed ? task->id : toRemove;
+            if (std::strncmp(task->name, "task ", 5) == 0 && count > 6) {
+                toRemove = task->id;
+                removed = task->name;
+            }
         }
         TAVISchedTaskListFree(&list);
         const bool isRight = count >= 0 && listed == wanted;

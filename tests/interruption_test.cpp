@@ -17,12 +17,6 @@ namespace {
 
 using namespace support;
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr size_t kStep = 9; // a fork costs many times as much
-#else
-constexpr size_t kStep = 1;
-#endif
-
 // ---- Operations ----
 
 // What an operation may fail with; also what the platform's functions set.

@@ -218,8 +218,9 @@ class Handlers : public Concurrency {
         const std::string folder = "/usr/tavi/etc/plugins/task_scheduler";
         fs::create_directories(folder);
         writeFile(folder + "/handler",
-                  std::string("#!/bin/sh\n") + TAVISCHED + " list > /run/$2.list && " + TAVISCHED +
-                      " add --command true --at 03:00 > /run/$2.add 2>&1; echo $? > /run/$2\n");
+                  std::string("#!/bin/sh\n'") + TAVISCHED + "' list > /run/$2.list && '" +
+                      TAVISCHED +
+                      "' add --command true --at 03:00 > /run/$2.add 2>&1; echo $? > /run/$2\n");
         chmod((folder + "/handler").c_str(), 0755);
     }
     static int edit() {

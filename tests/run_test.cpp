@@ -188,7 +188,7 @@ TEST_F(Run, RunnerLooksAtStateAndTime) {
             task->runMin = (before.minute + row.minutesFromNow) % 60;
             task->state = row.state;
             TAVISchedTaskEdit(task.get());
-            EXPECT_EQ(shell(RUNNER " --run id=1"), 0);
+            EXPECT_EQ(shell("'" RUNNER "' --run id=1"), 0);
             waitForChildren();
             seen = rows();
             TAVISchedDateGet(&after);

@@ -19,7 +19,7 @@ class CommandLine : public SchedTest {
         }
         shell(
             "mkdir -p /tmp/lock /usr/tavi/bin; chmod 755 /tmp/lock; rm -rf /usr/tavi/etc/plugins /sys/class/rtc/rtc0 2>/dev/null; chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
-            "cp -u " TAVISCHED " " RUNNER " /usr/tavi/bin; printf '#!/bin/sh\n' "
+            "cp -u '" TAVISCHED "' '" RUNNER "' /usr/tavi/bin; printf '#!/bin/sh\n' "
             "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
             "ln -sfn /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
         writeFile("/run/crond.pid", std::to_string(cron_) + "\n");

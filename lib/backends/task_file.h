@@ -20,8 +20,8 @@ using SectionName = std::array<char, 512>;
 SectionName sectionName(int32_t id);
 
 // What a pass over all tasks does with each of them: the task is the pass's own and is overwritten
-// by the next one, or, with `fresh`, it is the function's to keep. Only then it has its next trigger
-// time, which costs as much as the rest.
+// by the next one, or, with `fresh`, it is the function's to keep. Only then it has its next
+// trigger time, which costs as much as the rest.
 struct TaskPass {
     bool fresh = false;
     // False ends the pass.

@@ -10,13 +10,11 @@
 #include <algorithm>
 #include <csignal>
 #include <cstdio>
-#include <cstring>
 #include <ctime>
 #include <iterator>
 #include <optional>
 #include <poll.h>
 #include <string_view>
-#include <sys/prctl.h>
 #include <unistd.h>
 
 namespace tavisched {
@@ -115,11 +113,6 @@ std::vector<Task> readTasks(const Ids &ids) {
 
 int run(const Ids &ids, bool wait) {
     const std::vector<Task> tasks = readTasks(ids);
-    // What is waited for stays below us: when a plug-in handler waits for a task that reads tasks,
-    // the task knows that the change which it would wait for waits for it.
-    if (wait && prctl(PR_SET_CHILD_SUBREAPER, 1) != 0) {
-        throw Failure(std::string("no task was started: ") + std::strerror(errno));
-    }
     std::vector<Started> runs;
     if (wait) {
         tellWhenInterrupted();

@@ -532,16 +532,18 @@ int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
 
 int nextFreeId(int32_t *id) {
     try {
-        StagedTasks::Ids gathered;
-        if (!staged.ids) {
-            if (gatherIds(gathered) != 0) {
-                return -1;
-            }
-            if (isBatchOpen()) {
-                staged.ids = std::move(gathered);
-            }
+        if (staged.ids) {
+            *id = smallestFreeId(staged.ids->used);
+            return 0;
         }
-        *id = smallestFreeId(staged.ids ? staged.ids->used : gathered.used);
+        StagedTasks::Ids gathered;
+        if (gatherIds(gathered) != 0) {
+            return -1;
+        }
+        *id = smallestFreeId(gathered.used);
+        if (isBatchOpen()) {
+            staged.ids = std::move(gathered);
+        }
         return 0;
     } catch (const std::exception &) {
         setOwnError(kTaskOutOfMemory, SCHED_OWN_SITE);

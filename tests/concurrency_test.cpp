@@ -320,13 +320,15 @@ class LocalUser : public Concurrency {
         Concurrency::TearDown();
     }
     void attackInALoop(void (*attack)()) {
-        stranger_ = start([&] {
+        stranger_ = start([&]() -> int {
             umask(022);
-            for (int ready = becomeStranger(); ready == 0;) {
+            if (becomeStranger() != 0) {
+                return 1;
+            }
+            while (true) {
                 attack();
                 ++shared().looks;
             }
-            return 1;
         });
     }
     // Goes on for some seconds, or for as many tries as TAVI_TEST_TRIES says.

@@ -4,6 +4,7 @@
 #include "base/descriptor.h"
 #include "platc.h"
 #include "runs/run.h"
+#include "runs/run_connection.h"
 #include "sched_backend.h"
 #include "sched_calendar.h"
 #include "sched_error.h"
@@ -20,9 +21,7 @@
 #include <cstring>
 #include <grp.h>
 #include <sys/file.h>
-#include <sys/socket.h>
 #include <unistd.h>
-#include <utility>
 
 FILE *pfLock = nullptr;
 
@@ -377,6 +376,7 @@ class TaskRun {
                              base::Descriptor connection) {
     TAVISchedRandInit();
     sched::guarded(SCHED_SITE, [&] {
+        sched::closeCallersDescriptors(connection);
         TaskRun run(task, origin);
         run.perform();
         connection.close();
@@ -393,41 +393,6 @@ struct Followed {
     int &end;
 };
 
-// A connection between the caller's process and the child: it carries the child's process id, and
-// it ends with the run, at the latest with the child, as nobody else has that side of it.
-class Connection {
-  public:
-    bool make() {
-        std::array<int, 2> ends{};
-        if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends.data()) != 0) {
-            return false;
-        }
-        callers_ = base::Descriptor(ends[0]);
-        childs_ = base::Descriptor(ends[1]);
-        return true;
-    }
-    // In the child. A caller that is gone by now is no reason to end.
-    base::Descriptor tellPid() {
-        const int32_t pid = getpid();
-        send(childs_.get(), &pid, sizeof pid, MSG_NOSIGNAL);
-        callers_.close();
-        return std::move(childs_);
-    }
-    // In the caller's process. A child that was killed at once tells nothing.
-    void takePid(const Followed &followed) {
-        childs_.close();
-        if (recv(callers_.get(), &followed.pid, sizeof followed.pid, MSG_WAITALL) !=
-            sizeof followed.pid) {
-            followed.pid = -1;
-        }
-        followed.end = callers_.release();
-    }
-
-  private:
-    base::Descriptor callers_;
-    base::Descriptor childs_;
-};
-
 int failToRun(int32_t id) {
     SCHED_LOG("run task failed. [%ld] [0x%04X %s:%d]", static_cast<long>(id), SCHED_LAST_ERROR);
     return -1;
@@ -435,7 +400,7 @@ int failToRun(int32_t id) {
 
 int startChild(int32_t id, int32_t mode, TAVI_SCHED_TASK &task, const Followed *followed) {
     const sched::RunOrigin origin = sched::originOf(mode);
-    Connection connection;
+    sched::RunConnection connection;
     if (followed && !connection.make()) {
         SCHED_LOG("socketpair failed. %m");
         SCHED_SET_ERROR(sched::kSystemCallFailed);
@@ -444,7 +409,7 @@ int startChild(int32_t id, int32_t mode, TAVI_SCHED_TASK &task, const Followed *
     switch (PLATCProcForkChildNoWait()) {
     case 1:
         if (followed) {
-            connection.takePid(*followed);
+            followed->end = connection.takePid(followed->pid).release();
         }
         return 0;
     case 0:

@@ -240,8 +240,18 @@ TEST_F(Run, FollowedToItsEnd) {
     int end = 0;
     EXPECT_EQ(TAVISchedTaskRunFollowed(1, 2, 0, &pid, &end), 0); // skipped
     EXPECT_EQ(pid * 10 + end, -11);
+    // A caller without standard input. What it has open is not the run's.
+    const int input = dup(STDIN_FILENO);
+    std::array<int, 2> callers{};
+    ASSERT_EQ(pipe2(callers.data(), O_NONBLOCK), 0);
+    close(STDIN_FILENO);
     EXPECT_EQ(TAVISchedTaskRunFollowed(1, 0, 0, &pid, &end), 0);
+    EXPECT_EQ(dup2(input, STDIN_FILENO), STDIN_FILENO);
+    close(input);
     const int fifo = open("/tmp/fifo", O_WRONLY); // the command runs
+    close(callers[1]);
+    EXPECT_EQ(read(callers[0], &pid, 1), 0);
+    close(callers[0]);
     EXPECT_EQ(query("SELECT pid, status_code FROM task_status"), std::to_string(pid) + " 2 ");
     char byte = 0;
     EXPECT_EQ(recv(end, &byte, 1, MSG_DONTWAIT), -1);

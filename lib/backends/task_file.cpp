@@ -9,6 +9,7 @@
 #include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
+#include "sched_sections.h"
 #include "sched_shared_file.h"
 #include "staged_tasks.h"
 
@@ -51,11 +52,8 @@ PLATCSZHASH *readSection(const char *path, const char *section, Hash &hash, int 
     return found > 0 ? hash.get() : nullptr;
 }
 
-// Fills the task from its section; a failure is logged.
-bool readTask(const char *path, const char *section, Hash &hash, TAVI_SCHED_TASK &task,
-              bool withTime) {
-    int found = 0;
-    PLATCSZHASH *const form = readSection(path, section, hash, found);
+// Fills the task from its section's stored form; a failure is logged.
+bool readTask(const char *section, PLATCSZHASH *form, TAVI_SCHED_TASK &task, bool withTime) {
     if (!form) {
         SCHED_LOG_AT(51, "Get section [%s] from [%s] failed. [0x%04X %s:%d]",
                      LogText(section).c_str(), kWorkingCopy, SCHED_LAST_ERROR);
@@ -83,63 +81,79 @@ bool isThere(const char *path, bool &unreadable) {
     return found != base::Found::Nothing && !unreadable;
 }
 
-// The names of all sections: their number, or -1. Those of the file that are not removed come
-// first, then those that are new.
-int enumerate(const char *path, std::vector<std::string> &names) {
-    bool unreadable = false;
-    if (isThere(path, unreadable)) {
-        sched::List list(kCapacity);
-        const int count = list ? PLATCFileEnumSection(path, list.address()) : -1;
-        for (int i = 0; i < count; ++i) {
-            const char *const name = PLATCSzListGet(list.get(), i);
-            if (staged.stateOf(name) != sched::StagedTasks::State::Removed) {
-                names.emplace_back(name);
-            }
-        }
-        unreadable = count < 0;
-    }
-    if (staged.any()) {
-        const std::set<std::string> present(names.begin(), names.end());
-        std::copy_if(
-            staged.order().begin(), staged.order().end(), std::back_inserter(names),
-            [&](const std::string &name) { return staged.find(name) && !present.contains(name); });
-    }
-    return unreadable ? -1 : static_cast<int>(names.size());
-}
-
 // What a look-up finds before it reads: enumerations that a section does not name stay as they are.
 void makeFresh(TAVI_SCHED_TASK &task) {
     task.state = 0;
     task.type = 0;
 }
 
-int pass(const sched::TaskPass &how) {
-    const sched::Reading reading;
-    std::vector<std::string> names;
-    if (!reading || enumerate(reading.path(), names) < 0) {
-        return -1;
+// One pass, from section to section.
+class Pass {
+  public:
+    explicit Pass(const sched::TaskPass &how) : how_(how) {}
+
+    // What is staged takes the place of what is stored.
+    bool takeStored(const char *name, PLATCSZHASH *form) {
+        if (!staged.any()) {
+            return take(name, form);
+        }
+        stored_.insert(name);
+        PLATCSZHASH *const stagedForm = staged.find(name);
+        return staged.stateOf(name) == sched::StagedTasks::State::Removed ||
+               take(name, stagedForm ? stagedForm : form);
     }
-    Hash hash(kCapacity);
-    if (!hash) {
-        return -1;
+    bool takeStaged() {
+        return std::all_of(staged.order().begin(), staged.order().end(),
+                           [&](const std::string &name) {
+                               PLATCSZHASH *const form = staged.find(name);
+                               return !form || stored_.contains(name) || take(name.c_str(), form);
+                           });
     }
-    sched::Allocated<TAVI_SCHED_TASK> task;
-    for (const std::string &name : names) {
-        if (!task && !(task = sched::allocateTask())) {
-            SCHED_LOG_AT(55, "malloc TAVI_SCHED_TASK failed. key:[%s]",
-                         LogText(name.c_str()).c_str());
+    bool isOutOfMemory() const { return isOutOfMemory_; }
+
+  private:
+    // False ends the pass.
+    bool take(const char *name, PLATCSZHASH *form) {
+        if (!task_ && !(task_ = sched::allocateTask())) {
+            SCHED_LOG_AT(55, "malloc TAVI_SCHED_TASK failed. key:[%s]", LogText(name).c_str());
             SCHED_SET_ERROR_AT(56, sched::kTaskOutOfMemory);
-            return -1;
+            isOutOfMemory_ = true;
+            return false;
         }
-        makeFresh(*task);
-        if (!readTask(reading.path(), name.c_str(), hash, *task, how.fresh)) {
-            *task = {}; // what it has of this section is nobody's
-            how.onUnreadable(name.c_str());
-        } else if (!how.onTask(name.c_str(), how.fresh ? task.release() : task.get())) {
-            return 0;
+        makeFresh(*task_);
+        if (!readTask(name, form, *task_, how_.fresh)) {
+            *task_ = {}; // what it has of this section is nobody's
+            how_.onUnreadable(name);
+            return true;
         }
+        return how_.onTask(name, how_.fresh ? task_.release() : task_.get());
     }
-    return 0;
+
+    const sched::TaskPass &how_;
+    sched::Allocated<TAVI_SCHED_TASK> task_;
+    std::set<std::string, std::less<>> stored_; // names in the file, when anything is staged
+    bool isOutOfMemory_ = false;
+};
+
+// Those of the file come first, then those that are new.
+int passOverAll(const sched::TaskPass &how) {
+    const sched::Reading reading;
+    bool unreadable = false;
+    if (!reading) {
+        return -1;
+    }
+    Pass pass(how);
+    bool goesOn = true;
+    const auto take = [&](const char *name, PLATCSZHASH *form) {
+        goesOn = pass.takeStored(name, form);
+        return goesOn;
+    };
+    if ((isThere(reading.path(), unreadable) && sched::forEachSection(reading.path(), take) != 0) ||
+        unreadable) {
+        return -1;
+    }
+    goesOn = goesOn && pass.takeStaged();
+    return pass.isOutOfMemory() ? -1 : 0;
 }
 
 int lookUp(int32_t id, TAVI_SCHED_TASK *task) {
@@ -180,17 +194,17 @@ int lookUp(int32_t id, TAVI_SCHED_TASK *task) {
 // An id is in use when a task has it or a section is named by it: one that cannot be read must not
 // be overwritten.
 int gatherIds(sched::StagedTasks::Ids &ids) {
-    return pass({.onTask =
-                     [&](const char *section, TAVI_SCHED_TASK *task) {
-                         ids.add(section, task->id);
-                         return true;
-                     },
-                 .onUnreadable =
-                     [&](const char *section) {
-                         if (const auto id = sched::idOfSection(section)) {
-                             ids.add(section, *id);
-                         }
-                     }});
+    return passOverAll({.onTask =
+                            [&](const char *section, TAVI_SCHED_TASK *task) {
+                                ids.add(section, task->id);
+                                return true;
+                            },
+                        .onUnreadable =
+                            [&](const char *section) {
+                                if (const auto id = sched::idOfSection(section)) {
+                                    ids.add(section, *id);
+                                }
+                            }});
 }
 
 // From 1 upward: a smallest id above 1 gives 1, else the first gap above the smallest id, else the
@@ -523,7 +537,7 @@ SectionName sectionName(int32_t id) {
 
 int forEachStoredTask(const TaskPass &how) {
     return guarded(
-        SCHED_OWN_SITE, [&] { return pass(how); }, -1);
+        SCHED_OWN_SITE, [&] { return passOverAll(how); }, -1);
 }
 
 int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {

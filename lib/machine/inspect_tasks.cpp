@@ -6,6 +6,7 @@
 #include "platc.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
+#include "sched_sections.h"
 #include "tavischeduler.h"
 
 #include <algorithm>
@@ -53,15 +54,14 @@ std::string faultsOf(PLATCSZHASH *form) {
                      words;
 }
 
-void inspectSection(const char *path, const std::string &name, Inspection &inspection) {
+void inspectSection(const std::string &name, PLATCSZHASH *form, Inspection &inspection) {
     const std::string section = "the section [" + name + "] of " + kWorkingCopy;
-    Hash form(64);
-    if (!form || PLATCFileGetSection(path, name.c_str(), form.address()) <= 0) {
+    if (!form) {
         inspection.add(section + " cannot be read", kByHand);
         return;
     }
-    const std::string faults = faultsOf(form.get());
-    const char *const id = PLATCSzHashGetValue(form.get(), "id");
+    const std::string faults = faultsOf(form);
+    const char *const id = PLATCSzHashGetValue(form, "id");
     if (!faults.empty()) {
         inspection.add(section + " " + faults, std::string(kByHand) + ", or remove it there");
     } else if (name != (id ? id : "")) {
@@ -136,11 +136,10 @@ void inspectSections(Inspection &inspection) {
     }
     const size_t before = inspection.findings.size();
     inspectHeaders(reading.path(), inspection);
-    List names(1024);
-    const int count = names ? PLATCFileEnumSection(reading.path(), names.address()) : 0;
-    for (int i = 0; i < count; ++i) {
-        inspectSection(reading.path(), PLATCSzListGet(names.get(), i), inspection);
-    }
+    forEachSection(reading.path(), [&](const char *name, PLATCSZHASH *form) {
+        inspectSection(name, form, inspection);
+        return true;
+    });
     inspection.areSectionsGood = inspection.findings.size() == before;
 }
 

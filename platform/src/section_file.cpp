@@ -1,10 +1,6 @@
-// Section files. A file is read whole; where its sections begin and end follows from the lines that
-// begin with "[" alone, and a section's pairs are split when it is asked for. Who asks for one
-// section or two gets them out of a small window that moves along the file. For who asks for more
-// the file is read whole and remembered, so that reading all of its sections by name takes one
-// pass. It is served only while device, inode, size, times and the asking user are the same, and
-// only when a change since could not have left the same times: within one tick of the file system's
-// clock it could, and then the file is read again.
+// Section files. Where the sections of a file begin and end follows from the lines that begin with
+// "[" alone, and a section's pairs are split when it is asked for. Who asks for one section gets it
+// out of a small window that moves along the file; all of them come from one reading of the whole.
 #include "base/file.h"
 #include "containers.h"
 #include "file.h"
@@ -97,19 +93,40 @@ std::optional<Section> findFirst(std::string_view text, std::string_view name) {
     return section;
 }
 
-void readPairs(std::string_view text, const Section &section, PLATCSZHASH &hash) {
-    auto &pairs = hash.pairs;
+template <typename Function>
+void forEachPair(std::string_view text, const Section &section, Function &&onPair) {
     for (size_t at = section.body; at < section.end; at = afterLine(text, at)) {
         const std::string_view line = lineAt(text, at);
         const size_t equals = line.find('=');
-        if (equals == std::string_view::npos || equals == 0) {
-            continue;
+        if (equals != std::string_view::npos && equals != 0) {
+            onPair(line.substr(0, equals), line.substr(equals + 1));
         }
-        const std::string_view key = line.substr(0, equals);
-        const std::string_view value = line.substr(equals + 1);
+    }
+}
+
+void readPairs(std::string_view text, const Section &section, PLATCSZHASH &hash) {
+    auto &pairs = hash.pairs;
+    forEachPair(text, section, [&](std::string_view key, std::string_view value) {
         // Sections that this file wrote are in the map's order: the hint makes each insert
         // immediate.
         pairs.insert_or_assign(pairs.end(), std::string(key), std::string(value));
+    });
+}
+
+// The same in the place of what the hash holds. Sections of one file mostly have the same keys, and
+// then the values alone are new.
+void replacePairs(std::string_view text, const Section &section, PLATCSZHASH &hash) {
+    auto next = hash.pairs.begin();
+    bool isSame = true;
+    forEachPair(text, section, [&](std::string_view key, std::string_view value) {
+        isSame = isSame && next != hash.pairs.end() && next->first == key;
+        if (isSame) {
+            (next++)->second = value;
+        }
+    });
+    if (!isSame || next != hash.pairs.end()) {
+        hash.pairs.clear();
+        readPairs(text, section, hash);
     }
 }
 
@@ -136,125 +153,14 @@ void appendSection(std::string &text, std::string_view section, const PLATCSZHAS
     }
 }
 
-// ---- A file in memory ----
-
-class SectionFile {
-  public:
-    explicit SectionFile(std::string text) : text_(std::move(text)) {}
-    SectionFile(const SectionFile &) = delete;
-    SectionFile &operator=(const SectionFile &) = delete;
-
-    const std::string &text() const { return text_; }
-    // The names in file order, each once.
-    std::vector<std::string> names();
-    // The first section of that name, or nothing.
-    std::optional<Section> find(std::string_view name);
-
-  private:
-    using Index = std::unordered_map<std::string_view, Section>;
-
-    const Index &index();
-
-    std::string text_;
-    Index index_; // the first section of each name; made when somebody asks
-};
-
-const SectionFile::Index &SectionFile::index() {
-    if (index_.empty()) {
-        Index whole; // an unfinished one would hide sections
-        for (auto section = sectionFrom(text_, 0); section;
-             section = sectionFrom(text_, section->end)) {
-            whole.emplace(section->name, *section);
-        }
-        index_ = std::move(whole);
-    }
-    return index_;
-}
-
-std::vector<std::string> SectionFile::names() {
-    std::vector<std::string> names;
-    names.reserve(index().size());
-    for (auto section = sectionFrom(text_, 0); section;
-         section = sectionFrom(text_, section->end)) {
-        if (index().at(section->name).header == section->header) {
-            names.emplace_back(section->name);
+// Calls `onSection` for the first section of each name until it answers false.
+template <typename Function> void forEachFirst(std::string_view text, Function &&onSection) {
+    std::unordered_set<std::string_view> names;
+    for (auto section = sectionFrom(text, 0); section; section = sectionFrom(text, section->end)) {
+        if (names.insert(section->name).second && !onSection(*section)) {
+            return;
         }
     }
-    return names;
-}
-
-std::optional<Section> SectionFile::find(std::string_view name) {
-    const auto found = index().find(name);
-    return found == index().end() ? std::nullopt : std::optional(found->second);
-}
-
-using Identity = std::tuple<dev_t, ino_t, off_t, time_t, long, time_t, long, uid_t>;
-
-Identity identityOf(const struct stat &status) {
-    return {status.st_dev,          status.st_ino,
-            status.st_size,         status.st_mtim.tv_sec,
-            status.st_mtim.tv_nsec, status.st_ctim.tv_sec,
-            status.st_ctim.tv_nsec, geteuid()};
-}
-
-// Whether a change at this moment or later would get another time than this one. File systems stamp
-// by the kernel's tick, or by seconds when there are no nanoseconds.
-bool wouldShow(const timespec &stamp, const timespec &now) {
-    constexpr time_t kMargin = 2;
-    if (stamp.tv_sec > now.tv_sec + kMargin) {
-        return true;
-    }
-    if (stamp.tv_nsec == 0) {
-        return stamp.tv_sec + kMargin <= now.tv_sec;
-    }
-    return std::tie(stamp.tv_sec, stamp.tv_nsec) < std::tie(now.tv_sec, now.tv_nsec);
-}
-
-bool changeWouldShow(const struct stat &status) {
-    timespec now{};
-    clock_gettime(CLOCK_REALTIME_COARSE, &now);
-    return wouldShow(status.st_mtim, now) && wouldShow(status.st_ctim, now);
-}
-
-struct Remembered {
-    std::string path;
-    Identity identity;
-    bool settled = false; // a change after the reading shows in the identity
-    std::unique_ptr<SectionFile> file;
-};
-
-Remembered remembered;
-
-// What is remembered of the file, as long as it may be served.
-SectionFile *recall(const char *path) {
-    struct stat status {};
-    const bool serves = remembered.settled && remembered.path == path && stat(path, &status) == 0 &&
-                        identityOf(status) == remembered.identity && changeWouldShow(status);
-    return serves ? remembered.file.get() : nullptr;
-}
-
-// The file as it is now, read anew. Nothing with the error state set.
-SectionFile *remember(const char *path) {
-    remembered.settled = false;
-    struct stat before {};
-    const bool settled = stat(path, &before) == 0 && changeWouldShow(before);
-    auto content = platform::readFile(path);
-    if (!content) {
-        return nullptr;
-    }
-    if (!remembered.file || remembered.file->text() != content->text) {
-        remembered.file = std::make_unique<SectionFile>(std::move(content->text));
-    }
-    remembered.path = path;
-    remembered.identity = identityOf(content->status);
-    remembered.settled = settled && identityOf(before) == remembered.identity;
-    return remembered.file.get();
-}
-
-// The file as it is now; valid until the next call. Nothing with the error state set.
-SectionFile *load(const char *path) {
-    SectionFile *const recalled = recall(path);
-    return recalled ? recalled : remember(path);
 }
 
 // ---- One section alone ----
@@ -283,25 +189,9 @@ std::optional<std::string> readSectionText(int fd, std::string_view name) {
     }
 }
 
-// How often sections of a file that is not remembered were asked for.
-struct Asked {
-    Identity identity;
-    int times = 0;
-};
-
-Asked asked;
-
-bool asksForMore(const struct stat &status) {
-    constexpr int kTimesAlone = 2;
-    if (asked.identity != identityOf(status)) {
-        asked = {.identity = identityOf(status), .times = 0};
-    }
-    return asked.times++ >= kTimesAlone;
-}
-
 // 1 found and read into the hash, 0 no such section, -1.
-int readSectionAlone(const base::Opened &opened, std::string_view name, PLATCSZHASH &hash) {
-    const auto text = readSectionText(opened.file.get(), name);
+int readSection(int fd, std::string_view name, PLATCSZHASH &hash) {
+    const auto text = readSectionText(fd, name);
     if (!text) {
         return PLATFORM_FAIL(platform::kReadWriteFailed);
     }
@@ -312,28 +202,16 @@ int readSectionAlone(const base::Opened &opened, std::string_view name, PLATCSZH
     return section ? 1 : 0;
 }
 
-int readSectionOf(SectionFile &file, std::string_view name, PLATCSZHASH &hash) {
-    const auto section = file.find(name);
-    if (!section) {
-        return 0;
-    }
-    readPairs(file.text(), *section, hash);
-    if (!sectionFrom(file.text(), section->end)) {
-        remembered = {}; // a pass over all sections ends here: so does the need for memory
-    }
-    return 1;
-}
-
 // ---- Changes ----
 
 // The text to be changed by a writer that makes a missing file. Nothing with the error state set.
-std::optional<std::string_view> textToChange(const char *path) {
+std::optional<std::string> textToChange(const char *path) {
     const int there = platform::isThere(path);
-    const SectionFile *const file = there == 1 ? load(path) : nullptr;
-    if (there < 0 || (there == 1 && !file)) {
-        return std::nullopt;
+    if (there <= 0) {
+        return there == 0 ? std::optional<std::string>("") : std::nullopt;
     }
-    return file ? std::string_view(file->text()) : std::string_view();
+    auto content = platform::readFile(path);
+    return content ? std::optional(std::move(content->text)) : std::nullopt;
 }
 
 struct Change {
@@ -373,14 +251,14 @@ std::string changed(std::string_view text, std::span<const Change> changes) {
 
 // 1 done, 0 when there is no such section, -1.
 int changeExisting(const char *path, const Change &change) {
-    const SectionFile *const file = load(path);
-    if (!file) {
+    const auto content = platform::readFile(path);
+    if (!content) {
         return -1;
     }
-    if (!findFirst(file->text(), change.name)) {
+    if (!findFirst(content->text, change.name)) {
         return 0;
     }
-    return platform::replaceFile(path, changed(file->text(), {&change, 1})) == 0 ? 1 : -1;
+    return platform::replaceFile(path, changed(content->text, {&change, 1})) == 0 ? 1 : -1;
 }
 
 // ---- Faults ----
@@ -413,11 +291,16 @@ int PLATCFileEnumSection(const char *szPath, PLATCSZLIST **ppList) {
     }
     return guarded(
         [&] {
-            SectionFile *const file = load(szPath);
-            if (!file) {
+            const auto content = platform::readFile(szPath);
+            if (!content) {
                 return -1;
             }
-            (*ppList)->texts = file->names();
+            std::vector<std::string> names;
+            forEachFirst(content->text, [&](const Section &section) {
+                names.emplace_back(section.name);
+                return true;
+            });
+            (*ppList)->texts = std::move(names);
             return static_cast<int>((*ppList)->texts.size());
         },
         -1);
@@ -429,15 +312,33 @@ int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH *
     }
     return guarded(
         [&] {
-            SectionFile *file = recall(szPath);
-            if (!file) {
-                const auto opened = platform::openFile(szPath);
-                if (!opened || !asksForMore(opened->status)) {
-                    return opened ? readSectionAlone(*opened, szSection, **ppHash) : -1;
-                }
-                file = remember(szPath);
+            const auto opened = platform::openFile(szPath);
+            return opened ? readSection(opened->file.get(), szSection, **ppHash) : -1;
+        },
+        -1);
+}
+
+int PLATCFileForEachSection(const char *szPath,
+                            int (*pfOnSection)(void *pContext, const char *szSection,
+                                               PLATCSZHASH *pHash),
+                            void *pContext) {
+    if (!szPath || !pfOnSection) {
+        return PLATFORM_FAIL(platform::kInvalidArgument);
+    }
+    return guarded(
+        [&] {
+            const auto content = platform::readFile(szPath);
+            if (!content) {
+                return -1;
             }
-            return file ? readSectionOf(*file, szSection, **ppHash) : -1;
+            int calls = 0;
+            PLATCSZHASH hash;
+            forEachFirst(content->text, [&](const Section &section) {
+                replacePairs(content->text, section, hash);
+                ++calls;
+                return pfOnSection(pContext, std::string(section.name).c_str(), &hash) == 0;
+            });
+            return calls;
         },
         -1);
 }

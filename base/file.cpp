@@ -101,8 +101,13 @@ bool writeAll(int fd, std::string_view content) {
     return true;
 }
 
-bool syncFolderOf(const std::string &path) {
-    return syncFolder(openFolder(folderOf(path)));
+bool syncFolderOf(const char *path) noexcept {
+    try {
+        return syncFolder(openFolder(folderOf(path)));
+    } catch (const std::bad_alloc &) {
+        errno = ENOMEM;
+        return false;
+    }
 }
 
 bool makeEmpty(const char *path) {

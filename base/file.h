@@ -24,7 +24,7 @@ std::optional<std::string> readAll(int fd);
 bool writeAll(int fd, std::string_view content);
 
 // Flushes the entries of the path's folder to the disk.
-bool syncFolderOf(const std::string &path);
+bool syncFolderOf(const char *path) noexcept;
 
 // Makes an empty file of mode 0600 where nothing is, not even a link.
 bool makeEmpty(const char *path);

@@ -17,7 +17,7 @@ int TAVISchedTaskCreate(TAVI_SCHED_TASK *pTask) {
     const auto result =
         sched::dispatch(SCHED_SITE, "create", pTask, &TAVI_SCHED_BACKEND_RECORD::create);
     if (result == 0) {
-        sched::whenStored([id = pTask->id] { sched::separateFromNewTask(id); });
+        sched::whenStored(sched::separateFromNewTask, pTask->id);
     }
     if (result) {
         return *result;
@@ -65,6 +65,6 @@ int TAVISchedTaskCreateWithId(TAVI_SCHED_TASK *pTask) {
     if (result != 0 || change.finish() != 0) {
         return -1;
     }
-    sched::whenStored([id = pTask->id] { sched::separateFromNewTask(id); });
+    sched::whenStored(sched::separateFromNewTask, pTask->id);
     return 0;
 }

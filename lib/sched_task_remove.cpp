@@ -41,7 +41,7 @@ int TAVISchedTaskRemove(int32_t id) {
     sched::ChangeHook hook(SCHED_SITE, "task_remove", &oldTask, nullptr);
     const int result = hook.initialised() ? removeBetweenHooks(hook, id, oldTask.backend) : -1;
     if (result == 0) {
-        sched::whenStored([id] { sched::separateFromRemovedTask(id); });
+        sched::whenStored(sched::separateFromRemovedTask, id);
     }
     if (sched::isBatchOpen()) {
         sched::deferHook(hook, result);

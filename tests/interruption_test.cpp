@@ -12,6 +12,9 @@
 #include <cstring>
 #include <fcntl.h>
 #include <functional>
+#ifdef __SANITIZE_ADDRESS__
+#include <sanitizer/lsan_interface.h>
+#endif
 
 namespace {
 
@@ -47,13 +50,16 @@ int edited() {
 
 int saved() {
     TAVI_SCHED_TASK task{};
-    std::vector<char> json(160 << 10);
-    const bool read = TAVISchedTaskGetByID(3, &task) == 0;
+    static std::array<char, 160 << 10> json;
+    if (TAVISchedTaskGetByID(3, &task) != 0) {
+        return 1;
+    }
     task.runMin = 17;
-    return read && TAVISchedTaskConvertToJson(&task, json.data(), json.size()) >= 0 &&
-                   TAVISchedTaskSaveFromJson(json.data(), 0) == 3
-               ? 0
-               : 1;
+    {
+        const OwnAllocations own;
+        TAVISchedTaskConvertToJson(&task, json.data(), json.size());
+    }
+    return TAVISchedTaskSaveFromJson(json.data(), 0) == 3 ? 0 : 1;
 }
 
 int batchDone() {
@@ -352,6 +358,69 @@ TEST_P(Failing, Calls) {
         }
     }
     report(operation, "a call failed", tried, held);
+}
+
+// What the function answers in a process of its own; more than 9 when it crashes there, throws or
+// leaks.
+int answerInChild(const std::function<int()> &function) {
+    const pid_t child = fork();
+    if (child == 0) {
+        int answer = 10;
+        try {
+            answer = function();
+        } catch (const std::exception &) {
+            _exit(answer);
+        }
+#ifdef __SANITIZE_ADDRESS__
+        _exit(__lsan_do_recoverable_leak_check() == 0 ? answer : 10);
+#endif
+        _exit(answer);
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 10 + WTERMSIG(status);
+}
+
+// The same for memory that is not there: every allocation, or, where nobody asks for all with
+// TAVI_TEST_ALL, some of them.
+TEST_P(Failing, Allocations) {
+    const Operation &operation = GetParam();
+    ASSERT_NO_FATAL_FAILURE(learn(operation));
+    constexpr int kNotReached = 3;
+    const auto run = [&](size_t failing) {
+        return answerInChild([&] {
+            PLATCErrSetEx(0, "", 0);
+            fakes.allocations = 0;
+            fakes.failingAllocation = failing;
+            const int result = operation.run();
+            const bool isReached = fakes.allocations >= failing;
+            fakes.failingAllocation = 0;
+            const unsigned int code = PLATCErrGet();
+            const bool isKnown =
+                code == 0 || isDocumented(code); // a text that is no JSON sets none
+            return !isReached ? kNotReached : result == 0 ? 0 : isKnown ? 1 : 2;
+        });
+    };
+    size_t tried = 0;
+    size_t held = 0;
+    const size_t step = std::getenv("TAVI_TEST_ALL") ? 1 : 7 * kStep;
+    for (size_t failing = 1;; failing += step) {
+        start_->restore();
+        logs();
+        const int answer = run(failing);
+        if (answer == kNotReached) {
+            break;
+        }
+        ++tried;
+        const auto lines = logs();
+        const std::string found = faultsOfFailed(operation, answer);
+        held += found.empty() ? 1 : 0;
+        if (!found.empty() && tried - held <= 5) {
+            ADD_FAILURE() << operation.name << ", allocation " << failing << ": " << found << "\n"
+                          << testing::PrintToString(lines);
+        }
+    }
+    report(operation, "an allocation failed", tried, held);
 }
 
 class TakingBack : public Interruption {};

@@ -133,7 +133,10 @@ int powerCreated(uint32_t hour) {
         return 1;
     }
     task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-    TAVISchedTaskGetDefault(task.get());
+    {
+        const OwnAllocations own;
+        TAVISchedTaskGetDefault(task.get());
+    }
     TAVISchedCTaskSetAppArgs(task.get(), "poweroff");
     task->runHour = hour;
     return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;

@@ -11,6 +11,7 @@
 #include <dlfcn.h>
 #include <filesystem>
 #include <fstream>
+#include <new>
 #include <regex>
 #include <sqlite3.h>
 #include <sstream>
@@ -140,6 +141,7 @@ time_t at(const char *moment) {
 }
 
 Task newTask(const char *command) {
+    const OwnAllocations own;
     Task task(TAVISchedTaskAlloc(), TAVISchedTaskFree);
     TAVISchedCTaskSetCommand(task.get(), command);
     return task;
@@ -259,7 +261,8 @@ int usleep(useconds_t microseconds) {
 void *REAL_CALLOC(size_t count, size_t size);
 
 void *calloc(size_t count, size_t size) noexcept {
-    if (fakes.callocFails > 0 && count * size >= fakes.callocFails) {
+    const bool fails = ++fakes.allocations == fakes.failingAllocation;
+    if (fails || (fakes.callocFails > 0 && count * size >= fakes.callocFails)) {
         errno = ENOMEM;
         return nullptr;
     }
@@ -267,6 +270,7 @@ void *calloc(size_t count, size_t size) noexcept {
 }
 
 int rename(const char *from, const char *to) noexcept {
+    const support::OwnAllocations own;
     auto *const real = support::next<int (*)(const char *, const char *)>("rename");
     support::calledOnFiles.push_back("rename " + std::string(from) + " " + to);
     errno = EXDEV;
@@ -274,6 +278,7 @@ int rename(const char *from, const char *to) noexcept {
 }
 
 int fsync(int fd) {
+    const support::OwnAllocations own;
     std::error_code error;
     const auto path = std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd), error);
     support::calledOnFiles.push_back("fsync " + path.string());
@@ -284,6 +289,18 @@ int fsync(int fd) {
 }
 
 } // extern "C"
+
+void *operator new(size_t size) {
+    void *const memory =
+        ++fakes.allocations == fakes.failingAllocation ? nullptr : std::malloc(size);
+    return memory ? memory : throw std::bad_alloc();
+}
+void operator delete(void *memory) noexcept {
+    std::free(memory);
+}
+void operator delete(void *memory, size_t) noexcept {
+    std::free(memory);
+}
 
 int main(int argc, char **argv) {
     // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may

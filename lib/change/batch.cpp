@@ -19,10 +19,15 @@ struct Deferred {
     int result;
 };
 
+struct Consequence {
+    void (*act)(int32_t id);
+    int32_t id;
+};
+
 struct Batch {
     sched::Change change;
     std::vector<Deferred> hooks;
-    std::vector<std::function<void()>> consequences;
+    std::vector<Consequence> consequences;
 };
 
 std::unique_ptr<Batch> batch;
@@ -58,9 +63,9 @@ void end(std::unique_ptr<Batch> ended, bool stored) {
     const auto consequences = std::move(ended->consequences);
     ended.reset();
     const sched::KeptError error;
-    for (const auto &consequence : consequences) {
+    for (const Consequence &consequence : consequences) {
         if (stored) {
-            consequence();
+            consequence.act(consequence.id);
         }
     }
     for (Deferred &deferred : hooks) {
@@ -133,11 +138,16 @@ void sched::deferHook(ChangeHook &hook, int result) {
     }
 }
 
-void sched::whenStored(std::function<void()> consequence) {
-    if (batch) {
-        batch->consequences.push_back(std::move(consequence));
-    } else {
-        consequence();
+void sched::whenStored(void (*consequence)(int32_t id), int32_t id) {
+    const bool isKept = batch && guarded(
+                                     SCHED_SITE,
+                                     [&] {
+                                         batch->consequences.push_back({consequence, id});
+                                         return true;
+                                     },
+                                     false);
+    if (!isKept) {
+        consequence(id);
     }
 }
 

@@ -5,7 +5,6 @@
 #include "change_record.h"
 #include "sched_hook.h"
 
-#include <functional>
 
 namespace sched {
 
@@ -28,7 +27,8 @@ bool isBatchOpen();
 // with -1 when the batch is rolled back.
 void deferHook(ChangeHook &hook, int result);
 
-// What follows from a change that is stored: done at once, or when the batch has been stored.
-void whenStored(std::function<void()> consequence);
+// What follows for an id from a change that is stored: done at once, or when the batch has been
+// stored; also at once when there is no memory to remember it.
+void whenStored(void (*consequence)(int32_t id), int32_t id);
 
 } // namespace sched

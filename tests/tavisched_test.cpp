@@ -172,7 +172,7 @@ TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
         const std::string add = std::string("add --command x ") + c.options;
         EXPECT_THAT(done(add + " --dry-run"),
                     HasSubstr("Schedule: " + std::string(c.words) + "\nCrontab line: " + line +
-                              "\nNext run: "));
+                              "\nNext runs: "));
         EXPECT_EQ(done(add + " --dry-run -q"), std::to_string(id) + "\n");
         EXPECT_EQ(done(add + " --quiet"), std::to_string(id) + "\n");
         EXPECT_THAT(readFile(kCrontab), HasSubstr(line + "\n"));

@@ -8,6 +8,7 @@ import { listView } from "./list.js";
 import { findings, machineView } from "./machine.js";
 import { powerView } from "./power.js";
 import { taskView } from "./task.js";
+import { changes } from "./tavisched.js";
 import { texts } from "./texts.js";
 import { followTheme } from "./theme.js";
 import { alert, button, loading } from "./ui.js";
@@ -117,6 +118,7 @@ cockpit.transport.wait(() => {
     cockpit.addEventListener("locationchanged", open);
     open();
     lookAtMachine();
+    changes.addEventListener("changed", refresh);
     watchChanges(refresh, () => Boolean(shown.view.isRunning?.()));
     cockpit.permission({ admin: true }).addEventListener("changed", refresh);
 });

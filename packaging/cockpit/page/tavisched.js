@@ -2,6 +2,9 @@
 
 import { texts } from "./texts.js";
 
+// Has the event "changed" after every change that was made or tried here.
+export const changes = new EventTarget();
+
 // What the command line refused or failed at. `option` is the one that it is about, where there is one.
 export class Refusal extends Error {
     constructor(message, option) {
@@ -22,7 +25,8 @@ function refusalOf(exception) {
         try {
             const told = JSON.parse(line);
             if (told.error) {
-                return new Refusal(told.error, told.option);
+                // A field's name stands beside it already.
+                return new Refusal(told.error.replace(/^--[a-z-]+: /, ""), told.option);
             }
         } catch {
             // a warning
@@ -78,8 +82,13 @@ export async function readLines(args, options) {
     return text.split("\n").filter(line => line).map(line => JSON.parse(line));
 }
 
-export function change(args, options) {
-    return answerOf(start([...args, "--json"], "require"), options);
+// A change tells the page: it need not wait for the files.
+export async function change(args, options) {
+    try {
+        return await answerOf(start([...args, "--json"], "require"), options);
+    } finally {
+        changes.dispatchEvent(new Event("changed"));
+    }
 }
 
 // The output of a run as it comes. The answer's `close` stops the following, not the run.

@@ -9,6 +9,7 @@ import { clockOf, dayOf, inWords, weekdayOf } from "./times.js";
 const day = 24 * 3600 * 1000;
 const top = 44;
 const narrowWidth = 640;
+const narrowDay = 90;
 const hourSteps = [1, 3, 6, 12];
 const hourRoom = 34; // pixels that a written hour takes
 
@@ -35,19 +36,15 @@ function path(d, props, title) {
     return h("path", { d, ...props }, title && h("title", null, title));
 }
 
-// The machine's wall clock, also where the browser is elsewhere: days begin where the first one does.
 function days(calendar, layout) {
-    const marks = [];
-    for (let time = layout.from; time < layout.until; time += day) {
-        const x = layout.x(new Date(time).toISOString());
-        const date = new Date(Date.parse(dayOf(calendar.from) + "T00:00Z") + time - layout.from).toISOString();
-        marks.push(h("line", { x1: x, x2: x, y1: 8, y2: layout.height, class: "day-line" }));
-        marks.push(h("text", { x: x + 4, y: 18, class: "day-name" },
-                     layout.dayWidth < 90 ? `${weekdayOf(date)} ${Number(date.slice(8, 10))}`
-                                          : `${weekdayOf(date)} ${dayOf(date)}`));
-        marks.push(...hours(x, layout));
-    }
-    return marks;
+    return calendar.days.map(time => {
+        const x = layout.x(time);
+        return [h("line", { x1: x, x2: x, y1: 8, y2: layout.height, class: "day-line" }),
+                h("text", { x: x + 4, y: 18, class: "day-name" },
+                  layout.dayWidth < narrowDay ? `${weekdayOf(time)} ${Number(time.slice(8, 10))}`
+                                              : `${weekdayOf(time)} ${dayOf(time)}`),
+                hours(x, layout)];
+    });
 }
 
 function hours(x, layout) {

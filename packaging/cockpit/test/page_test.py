@@ -239,6 +239,7 @@ class PageTest(unittest.TestCase):
         machine.until(lambda: stored() == [("poweroff", WEEKDAYS, 22, 15, "enabled")], "the schedule is edited")
         page.press("Enabled: Power off, Mon-Fri 22:15")
         machine.until(lambda: stored() == [("poweroff", WEEKDAYS, 22, 15, "disabled")], "the schedule is disabled")
+        page.until_text("never", "tbody")
         page.press("Remove: Power off, Mon-Fri 22:15")
         page.answer("Remove")
         machine.until(lambda: stored() == [], "the schedule is removed")
@@ -332,7 +333,7 @@ class Looks:
             page.find("summary").click()
         if name == "add":
             page.press("Save")
-            page.until_text("empty", ".wrong .error")
+            page.until_text("it is empty", ".wrong .error")
         page.driver.execute_script("scrollTo(0, 0)")
         time.sleep(0.2)  # the switches have moved
         self.save(f"{name}-{'narrow' if width < 600 else style}.png")

@@ -11,7 +11,7 @@ import { taskView } from "./task.js";
 import { changes } from "./tavisched.js";
 import { texts } from "./texts.js";
 import { followTheme } from "./theme.js";
-import { alert, button, loading } from "./ui.js";
+import { alert, button, link, loading } from "./ui.js";
 import { weekView } from "./week.js";
 
 const tabs = [["", texts.tasks], ["week", texts.week], ["power", texts.power], ["machine", texts.machine]];
@@ -61,7 +61,7 @@ function draw(part) {
     }
     const { view, isLoaded, failure } = part;
     render(main, failure && alert("danger", texts.cannotLoad, h("p", null, failure.message),
-                                  button(texts.tryAgain, () => load(part))),
+                                  h("div", { class: "row" }, button(texts.tryAgain, () => load(part)), link(texts.toList))),
            isLoaded ? h("div", { key: part.key }, view.render()) : !failure && loading());
     document.title = `${view.title} - ${texts.title}`;
 }

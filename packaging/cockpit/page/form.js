@@ -8,8 +8,7 @@ import { newValues, optionsToAdd, optionsToEdit, valuesOf } from "./schedule.js"
 import { isPower, may, powerName } from "./tasks.js";
 import { change, read, readJson } from "./tavisched.js";
 import { texts } from "./texts.js";
-import { fromNow, inWords } from "./times.js";
-import { alert, button, card, go } from "./ui.js";
+import { alert, button, card, go, moment } from "./ui.js";
 
 const pause = 400; // milliseconds without typing
 
@@ -24,13 +23,18 @@ function preview(redraw) {
             clearTimeout(timer);
             timer = setTimeout(async () => {
                 const mine = ++asked;
-                const answer = await read(["add", "--dry-run", "--json", ...args]).then(
+                const answer = await read([...args, "--dry-run", "--json"]).then(
                     text => ({ task: JSON.parse(text), failure: null }), failure => ({ task: null, failure }));
                 if (mine === asked) {
                     Object.assign(state, answer);
                     redraw();
                 }
             }, pause);
+        },
+        show(task) {
+            ++asked; // answers on their way are no longer of interest
+            clearTimeout(timer);
+            Object.assign(state, { task, failure: null });
         },
         close: () => clearTimeout(timer),
     };
@@ -91,13 +95,11 @@ function powerFields(values, set, task) {
                                onchange: () => set("power", value) }), title))));
 }
 
-function previewCard({ task, failure }, isEdit) {
-    const starts = task?.starts || [];
+function previewCard({ task, failure }) {
     return card(texts.preview, { class: "card preview", "aria-live": "polite" },
         task ? [h("p", null, task.schedule),
-                h("ol", { class: "plain-list" }, starts.map(time =>
-                    h("li", null, inWords(time), " ", h("span", { class: "faint" }, fromNow(time))))),
-                !isEdit && (task.notes || []).map(note => alert("warning", note))]
+                h("ol", { class: "plain-list" }, (task.starts || []).map(time => h("li", null, moment(time)))),
+                (task.notes || []).map(note => alert("warning", note))]
              : h("p", { class: "faint" }, failure ? failure.message : texts.noPreview));
 }
 
@@ -119,9 +121,22 @@ export function formView(redraw, { id, power = false }) {
     let values = newValues(today());
     let before = null;
 
+    // The times are shown before there is a command.
+    const look = () => {
+        const { command } = values;
+        const known = { ...values, command: command.trim() === "" ? "true" : command };
+        const options = id ? optionsToEdit(known, before, power) : optionsToAdd(known, power);
+        if (!id) {
+            seen.ask(["add", ...options]);
+        } else if (options.length > 0) {
+            seen.ask(["edit", ...options, id]);
+        } else {
+            seen.show(task);
+        }
+    };
     const set = (name, value) => {
         values = { ...values, [name]: value };
-        seen.ask(optionsToAdd(values, power));
+        look();
         redraw();
     };
     const back = () => power ? go("power") : id ? go("task", id) : go();
@@ -157,7 +172,7 @@ export function formView(redraw, { id, power = false }) {
                 before = valuesOf(task);
                 values = before;
             }
-            seen.ask(optionsToAdd(values, power));
+            look();
         },
         render() {
             const make = fieldMaker(state.failure);
@@ -172,7 +187,7 @@ export function formView(redraw, { id, power = false }) {
                     scheduleFields(values, set, make, power),
                     checkbox(texts.isEnabled, values.enabled, event => set("enabled", event.target.checked)),
                     !power && checkbox(texts.mayOverlap, values.overlap, event => set("overlap", event.target.checked))),
-                  previewCard(seen.state, Boolean(id))),
+                  previewCard(seen.state)),
                 rest(make),
                 h("div", { class: "row" },
                   h("button", { type: "submit", class: "button primary", disabled: state.isBusy }, texts.save),

@@ -6,8 +6,8 @@ import { exportTasks } from "./exchange.js";
 import { isEnabled, isPower, isRunning, kindOf, may, startOf } from "./tasks.js";
 import { readJson } from "./tavisched.js";
 import { texts } from "./texts.js";
-import { fromNow, inWords } from "./times.js";
-import { button, empty, go, label, link, table, toggle } from "./ui.js";
+import { fromNow } from "./times.js";
+import { button, empty, go, label, link, moment, table, toggle } from "./ui.js";
 
 const filters = {
     all: () => true,
@@ -33,8 +33,7 @@ export function runLabel(lastRun) {
 }
 
 export function nextStart(task) {
-    return task.nextStart ? [inWords(task.nextStart), " ", h("span", { class: "faint" }, fromNow(task.nextStart))]
-                          : texts.never;
+    return task.nextStart ? moment(task.nextStart) : texts.never;
 }
 
 export function stateOf(task) {

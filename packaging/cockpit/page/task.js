@@ -7,8 +7,7 @@ import { nextStart, runLabel, stateOf } from "./list.js";
 import { isPower, isRunning, may } from "./tasks.js";
 import { readJson } from "./tavisched.js";
 import { texts } from "./texts.js";
-import { fromNow, inWords } from "./times.js";
-import { alert, button, card, fields, go, link } from "./ui.js";
+import { alert, button, card, fields, go, link, moment } from "./ui.js";
 
 const flags = ["listable", "canEditFromUI", "canEditName", "canEditOwner", "canRunFromUI", "canDeleteFromUI",
                "simpleEditForm"];
@@ -55,8 +54,7 @@ function details(task) {
 function coming(starts) {
     return card(texts.coming, null, starts.length === 0
         ? h("p", null, texts.noComing)
-        : h("ol", { class: "plain-list" }, starts.map(time =>
-            h("li", null, inWords(time), " ", h("span", { class: "faint" }, fromNow(time))))));
+        : h("ol", { class: "plain-list" }, starts.map(time => h("li", null, moment(time)))));
 }
 
 export function taskView(redraw, id) {

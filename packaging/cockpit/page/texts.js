@@ -73,10 +73,8 @@ export const texts = {
     noMatch: _("No task is like that"),
     clear: _("Clear the search"),
     shown: (shown, all) => format(_("$0 of $1 tasks"), shown, all),
-    attention: _("Remarkable"),
 
     // One task
-    noSuchTask: _("This task is no longer there"),
     toList: _("All tasks"),
     details: _("Details"),
     command: _("Command"),
@@ -137,7 +135,6 @@ export const texts = {
     mayOverlap: _("Start it also while an earlier run goes on"),
     preview: _("It would run"),
     noPreview: _("Shown when the schedule is complete."),
-    required: _("required"),
     fixed: _("This cannot be changed here."),
 
     // Timeline
@@ -147,7 +144,6 @@ export const texts = {
     timelineText: (tasks, from, until) => format(_("$0 tasks from $1 to $2; the same as a table below"), tasks, from, until),
     legend: { start: _("will run"), ok: _("went well"), failed: _("failed"), running: _("runs or waits"),
               missed: _("did not run"), off: _("machine off"), busy: _("several at one minute") },
-    comingOf: name => format(_("$0 will run"), name),
     now: _("now"),
     when2: _("Time"),
     task: _("Task"),
@@ -173,7 +169,6 @@ export const texts = {
     problem: _("Problem"),
     note: _("Note"),
     repair: _("Repair"),
-    repairText: _("What needs no person can be repaired now."),
     repaired: what => format(_("Repaired: $0"), what),
     nothingRepaired: _("Nothing could be repaired."),
     toTask: id => format(_("Task $0"), id),

@@ -2,6 +2,7 @@
 
 import { h } from "./dom.js";
 import { texts } from "./texts.js";
+import { fromNow, inWords } from "./times.js";
 
 export function go(...path) {
     cockpit.location.go(path.map(String));
@@ -19,6 +20,11 @@ export function button(text, onclick, { kind = "secondary", ...props } = {}) {
 // A word with a colour; the word alone says it all.
 export function label(kind, text) {
     return h("span", { class: `label ${kind}` }, text);
+}
+
+// A time, and how far away it is.
+export function moment(time) {
+    return [h("time", { datetime: time }, inWords(time)), " ", h("span", { class: "faint" }, fromNow(time))];
 }
 
 export function alert(kind, title, ...body) {

@@ -110,9 +110,8 @@ expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavis
     /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/{copyright,examples/task.c}
 expect_files tavischeduler-cockpit /usr/share/cockpit/tavischeduler/{manifest.json,index.html,app.js,page.css} \
     /usr/share/doc/tavischeduler-cockpit/{copyright,changelog.Debian.gz}
-expect "the page depends on: $(dpkg -s tavischeduler-cockpit | grep ^Depends:)" \
-    grep -qE '^Depends: cockpit-bridge, tavischeduler \(= |^Depends: tavischeduler \(= .*, cockpit-bridge' \
-    <(dpkg -s tavischeduler-cockpit)
+expect "the page depends on other packages" \
+    grep -q '^Depends: tavischeduler (= .*), cockpit-bridge$' <(dpkg -s tavischeduler-cockpit)
 expect "programs look for libraries elsewhere" \
     [ -z "$(readelf -d /usr/sbin/tavisched{,task} "$lib"/libtavi*.so | grep -E 'R(UN)?PATH')" ]
 expect_only_cron_missing

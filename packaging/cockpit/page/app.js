@@ -15,6 +15,7 @@ import { alert, button, link, loading } from "./ui.js";
 import { weekView } from "./week.js";
 
 const tabs = [["", texts.tasks], ["week", texts.week], ["power", texts.power], ["machine", texts.machine]];
+const admin = cockpit.permission({ admin: true });
 const main = document.getElementById("main");
 let shown = null; // the view, whether it is loaded, and why it could not be
 let problems = 0;
@@ -55,14 +56,19 @@ function drawHeader() {
                   h("span", { "aria-hidden": "true" }, problems), h("span", { class: "unseen" }, texts.problems(problems)))))));
 }
 
+function cannotLoad(part) {
+    return admin.allowed === false
+        ? alert("info", texts.noAccess)
+        : alert("danger", texts.cannotLoad, h("p", null, part.failure.message),
+                h("div", { class: "row" }, button(texts.tryAgain, () => load(part)), link(texts.toList)));
+}
+
 function draw(part) {
     if (part !== shown) {
         return; // an answer to a view that was left
     }
     const { view, isLoaded, failure } = part;
-    render(main, failure && alert("danger", texts.cannotLoad, h("p", null, failure.message),
-                                  h("div", { class: "row" }, button(texts.tryAgain, () => load(part)), link(texts.toList))),
-           isLoaded ? h("div", { key: part.key }, view.render()) : !failure && loading());
+    render(main, failure && cannotLoad(part), isLoaded ? h("div", { key: part.key }, view.render()) : !failure && loading());
     document.title = `${view.title} - ${texts.title}`;
 }
 
@@ -120,5 +126,5 @@ cockpit.transport.wait(() => {
     lookAtMachine();
     changes.addEventListener("changed", refresh);
     watchChanges(refresh, () => Boolean(shown.view.isRunning?.()));
-    cockpit.permission({ admin: true }).addEventListener("changed", refresh);
+    admin.addEventListener("changed", refresh);
 });

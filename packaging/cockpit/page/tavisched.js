@@ -38,7 +38,7 @@ function refusalOf(exception) {
                        texts.failed(exception.exit_status ?? exception.problem));
 }
 
-// What it writes; a status that is among `accepted` is an answer too. `onText` gets the texts as they come.
+// What it writes; with a status that is among `accepted` that is an answer, too. `onText` gets the texts as they come.
 function answerOf(process, { accepted = [], input, onText } = {}) {
     return new Promise((resolve, reject) => {
         const decoder = new TextDecoder(); // tasks may print anything
@@ -56,7 +56,7 @@ function answerOf(process, { accepted = [], input, onText } = {}) {
             resolve(all);
         }, exception => {
             take(new Uint8Array(), false);
-            if (accepted.includes(exception.exit_status)) {
+            if (accepted.includes(exception.exit_status) && all) {
                 resolve(all);
             } else {
                 reject(refusalOf(exception));

@@ -9,7 +9,7 @@ import { clockOf, dayOf, inWords, weekdayOf } from "./times.js";
 const day = 24 * 3600 * 1000;
 const top = 44;
 const narrowWidth = 640;
-const narrowDay = 90;
+const narrowDay = 108; // less has no room for a whole date
 const hourSteps = [1, 3, 6, 12];
 const hourRoom = 34; // pixels that a written hour takes
 

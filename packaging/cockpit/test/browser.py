@@ -7,7 +7,7 @@ from selenium.webdriver.support.ui import Select
 
 import machine
 
-ADDRESS = f"http://127.0.0.1:{machine.PORT}/cockpit/@localhost/tavischeduler/index.html"
+ADDRESS = "http://127.0.0.1:{port}/cockpit/@localhost/tavischeduler/index.html"
 DOWNLOADS = "/tmp/downloads"
 
 
@@ -22,14 +22,14 @@ class Page:
         self.driver = webdriver.Chrome(options=options, service=Service("/usr/bin/chromedriver"))
         self.size(1280, 900)
 
-    def size(self, width, height):
+    def size(self, width, height, scale=1):
         self.driver.execute_cdp_cmd("Emulation.setDeviceMetricsOverride", {
-            "width": width, "height": height, "deviceScaleFactor": 1, "mobile": width < 600})
+            "width": width, "height": height, "deviceScaleFactor": scale, "mobile": width < 600})
 
-    def open(self, path, wait_for):
+    def open(self, path, wait_for, port=machine.PORT):
         """Opens a view of a new page and waits until it shows a text."""
         self.driver.get("about:blank")
-        self.driver.get(f"{ADDRESS}#/{path}")
+        self.driver.get(f"{ADDRESS.format(port=port)}#/{path}")
         self.until_text(wait_for)
 
     def style(self, name):

@@ -10,10 +10,11 @@ import time
 SOURCE = pathlib.Path(__file__).resolve().parents[3]
 TOOLS = pathlib.Path("/usr/tavi/bin")
 PORT = 9090
+PORT_OF_NOBODY = 9091
 
 
 def start(build):
-    """Returns the web server's process."""
+    """Returns the web servers' processes: one for root, and one for a user without any rights."""
     subprocess.run(["ip", "link", "set", "lo", "up"], check=True, env={"PATH": "/usr/sbin:/sbin"})
     for program in "tavisched", "tavischedtask":
         shutil.copy(build / "tools" / program, TOOLS)
@@ -24,15 +25,19 @@ def start(build):
     os.environ.update(PATH=f"{TOOLS}:{os.environ['PATH']}", HOME="/home", LC_ALL="C.UTF-8",
                       XDG_DATA_DIRS=f"{build}/packaging/cockpit/share:/usr/share")
     tavisched("check", "--repair")
-    server = subprocess.Popen(["/usr/lib/cockpit/cockpit-ws", "--no-tls", "--address=127.0.0.1", f"--port={PORT}",
-                               "--local-session=cockpit-bridge"], stderr=subprocess.DEVNULL)
-    until(answers, "the web server answers")
+    return [serve(PORT), serve(PORT_OF_NOBODY, "setpriv", "--reuid=nobody", "--clear-groups")]
+
+
+def serve(port, *as_user):
+    server = subprocess.Popen([*as_user, "/usr/lib/cockpit/cockpit-ws", "--no-tls", "--address=127.0.0.1",
+                               f"--port={port}", "--local-session=cockpit-bridge"], stderr=subprocess.DEVNULL)
+    until(lambda: answers(port), "the web server answers")
     return server
 
 
-def answers():
+def answers(port):
     with socket.socket() as connection:
-        return connection.connect_ex(("127.0.0.1", PORT)) == 0
+        return connection.connect_ex(("127.0.0.1", port)) == 0
 
 
 def tavisched(*arguments):

@@ -19,14 +19,15 @@ SECONDS = 5  # until another's change shows
 
 
 def setUpModule():
-    global page, server
-    server = machine.start(BUILD)
+    global page, servers
+    servers = machine.start(BUILD)
     page = Page()
 
 
 def tearDownModule():
     page.driver.quit()
-    server.terminate()
+    for server in servers:
+        server.terminate()
 
 
 class PageTest(unittest.TestCase):
@@ -191,6 +192,11 @@ class PageTest(unittest.TestCase):
                 fields = {label.text for label in page.all("label")}
                 self.assertEqual({"Name", "Owner"} - fields, {title})
 
+    def test_without_administrative_access(self):
+        machine.add("--name", "Scan", "--command", "true")
+        page.open("", "with administrative access only", machine.PORT_OF_NOBODY)
+        self.assertNotIn("Scan", page.text())
+
     def test_changes_of_others(self):
         page.open("", "There are no tasks yet")
         task = machine.add("--name", "Another's", "--command", "true")
@@ -348,8 +354,9 @@ class Looks:
         page.driver.save_screenshot(str(FOLDER / "pictures" / name))
 
     def picture_for_readme(self):
-        page.size(1040, 585)
+        page.size(1040, 760, scale=0.8)
         page.open("", "Nightly backup")
+        page.enter("Show", "Enabled")
         self.save("page.png")
 
     @staticmethod

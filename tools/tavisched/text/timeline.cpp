@@ -144,9 +144,8 @@ Fields background(const Calendar &calendar, const Grid &grid, const Columns &col
             off += std::max<time_t>(0, std::min(span.until, end) - std::max(span.from, begin));
         }
         const bool isOff = off > 0 && 2 * off >= end - begin;
-        fields[column].mark = isOff                         ? Mark::Off
-                              : column % grid.perDay() == 0 ? Mark::Day
-                                                            : Mark::Empty;
+        const bool isDay = grid.perDay() > 1 && column % grid.perDay() == 0;
+        fields[column].mark = isOff ? Mark::Off : isDay ? Mark::Day : Mark::Empty;
     }
     return fields;
 }

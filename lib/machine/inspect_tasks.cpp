@@ -188,6 +188,8 @@ void inspectSchedules(Inspection &inspection) {
     std::vector<const TAVI_SCHED_TASK *> sound;
     addSoundTasks(tasks, sound);
     addSoundTasks(power, sound);
+    std::sort(sound.begin(), sound.end(),
+              [](const auto *one, const auto *other) { return one->id < other->id; });
     TAVISchedTaskRemarks(sound.data(), sound.size(), nullptr, std::time(nullptr), addRemark,
                          &inspection);
 }

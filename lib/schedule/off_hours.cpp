@@ -65,7 +65,8 @@ int TAVISchedOffHours(const TAVI_SCHED_TASK *const *rgTasks, size_t cTasks, int6
     tzset();
     return sched::guarded(SCHED_SITE, [&] {
         size_t count = 0;
-        for (const auto &span : sched::OffHours({rgTasks, cTasks}, from, until).all()) {
+        const sched::OffHours hours({rgTasks, cTasks}, from, until);
+        for (const TAVI_SCHED_SPAN &span : hours.all()) {
             const TAVI_SCHED_SPAN cut{.from = std::max(span.from, from),
                                       .until = std::min(span.until, until)};
             if (cut.from < cut.until && count < cMax) {

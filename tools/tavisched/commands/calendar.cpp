@@ -2,6 +2,7 @@
 #include "tasks/calendar.h"
 #include "commands/commands.h"
 #include "text/moments.h"
+#include "text/timeline.h"
 #include "text/words.h"
 #include "json/json.h"
 #include "json/plain.h"
@@ -69,7 +70,14 @@ int calendar(const CalendarOptions &options) {
         std::erase_if(shown, [](const auto *task) { return task->listable != 1; });
     }
     const Calendar calendar = makeCalendar(all.all(), shown, options.past, options.days);
-    printAsJson(calendar);
+    if (options.json) {
+        printAsJson(calendar);
+    } else if (shown.empty()) {
+        std::printf("There are no tasks%s.\n",
+                    all.all().empty() ? "" : " to show; --all shows all");
+    } else {
+        printTimeline(calendar, options.hours);
+    }
     return 0;
 }
 

@@ -141,7 +141,7 @@ std::optional<std::string> textOf(const Member &member, const Json::Value &value
         return std::string(TAVI_SCHED_WEEK_DAYS, '0');
     }
     try {
-        return parseDays(value.isString() ? value.asString() : join(days, ","), "accepted");
+        return parseDays(value.isString() ? value.asString() : join(days, ","), "--weekly");
     } catch (const Refusal &) {
         return refuse("days, such as [\"Mon\", \"Fri\"]");
     }

@@ -17,8 +17,11 @@ const filters = {
     failed: task => Boolean(task.lastRun) && kindOf(task.lastRun) === "failed",
 };
 
+const step = 200; // rows that a browser shows without effort
+
 // What was searched for stays when one comes back from a task.
-const wanted = { words: "", filter: "all", owner: "" };
+const everything = { words: "", filter: "all", owner: "" };
+const wanted = { ...everything };
 
 function matches(task) {
     const text = `${task.name}\n${task.owner}\n${task.app}`.toLowerCase();
@@ -71,9 +74,11 @@ function choice(name, value, options, onchange) {
 
 export function listView(redraw) {
     let tasks = [];
+    let limit = step;
 
     const choose = (what, value) => {
         wanted[what] = value;
+        limit = step;
         redraw();
     };
     const toolbar = () => {
@@ -94,13 +99,17 @@ export function listView(redraw) {
         }
         if (shown.length === 0) {
             return empty(texts.noMatch, button(texts.clear, () => {
-                Object.assign(wanted, { words: "", filter: "all", owner: "" });
+                Object.assign(wanted, everything);
                 redraw();
             }));
         }
         return [
             table(texts.tasks, [texts.name, texts.state, texts.schedule, texts.next, texts.owner, texts.lastRun,
-                                texts.actions], shown.map(rowOf)),
+                                texts.actions], shown.slice(0, limit).map(rowOf)),
+            shown.length > limit && button(texts.more, () => {
+                limit += 5 * step;
+                redraw();
+            }),
             h("p", { class: "faint", role: "status" }, texts.shown(shown.length, tasks.length))];
     };
     return {

@@ -354,7 +354,7 @@ class Looks:
         page.driver.save_screenshot(str(FOLDER / "pictures" / name))
 
     def picture_for_readme(self):
-        page.size(1040, 760, scale=0.8)
+        page.size(1040, 720, scale=0.8)
         page.open("", "Nightly backup")
         page.enter("Show", "Enabled")
         self.save("page.png")

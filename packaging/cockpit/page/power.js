@@ -8,9 +8,18 @@ import { readJson } from "./tavisched.js";
 import { texts } from "./texts.js";
 import { button, empty, go, label, table } from "./ui.js";
 
-function rowOf(task) {
-    const what = `${powerName(task)}, ${task.schedule}`;
-    return { key: task.id, cells: [
+// A schedule gets another id when it is enabled or disabled, but stays in its row, and the focus with it.
+function rows(schedules) {
+    const count = new Map();
+    return schedules.map(task => {
+        const what = `${powerName(task)}, ${task.schedule}`;
+        count.set(what, (count.get(what) || 0) + 1);
+        return rowOf(task, what, `${what} ${count.get(what)}`);
+    });
+}
+
+function rowOf(task, what, key) {
+    return { key, cells: [
         label(task.appArgs, powerName(task)), task.schedule, nextStart(task), stateOf({ ...task, name: what }),
         h("div", { class: "row" },
           may.edit(task) && button(texts.edit, () => go("power", task.id, "edit"), { "aria-label": `${texts.edit}: ${what}` }),
@@ -30,6 +39,6 @@ export function powerView() {
             h("p", null, texts.powerText),
             schedules.length === 0
                 ? empty(texts.noPower)
-                : table(texts.power, [texts.what, texts.schedule, texts.next, texts.state, texts.actions], schedules.map(rowOf))],
+                : table(texts.power, [texts.what, texts.schedule, texts.next, texts.state, texts.actions], rows(schedules))],
     };
 }

@@ -246,6 +246,7 @@ class PageTest(unittest.TestCase):
         page.press("Enabled: Power off, Mon-Fri 22:15")
         machine.until(lambda: stored() == [("poweroff", WEEKDAYS, 22, 15, "disabled")], "the schedule is disabled")
         page.until_text("never", "tbody")
+        self.assertEqual(page.driver.switch_to.active_element, page.button("Enabled: Power off, Mon-Fri 22:15"))
         page.press("Remove: Power off, Mon-Fri 22:15")
         page.answer("Remove")
         machine.until(lambda: stored() == [], "the schedule is removed")
@@ -296,10 +297,15 @@ class PageTest(unittest.TestCase):
     def test_looks_and_accessibility(self):
         looks = Looks(self)
         looks.add_tasks()
-        for style, width in ("light", 1280), ("dark", 1280), ("light", 390):
-            for view in looks.views():
-                with self.subTest(view=view[0], style=style, width=width):
-                    looks.check(*view, style, width)
+        for name, path, text in looks.views():
+            with self.subTest(name):
+                looks.prepare(name, path, text, 1280)
+                looks.check(f"{name}-light")
+                page.style("dark")
+                looks.check(f"{name}-dark", "color-contrast")
+                page.style("light")
+                looks.prepare(name, path, text, 390)
+                looks.check(f"{name}-narrow")
         looks.picture_for_readme()
         if not AXE.exists():
             print("[  SKIPPED ] Cockpit.Accessibility (axe-core cannot be had)")
@@ -328,10 +334,10 @@ class Looks:
                 ("task", f"task/{self.backup}", "History"), ("add", "add", "Add a task"), ("power", "power", "Power off"),
                 ("edit-power", "power/add", "What happens"), ("machine", "machine", "remarkable"), ("import", "import", "File")]
 
-    def check(self, name, path, text, style, width):
+    @staticmethod
+    def prepare(name, path, text, width):
         page.size(width, 844 if width < 600 else 800)
         page.open(path, text)
-        page.style(style)
         machine.until(lambda: not page.all(".spinner"), "it is loaded")
         if name == "task":
             page.press("Output")
@@ -341,14 +347,14 @@ class Looks:
             page.press("Save")
             page.until_text("it is empty", ".wrong .error")
         page.driver.execute_script("scrollTo(0, 0)")
+
+    def check(self, name, rule=None):
         time.sleep(0.2)  # the switches have moved
-        self.save(f"{name}-{'narrow' if width < 600 else style}.png")
+        self.save(f"{name}.png")
         sizes = page.driver.execute_script("return [document.documentElement.scrollWidth, innerWidth]")
         self.test.assertLessEqual(sizes[0], sizes[1], "it is wider than the screen")
         if AXE.exists():
-            self.test.assertEqual(self.faults("color-contrast" if style == "dark" else None), [])
-        page.style("light")
-        page.size(1280, 900)
+            self.test.assertEqual(self.faults(rule), [])
 
     def save(self, name):
         page.driver.save_screenshot(str(FOLDER / "pictures" / name))
@@ -358,10 +364,11 @@ class Looks:
         page.open("", "Nightly backup")
         page.enter("Show", "Enabled")
         self.save("page.png")
+        page.size(1280, 900)
 
     @staticmethod
     def faults(rule):
-        """What is serious or worse, by one rule or by all."""
+        """What is serious or worse, by one rule or by all of them."""
         if not page.driver.execute_script("return Boolean(window.axe)"):
             page.driver.execute_script(AXE.read_text("utf-8"))
         found = page.driver.execute_async_script("axe.run(arguments[0] ? { runOnly: [arguments[0]] } : {}).then(arguments[1])",

@@ -35,7 +35,7 @@ export function history(id, redraw) {
         redraw();
     };
     const outputOf = run => h("div", { class: "output", role: "region", "aria-label": texts.outputOf(inWords(startOf(run))) },
-        h("pre", { tabindex: 0 }, shown.text || (shown.isOver ? texts.noOutput : "")),
+        h("pre", { tabindex: 0, class: goesOn(run) && "following" }, shown.text || (shown.isOver ? texts.noOutput : "")),
         shown.failure && h("p", { class: "error" }, shown.failure.message),
         !shown.isOver && goesOn(run) && h("p", { class: "faint" }, texts.following));
     const resultOf = run => {

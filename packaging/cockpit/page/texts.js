@@ -148,6 +148,7 @@ export const texts = {
     when2: _("Time"),
     task: _("Task"),
     asTable: _("The same as a table"),
+    first: count => format(_("These are the first $0; fewer days show all of them."), count),
     nothingToShow: _("There is nothing in these days."),
     switchesOn: _("switches the machine on"),
     switchesOff: _("switches the machine off"),

@@ -21,13 +21,14 @@ export function inWords(time) {
 
 const units = [["day", 86400], ["hour", 3600], ["minute", 60]];
 
-const relative = new Intl.RelativeTimeFormat(cockpit.language?.replace("_", "-") || "en", { numeric: "auto" });
+const relative = new Intl.RelativeTimeFormat(cockpit.language?.replace("_", "-") || "en", { numeric: "always" });
 
 // "in 3 hours", "5 minutes ago"
 export function fromNow(time, now = Date.now()) {
     const seconds = (Date.parse(time) - now) / 1000;
     const [unit, size] = units.find(each => Math.abs(seconds) >= each[1] * 0.95) || units[units.length - 1];
-    return relative.format(Math.round(seconds / size), unit);
+    const count = Math.round(seconds / size);
+    return count === 0 ? texts.now : relative.format(count, unit);
 }
 
 export function duration(seconds) {

@@ -34,7 +34,8 @@ function asTable(calendar) {
     return h("details", null, h("summary", null, texts.asTable),
         table(texts.timeline, [texts.when2, texts.task, texts.result], entries.slice(0, mostRows).map(
             ({ key, time, name, what }) => ({ key, cells: [
-                inWords(time), name, [what, busy.has(time) && [" ", label("warning", texts.legend.busy)]]] }))));
+                inWords(time), name, [what, busy.has(time) && [" ", label("warning", texts.legend.busy)]]] }))),
+        entries.length > mostRows && h("p", { class: "faint" }, texts.first(mostRows)));
 }
 
 export function weekView(redraw) {

@@ -23,7 +23,7 @@ std::optional<int64_t> sched::findNextStart(const TAVI_SCHED_TASK &task, int64_t
     constexpr int64_t kLongestWait = 10 * 366 * kDay;
     tzset();
     from = inTime(from);
-    const int64_t begin = std::max(from, secondsOf(Days(task).first()) + 366 * kDay);
+    const int64_t begin = std::max(from, secondsOf(Days(task).first()));
     std::optional<int64_t> next;
     forEachStart(task, from, inTime(begin + kLongestWait), [&](int64_t moment) {
         next = moment;

@@ -26,57 +26,61 @@ inline bool isPower(const TAVI_SCHED_TASK &task) {
 
 class Days {
   public:
-    explicit Days(const TAVI_SCHED_TASK &task) : task_(task) {}
+    explicit Days(const TAVI_SCHED_TASK &task)
+        : task_(task), first_(isPower(task) ? Day() : firstDayOf(task)) {}
 
     // Outside of these there is none.
-    Day first() const { return isPower(task_) ? Day() : Day(year() / std::chrono::January / 1); }
+    Day first() const { return first_; }
     Day last() const {
         return isPower(task_) || repeats()
                    ? Day(std::chrono::year(9999) / std::chrono::December / 31)
-                   : Day(year() / std::chrono::December / 31);
+                   : first_;
     }
 
     bool has(Day day) const {
-        const unsigned int weekDay = std::chrono::weekday(day).c_encoding();
-        if (isPower(task_)) { // its days alone count
-            return runsOnWeekDay(task_, weekDay);
+        if (isPower(task_) ||
+            task_.type == TAVI_SCHED_TYPE_WEEKLY) { // a power schedule has no type
+            return day >= first_ && runsOnWeekDay(task_, std::chrono::weekday(day).c_encoding());
         }
-        const std::chrono::year_month_day date(day);
-        const bool isSameDay = static_cast<unsigned int>(date.day()) == task_.startDay;
-        const bool isSameMonth = static_cast<unsigned int>(date.month()) == task_.startMonth;
-        switch (task_.type) {
-        case TAVI_SCHED_TYPE_DAILY:
-            return hasBegun(date);
-        case TAVI_SCHED_TYPE_WEEKLY:
-            return runsOnWeekDay(task_, weekDay) && hasBegun(date);
-        case TAVI_SCHED_TYPE_MONTHLY:
-            return isSameDay && hasBegun(date);
-        case TAVI_SCHED_TYPE_YEARLY:
-            return isSameDay && isSameMonth && hasBegun(date);
-        default:
-            // Past the start day the due test lets no other type run, whatever its line says.
-            return isSameDay && isSameMonth && yearOf(date) == task_.startYear;
+        if (task_.type == TAVI_SCHED_TYPE_DAILY) {
+            return day >= first_;
         }
+        // Past the start day the due test lets no type run but these, whatever the line says.
+        return (day == first_ || (day > first_ && repeats())) && isOnDate(day);
     }
 
   private:
     bool repeats() const {
         return task_.type >= TAVI_SCHED_TYPE_DAILY && task_.type <= TAVI_SCHED_TYPE_YEARLY;
     }
-    // Of the first day, as far as dates are made for it.
-    std::chrono::year year() const {
-        return std::chrono::year(static_cast<int>(std::clamp(task_.startYear, 1970U, 10000U)));
+    // As far as the line says it, and the start day when there is such a day.
+    bool isOnDate(Day day) const {
+        const std::chrono::year_month_day date(day);
+        return static_cast<unsigned int>(date.day()) == task_.startDay &&
+               (task_.type == TAVI_SCHED_TYPE_MONTHLY ||
+                static_cast<unsigned int>(date.month()) == task_.startMonth) &&
+               (repeats() || static_cast<int>(date.year()) == static_cast<int>(task_.startYear));
     }
-    static uint32_t yearOf(const std::chrono::year_month_day &date) {
-        return static_cast<uint32_t>(static_cast<int>(date.year()));
-    }
-    bool hasBegun(const std::chrono::year_month_day &date) const {
-        const std::array day{yearOf(date), static_cast<unsigned int>(date.month()),
-                             static_cast<unsigned int>(date.day())};
-        return day >= std::array{task_.startYear, task_.startMonth, task_.startDay};
+    // The first one that is not before the start date, which need not be one of the calendar; as
+    // far as dates are made for it.
+    static Day firstDayOf(const TAVI_SCHED_TASK &task) {
+        constexpr uint32_t kFirstYear = 1970;
+        constexpr uint32_t kLastMonth = 12;
+        if (task.startYear < kFirstYear) {
+            return {};
+        }
+        const std::chrono::year year(static_cast<int>(std::min(task.startYear, 10000U)));
+        if (task.startMonth == 0 || task.startMonth > kLastMonth) {
+            return (task.startMonth == 0 ? year : year + std::chrono::years(1)) /
+                   std::chrono::January / 1;
+        }
+        const std::chrono::year_month month = year / std::chrono::month(task.startMonth);
+        const auto date = month / std::chrono::day(std::clamp(task.startDay, 1U, 32U));
+        return date.ok() ? Day(date) : Day((month + std::chrono::months(1)) / 1);
     }
 
     const TAVI_SCHED_TASK &task_;
+    Day first_;
 };
 
 // The hours of a day at whose minute `runMin` it runs; none when one of them is no hour.

@@ -13,6 +13,7 @@
 #include <cstdio>
 #include <map>
 #include <string_view>
+#include <unordered_map>
 
 namespace {
 
@@ -60,14 +61,19 @@ struct Year {
 constexpr Text kNothing{};
 
 // A once task that is past has run, or its state tells that it is past.
+bool isPast(const TAVI_SCHED_TASK &task, int64_t now) {
+    bool has = false;
+    sched::forEachStart(task, 0, task.type == TAVI_SCHED_TYPE_ONCE ? now : 0, [&](int64_t) {
+        has = true;
+        return false;
+    });
+    return has;
+}
+
 Text neverRuns(const TAVI_SCHED_TASK &task, const Year &year) {
-    bool runs = sched::findNextStart(task, year.from).has_value();
-    sched::forEachStart(task, 0, runs || task.type != TAVI_SCHED_TYPE_ONCE ? 0 : year.from,
-                        [&](int64_t) {
-                            runs = true;
-                            return false;
-                        });
-    return runs ? kNothing : format("it will never run");
+    return sched::findNextStart(task, year.from) || isPast(task, year.from)
+               ? kNothing
+               : format("it will never run");
 }
 
 Text runsOnceADay(const TAVI_SCHED_TASK &task, const Year &) {
@@ -110,21 +116,23 @@ Text isSkipped(const TAVI_SCHED_TASK &task, const Year &year) {
     return kNothing;
 }
 
-// Power schedules are the same every week; of a task by the day a week is enough.
-Text runsWhileOff(const TAVI_SCHED_TASK &task, const Year &year) {
-    const bool isWeekly = task.type == TAVI_SCHED_TYPE_DAILY || task.type == TAVI_SCHED_TYPE_WEEKLY;
+// Power schedules are the same every week: of a task by the day a week is enough.
+int64_t endOfLook(const TAVI_SCHED_TASK &task, const Year &year) {
     int64_t until = year.until;
-    std::optional<int64_t> first;
-    bool isAlways = true;
-    const auto look = [&](int64_t moment) {
-        until = isWeekly ? std::min(until, moment + kWeek) : until;
-        return false;
-    };
+    if (task.type == TAVI_SCHED_TYPE_DAILY || task.type == TAVI_SCHED_TYPE_WEEKLY) {
+        const auto first = sched::findNextStart(task, year.from);
+        until = std::min(until, first.value_or(until) + kWeek);
+    }
+    return until;
+}
+
+Text runsWhileOff(const TAVI_SCHED_TASK &task, const Year &year) {
     if (year.off.all().empty()) {
         return kNothing;
     }
-    sched::forEachStart(task, year.from, year.until, look);
-    sched::forEachStart(task, year.from, until, [&](int64_t moment) {
+    std::optional<int64_t> first;
+    bool isAlways = true;
+    sched::forEachStart(task, year.from, endOfLook(task, year), [&](int64_t moment) {
         const bool isOff = year.off.has(moment);
         isAlways = isAlways && isOff;
         first = first || !isOff ? first : moment;
@@ -159,7 +167,7 @@ constexpr const char *kMoveOne = "give one of them another time";
 
 // An hour of a task, whose minute is that of the day.
 struct Hour {
-    std::string_view app;
+    size_t app; // a number that the application has got
     uint32_t minute;
     const TAVI_SCHED_TASK *task;
 };
@@ -176,13 +184,15 @@ bool isSameTask(const TAVI_SCHED_TASK &one, const TAVI_SCHED_TASK &other) {
 
 std::vector<Hour> hoursOfApplications(sched::TaskSpan tasks, const TAVI_SCHED_TASK *of) {
     std::vector<Hour> all;
+    std::unordered_map<std::string_view, size_t> apps;
     const auto add = [&](const TAVI_SCHED_TASK &task) {
         const bool counts = !sched::isPower(task) && task.state == TAVI_SCHED_STATE_ENABLED &&
                             task.app[0] != '\0' && (!of || std::strcmp(task.app, of->app) == 0);
         const auto hours = counts ? sched::hoursOf(task) : std::bitset<sched::kHours>();
+        const size_t app = hours.any() ? apps.try_emplace(task.app, apps.size()).first->second : 0;
         for (uint32_t hour = 0; hour < sched::kHours; ++hour) {
             if (hours.test(hour)) {
-                all.push_back({task.app, hour * 60 + task.runMin, &task});
+                all.push_back({app, hour * 60 + task.runMin, &task});
             }
         }
     };

@@ -3,7 +3,8 @@
 // Its line of the crontab has no asterisk for the minute or the hour. cron starts such lines once
 // in an hour that the end of daylight saving time repeats, the first time; what the beginning of it
 // skips cron catches up at once, and the due test, which looks at the time there is then, lets
-// nothing run that is not due there anyway. Power-off lines have no due test.
+// nothing run that is not due there anyway: a task that is due in the skipped hour's minute and in
+// the one after it is started twice in that one. Power-off lines have no due test.
 #pragma once
 
 #include "schedule/clock.h"

@@ -363,6 +363,7 @@ class Looks:
         page.size(1040, 720, scale=0.8)
         page.open("", "Nightly backup")
         page.enter("Show", "Enabled")
+        page.driver.execute_script("document.activeElement.blur()")
         self.save("page.png")
         page.size(1280, 900)
 

@@ -231,11 +231,58 @@ TAVI_SCHED_API int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask);
 /* The moments from `from` until before `until` (seconds since the epoch) at which an enabled task
  * will really be started: those at which cron takes its line and the task is then due, in the
  * process's time zone. Of an hour that daylight saving time skips there is none, of one that it
- * repeats the first. For a power schedule the moments at which the machine goes on or off. Writes
- * the first `cMax` of them, in rising order, and returns how many it wrote, or -1. Nothing is
- * allocated; the time it takes is linear in the days. */
+ * repeats the first. For a power schedule the moments at which the machine goes on or off; what is
+ * skipped switches it off at once. Writes the first `cMax` of them, in rising order, and returns
+ * how many it wrote, or -1. Nothing is allocated; the time it takes is linear in the days. */
 TAVI_SCHED_API int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t until,
                                        int64_t *rgStarts, size_t cMax);
+/* The first of them from `from` on: 1 with the moment, 0 when there is none, however long one
+ * waits, or -1. */
+TAVI_SCHED_API int TAVISchedTaskNextStart(const TAVI_SCHED_TASK *pTask, int64_t from,
+                                          int64_t *pStart);
+
+/* ---- What is remarkable about schedules ----
+ *
+ * Both take the tasks that there are as an array of pointers, of both backends, as tasks and power
+ * schedules bear on each other. */
+
+typedef struct TAVI_SCHED_SPAN {
+    int64_t from;  /* seconds since the epoch */
+    int64_t until; /* the first moment behind it */
+} TAVI_SCHED_SPAN;
+
+/* The hours in which the enabled power schedules among the tasks have the machine off, cut to
+ * `from` and `until`: each from the first power-off until the next power-on. When there is no
+ * power-on, nobody knows how long the machine is off, and there are none. Writes the first `cMax`
+ * of them, in rising order, and returns how many it wrote, or -1. */
+TAVI_SCHED_API int TAVISchedOffHours(const TAVI_SCHED_TASK *const *rgTasks, size_t cTasks,
+                                     int64_t from, int64_t until, TAVI_SCHED_SPAN *rgSpans,
+                                     size_t cMax);
+
+#define TAVI_SCHED_REMARK_NEVER 1        /* it will never run; not said of a once task that is past */
+#define TAVI_SCHED_REMARK_ONE_RUN 2      /* its interval leaves room for one run a day alone */
+#define TAVI_SCHED_REMARK_SHORT_MONTHS 3 /* some months, or years, do not have its day */
+#define TAVI_SCHED_REMARK_SKIPPED_HOUR 4 /* daylight saving time skips a run */
+#define TAVI_SCHED_REMARK_OFF_HOURS 5    /* runs fall into hours in which the machine is off */
+#define TAVI_SCHED_REMARK_SAME_MINUTE 6  /* so does another task of its application start */
+
+typedef struct TAVI_SCHED_REMARK {
+    const TAVI_SCHED_TASK *task;
+    const TAVI_SCHED_TASK *other; /* SAME_MINUTE: the first one that it meets; else NULL */
+    int32_t kind;                 /* TAVI_SCHED_REMARK_* */
+    char text[256];               /* for people: part of a sentence about the task */
+    char advice[256];             /* what can be done about it */
+} TAVI_SCHED_REMARK;
+
+/* Is handed one remark, which is gone after the call; anything but 0 ends the list. */
+typedef int (*TAVI_SCHED_REMARK_READER)(void *pContext, const TAVI_SCHED_REMARK *pRemark);
+/* Hands to the reader what is remarkable about the schedules of the enabled ones among the tasks,
+ * task by task, in the year from `from` on, in the process's time zone. With `pOf` of that task
+ * alone, which need not be stored: one among the others with its id is an earlier state of it.
+ * Returns how many it was handed, or -1. */
+TAVI_SCHED_API int TAVISchedTaskRemarks(const TAVI_SCHED_TASK *const *rgTasks, size_t cTasks,
+                                        const TAVI_SCHED_TASK *pOf, int64_t from,
+                                        TAVI_SCHED_REMARK_READER reader, void *pContext);
 
 /* ---- Backends ---- */
 
@@ -571,6 +618,7 @@ typedef struct TAVI_SCHED_FINDING {
     char repaired[1024]; /* what a repair has done about it; "" when it is for a person */
     int32_t canRepair;   /* 1 = TAVISchedFindingRepair can do it without a person */
     int32_t isNote;      /* 1 = nothing is wrong yet */
+    int32_t taskId;      /* of the task that it is about, or 0 */
 } TAVI_SCHED_FINDING;
 
 /* Looks at everything that scheduled tasks need, with root's rights, when no change goes on.
@@ -580,8 +628,8 @@ TAVI_SCHED_API int TAVISchedMachineCheck(TAVI_SCHED_FINDING **ppFindings);
 /* The same, but looks only at what is named, the names ended by NULL, and waits for no change:
  *   "room" on the file systems, "folders", "task files" that are not the tasks, "missing files",
  *   "put aside" tasks, "leftovers" of dead processes, "runner", "cron", "crontab" as a file,
- *   "sections" of the working copy, "tasks", "power" schedules, "lines" of the crontab,
- *   "status database", "plug-ins".
+ *   "sections" of the working copy, "tasks", "schedules" that are remarkable, "power" schedules,
+ *   "lines" of the crontab, "status database", "plug-ins".
  * 0x0D00 for another name. */
 TAVI_SCHED_API int TAVISchedMachineCheckOf(const char *const *rgszNames,
                                            TAVI_SCHED_FINDING **ppFindings);

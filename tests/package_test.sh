@@ -21,7 +21,7 @@ step() { printf 'package_test: %s\n' "$*"; }
 fail() { printf 'package_test: FAILED: %s\n' "$*" >&2; exit 1; }
 expect() { local what=$1; shift; "$@" || fail "$what"; }
 quietly() { "$@" >"$log" 2>&1 </dev/null || { cat "$log" >&2; fail "$*"; }; }
-manage() { quietly dpkg --force-confdef --force-confold "$@"; }
+manage() { quietly dpkg --force-confdef --force-confold --ignore-depends=cockpit-bridge "$@"; }
 files() { find /etc /usr /tmp /run /var/lib/dpkg/info ! -path '/etc/ld.so.cache*' | sort -T $own; }
 expect_same() { expect "$1 changed $2" cmp "$2" "$own/${2##*/}"; }
 expect_own_crontab() { # as it was before the installation
@@ -83,7 +83,7 @@ for folder in /usr/*/ /var/; do
     mount -t overlay overlay -o "lowerdir=$folder,upperdir=$own${folder}upper,workdir=$own${folder}work" "$folder"
 done
 mount -t tmpfs local /usr/local
-manage --purge tavischeduler-dev tavischeduler # where the machine has them
+manage --purge tavischeduler{-cockpit,-dev,} # where the machine has them
 rm -f /var/lib/man-db/auto-update              # saves time
 mkdir -p /usr/tavi/bin
 touch /usr/tavi/bin/of-the-machine
@@ -108,6 +108,10 @@ expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavis
     /usr/include/{platc,platplugin,tavisdk}.h "$lib"/lib{tavischeduler,taviplatform}.so \
     "$lib"/{pkgconfig/tavischeduler.pc,cmake/tavischeduler/tavischeduler-config.cmake} \
     /usr/share/man/man3/tavischeduler.3.gz /usr/share/doc/tavischeduler-dev/{copyright,examples/task.c}
+expect_files tavischeduler-cockpit /usr/share/cockpit/tavischeduler/{manifest.json,index.html,app.js,page.css} \
+    /usr/share/doc/tavischeduler-cockpit/{copyright,changelog.Debian.gz}
+expect "the page depends on other packages" \
+    grep -q '^Depends: tavischeduler (= .*), cockpit-bridge$' <(dpkg -s tavischeduler-cockpit)
 expect "programs look for libraries elsewhere" \
     [ -z "$(readelf -d /usr/sbin/tavisched{,task} "$lib"/libtavi*.so | grep -E 'R(UN)?PATH')" ]
 expect_only_cron_missing
@@ -195,12 +199,12 @@ expect_working_copy boot $tasks
 
 step "upgrade"
 manage -i "$debs"/later/*.deb
-expect "a package was not upgraded" [ "$(dpkg -s tavischeduler{,-dev} | grep -c "^Version: $later")" -eq 2 ]
+expect "a package was not upgraded" [ "$(dpkg -s tavischeduler{,-dev,-cockpit} | grep -c "^Version: $later")" -eq 3 ]
 expect "the versions can differ" grep -q "^Depends: tavischeduler (= $later" <(dpkg -s tavischeduler-dev)
 for file in $check $tasks $crontab; do expect_same upgrade "$file"; done
 
 step "removal"
-manage --remove tavischeduler-dev tavischeduler
+manage --remove tavischeduler{-cockpit,-dev,}
 expect_own_crontab removal
 expect_same removal $tasks
 expect "removal left the runner's link" [ ! -L /tmp/tavischedtask ]
@@ -212,7 +216,7 @@ expect_same re-installation $check
 expect_only_cron_missing
 
 step "purge"
-manage --purge tavischeduler-dev tavischeduler
+manage --purge tavischeduler{-cockpit,-dev,}
 expect_own_crontab purge
 expect "purge left or took files" diff $own/files <(files)
 step "passed"

@@ -172,7 +172,7 @@ TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
         const std::string add = std::string("add --command x ") + c.options;
         EXPECT_THAT(done(add + " --dry-run"),
                     HasSubstr("Schedule: " + std::string(c.words) + "\nCrontab line: " + line +
-                              "\nNext run: "));
+                              "\nNext runs: "));
         EXPECT_EQ(done(add + " --dry-run -q"), std::to_string(id) + "\n");
         EXPECT_EQ(done(add + " --quiet"), std::to_string(id) + "\n");
         EXPECT_THAT(readFile(kCrontab), HasSubstr(line + "\n"));
@@ -339,6 +339,107 @@ TEST_F(CommandLine, ShowsTasksForScripts) {
     EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
     // What the web back end exchanges can be saved as it is.
     EXPECT_EQ(TAVISchedTaskSaveFromJson(done("export --web 2 | sed '1d;$d'").c_str(), 0), 2);
+}
+
+// The library's next trigger time is another one.
+TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
+    writeFile("/usr/tavi/etc/auto_power",
+              "[power on]\n000=1 127 7 0\n[power off]\n000=1 127 4 0\n");
+    done("add --name late --command 'exit 3' --daily --at 05:00 --app a");
+    Task never = newTask();
+    never->type = 0; // once
+    never->startYear = 2098;
+    never->startMonth = 2;
+    never->startDay = 30;
+    ASSERT_EQ(TAVISchedTaskCreate(never.get()), 0);
+    shell("sed -i '/^.1]/,/^.2]/ { s/^start year=.*/start year=2098/; s/^start month=.*/start "
+          "month=3/; s/^start day=.*/start day=4/ }' /tmp/scheduled_tasks "
+          "/usr/tavi/etc/scheduled_tasks");
+    EXPECT_THAT(run("list"), AllOf(HasSubstr("daily 05:00  2098-03-04 05:00  "),
+                                   HasSubstr("once on 2098-02-30 at 00:00  never  ")));
+    EXPECT_THAT(done("show 2"),
+                testing::ContainsRegex("Next run +never\n(.*\n)+Note +it will never"));
+    EXPECT_THAT(done("next 1 2 -n 2"),
+                HasSubstr("\nTue 2098-03-04 05:00  1  late  root\nWed 2098-03-05 05:00  1  late"));
+    EXPECT_THAT(done("next 1 --until 7d"), HasSubstr("Nothing will run until then."));
+    EXPECT_EQ(done("next --until 24h | awk 'NR > 1 { print $4 }' | sort | xargs"),
+              "71270700 91270400\n");
+    EXPECT_THAT(
+        done("next 1 -n 1 --json"),
+        testing::MatchesRegex("\\{.*\"owner\": \"root\",\"power\": null,\"task\": 1,\"time\": "
+                              "\"2098-03-04T05:00:00[+-]..:..\"\\}\n"));
+    const std::string json = run("show 1 --json | tee /tmp/task.json");
+    EXPECT_THAT(json,
+                testing::ContainsRegex("\"nextStart\": \"2098-03-04T05.*\n +\"notes\": \\[\\],"));
+    EXPECT_THAT(json,
+                testing::ContainsRegex("\"starts\": *\n? *\\[\n.*-04T05.*\n.*\n.*\n.*\n.*-08T05"));
+    EXPECT_THAT(done("import --replace /tmp/task.json"), HasSubstr("overwritten"));
+    // What is remarkable is told before and after.
+    const char *const off = "Note: its runs fall into hours in which the power schedules have the";
+    const char *const meets = "Note: task 1, of the same application, starts in the same minute";
+    for (const char *const how : {" --dry-run", ""}) {
+        EXPECT_THAT(done(std::string("edit 1 --daily --at 05:00") + how), HasSubstr(off)) << how;
+    }
+    EXPECT_THAT(done("add --command x --at 05:00 --app a"),
+                AllOf(HasSubstr(off), HasSubstr(meets)));
+    EXPECT_THAT(
+        done("edit 3 --at 05:01 --dry-run --json"),
+        AllOf(HasSubstr("\"runMinute\": 1,"), HasSubstr("machine off"), Not(HasSubstr("same"))));
+    EXPECT_THAT(run("check"), HasSubstr("note: task 3 (Task 3): task 1, of the same application"));
+    EXPECT_THAT(
+        run("check --json"),
+        AllOf(HasSubstr("\"problem\": false,\"task\": 3,\"what\": \"task 3 (Task 3): its runs"),
+              HasSubstr("\"problem\": true")));
+    EXPECT_EQ(status_, 1);
+    shell("rm /tmp/tavischedtask");
+    EXPECT_THAT(run("check --repair --json"), HasSubstr("{\"repaired\": \""));
+}
+
+TEST_F(CommandLine, ShowsTheCalendar) {
+    writeFile("/usr/tavi/etc/auto_power",
+              "[power on]\n000=1 127 7 0\n[power off]\n000=1 127 4 0\n");
+    done("add --name failing --command 'exit 3' --monthly 1 --disabled");
+    done("add --name early --command x --at 05:30 --every 1 --until 7");
+    done("add --name same --command x --at 07:30 --every 12");
+    run("run 1 --wait");
+    const std::string shown = done("calendar --days 2 --past 0 --hours --all");
+    EXPECT_THAT(shown, testing::ContainsRegex("\n1 failing  .*x.*\n2 early  .*!!o"));
+    EXPECT_THAT(shown, HasSubstr("│   ░!!o"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\nsame minute  .*[*]\n"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\nSame minute: ... ....-..-.. 07:30, tasks 2 3\n"));
+    EXPECT_THAT(done("calendar --days 2 --past 0"), testing::ContainsRegex("\nA column is 1 h."));
+    EXPECT_THAT(done("calendar --days 90"), testing::ContainsRegex("\n3 same .*22222"));
+    const std::string json = done("calendar --json");
+    for (const char *const member : {"\"result\": \"exit 3\"", "T05:30:00", "\"power\": \"off\"",
+                                     "\"schedule\": \"daily 07:30 every 12 h until 23:30\""}) {
+        EXPECT_THAT(json, HasSubstr(member));
+    }
+    EXPECT_THAT(json, testing::ContainsRegex("\"tasks\": *\n? *\\[\n? *2,\n? *3\n"));
+    EXPECT_THAT(json, testing::ContainsRegex("T04:00:00[+-]..:..\",\n *\"until\": \".*T07:00:00"));
+}
+
+TEST_F(CommandLine, TellsErrorsAsJson) {
+    done("add --command x");
+    const struct {
+        const char *arguments, *option;
+        int status;
+    } kCases[] = {{"add --command x --at 99:00", "\"at\"", 2},
+                  {"add", "\"command\"", 2},
+                  {"add --command x --weekly ''", "\"weekly\"", 2},
+                  {"add --command x --once 2020-01-01", "\"once\"", 2},
+                  {"add --power on", "null", 1},
+                  {"edit 1 --every 1 --until 24", "\"until\"", 2},
+                  {"stop 1 --after -1", "\"after\"", 2},
+                  {"import /nowhere", "null", 2},
+                  {"remove 1 --yse", "null", 2},
+                  {"run 9", "null", 2}};
+    for (const auto &c : kCases) {
+        EXPECT_THAT(
+            run(std::string(c.arguments) + " --json"),
+            testing::MatchesRegex("\\{\"error\": \".*\",\"option\": " + std::string(c.option) +
+                                  ",\"status\": " + std::to_string(c.status) + "\\}\n"));
+        EXPECT_EQ(status_, c.status) << c.arguments;
+    }
 }
 
 // Escapes in JSON mean the characters; elsewhere nothing of them reaches a terminal.
@@ -599,11 +700,10 @@ TEST_F(CommandLine, FitsTheTerminal) {
     Task task = newTask();
     TAVISchedCTaskSetName(task.get(), "\033[2J日本日本日本日本日本日本 é name");
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
-    const auto widest = [&](int columns) {
+    const auto widest = [&](int columns, const std::string &what = "list") {
         const std::string width = std::to_string(columns);
-        shell(
-            "script -qec 'stty cols " + width +
-            "; TERM=dumb /usr/tavi/bin/tavisched list' /dev/null | tr -d '\\r' | sed 's/…/./g' > /tmp/out");
+        shell("script -qec 'stty cols " + width + "; TERM=dumb /usr/tavi/bin/tavisched " + what +
+              "' /dev/null | tr -d '\\r' | sed 's/…/./g; s/│/./g' > /tmp/out");
         return shell("awk 'length > " + width + "' /tmp/out | grep -q .") == 1;
     };
     Task hidden = newTask();
@@ -634,6 +734,11 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_TRUE(widest(40));
     EXPECT_THAT(readFile("/tmp/out"), AllOf(HasSubstr("90622300"), HasSubstr("NEXT RUN")));
     EXPECT_THAT(done("list"), HasSubstr("90622300  PowerOff task 0  enabled  Mon-Fri 23:00  "));
+    for (const int columns : {30, 80, 200}) {
+        EXPECT_TRUE(widest(columns, "calendar --days 30")) << readFile("/tmp/out");
+        EXPECT_TRUE(widest(columns, "calendar --hours")) << readFile("/tmp/out");
+    }
+    EXPECT_THAT(readFile("/tmp/out"), HasSubstr("A column is 1 h."));
 }
 
 TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {

@@ -14,6 +14,7 @@ struct Finding {
     std::function<bool()> repair = nullptr; // empty when it is not safe without a person
     std::string repaired{};                 // what the repair has done
     bool isNote = false;                    // nothing is wrong yet
+    int32_t taskId = 0;                     // that it is about; 0 for none
 };
 
 // What was found, and what those that come later build on.
@@ -45,6 +46,7 @@ void inspectRunner(Inspection &inspection);
 // inspect_tasks.cpp
 void inspectSections(Inspection &inspection);
 void inspectTasks(Inspection &inspection);
+void inspectSchedules(Inspection &inspection);
 
 // inspect_cron.cpp
 void inspectCron(Inspection &inspection);

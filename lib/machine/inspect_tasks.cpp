@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <array>
+#include <ctime>
 
 #pragma weak PLATCFileCheckSections // an appliance's own platform may lack it
 
@@ -104,24 +105,44 @@ std::string whyLineIsRejected(const TAVI_SCHED_TASK &task) {
 
 void inspectTask(const TAVI_SCHED_TASK &task, Inspection &inspection) {
     const std::string id = std::to_string(task.id);
+    const auto add = [&](std::string what, std::string advice) {
+        inspection.add({.what = std::move(what), .advice = std::move(advice), .taskId = task.id});
+    };
     TAVI_SCHED_FAULT fault{};
     if (const std::string why = whyLineIsRejected(task); !why.empty()) {
-        inspection.add("cron ignores all of " + std::string(kCrontab) + " for the line of " +
-                           called(task) + ": " + why,
-                       "mend its schedule with tavisched edit " + id + ", or tavisched disable " +
-                           id);
+        add("cron ignores all of " + std::string(kCrontab) + " for the line of " + called(task) +
+                ": " + why,
+            "mend its schedule with tavisched edit " + id + ", or tavisched disable " + id);
     } else if (TAVISchedTaskCheck(&task, &fault) == 1) {
-        inspection.add(called(task) +
-                           (fault.key[0] == '\0'
-                                ? std::string(": ")
-                                : ": its \"" + std::string(fault.key) + "\" is wrong: ") +
-                           fault.reason,
-                       "mend it with tavisched edit " + id + ", or where the task was made");
+        add(called(task) +
+                (fault.key[0] == '\0' ? std::string(": ")
+                                      : ": its \"" + std::string(fault.key) + "\" is wrong: ") +
+                fault.reason,
+            "mend it with tavisched edit " + id + ", or where the task was made");
     } else if (startsLater(task)) {
-        inspection.add(called(task) + " does not run before its first day, whatever is shown as "
-                                      "its next run",
-                       "say its days anew: tavisched edit " + id + " --daily or --weekly");
+        add(called(task) + " does not run before its first day, whatever other front ends show as "
+                           "its next run",
+            "say its days anew: tavisched edit " + id + " --daily or --weekly");
     }
+}
+
+// The sound ones of a backend; others have findings of their own.
+void addSoundTasks(const TaskList &tasks, std::vector<const TAVI_SCHED_TASK *> &sound) {
+    TAVI_SCHED_FAULT fault{};
+    for (const TAVI_SCHED_TASK *task = tasks.head(); task; task = task->next) {
+        if (TAVISchedTaskCheck(task, &fault) == 0) {
+            sound.push_back(task);
+        }
+    }
+}
+
+int addRemark(void *inspection, const TAVI_SCHED_REMARK *remark) {
+    static_cast<Inspection *>(inspection)
+        ->add({.what = called(*remark->task) + ": " + remark->text,
+               .advice = remark->advice,
+               .isNote = true,
+               .taskId = remark->task->id});
+    return 0;
 }
 
 } // namespace
@@ -152,6 +173,24 @@ void inspectTasks(Inspection &inspection) {
         inspectTask(*task, inspection);
         return true;
     }});
+}
+
+// Notes: every schedule may be meant as it is.
+void inspectSchedules(Inspection &inspection) {
+    TaskList tasks;
+    TaskList power;
+    if (!inspection.canReadTasks ||
+        TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_SCHEDULE, tasks.address(), nullptr) < 0) {
+        return;
+    }
+    TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_AUTOPOWER, power.address(), nullptr); // or none
+    std::vector<const TAVI_SCHED_TASK *> sound;
+    addSoundTasks(tasks, sound);
+    addSoundTasks(power, sound);
+    std::sort(sound.begin(), sound.end(),
+              [](const auto *one, const auto *other) { return one->id < other->id; });
+    TAVISchedTaskRemarks(sound.data(), sound.size(), nullptr, std::time(nullptr), addRemark,
+                         &inspection);
 }
 
 } // namespace sched

@@ -36,6 +36,7 @@ constexpr Row kRows[] = {{"room", sched::inspectRoom},
                          {"crontab", sched::inspectCrontabFile},
                          {"sections", sched::inspectSections},
                          {"tasks", sched::inspectTasks},
+                         {"schedules", sched::inspectSchedules},
                          {"power", sched::inspectPower},
                          {"lines", sched::inspectLines},
                          {"status database", sched::inspectStatusDatabase},
@@ -104,6 +105,7 @@ bool pushFront(FindingList &list, const Named &named) {
     sched::copyText(record->repaired, sizeof record->repaired, named.finding.repaired.c_str());
     record->canRepair = named.finding.repair ? 1 : 0;
     record->isNote = named.finding.isNote ? 1 : 0;
+    record->taskId = named.finding.taskId;
     return true;
 }
 

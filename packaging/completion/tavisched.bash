@@ -30,34 +30,36 @@ _tavisched() {
         mapfile -t COMPREPLY < <(compgen -P "$head" -W 'Sun Mon Tue Wed Thu Fri Sat weekdays weekend daily' -- "${cur##*,}")
         return
         ;;
-    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit | --next | --since | --run | --after) return ;;
+    --name | --command | --at | --monthly | --yearly | --once | --every | --until | --app | --limit | --next | --since | --run | --after | --number | --days | --past) return ;;
     *)
         case $command in
         '')
             options='--version --verbose'
-            words='list show history log export add edit enable disable remove import run stop sync check'
+            words='list show next calendar history log export add edit enable disable remove import run stop sync check'
             ;;
         list) options='--all --failed --owner --next --sort --reverse --json' ;;
         show) options='--json' ;;
+        next) options='--number --until --all --json' ;;
+        calendar) options='--days --past --hours --all --json' ;;
         history) options='--failed --since --limit --json' ;;
         log) options='--run --follow' ;;
         add | edit)
             options='--name --command --at --daily --weekly --monthly --yearly --once --every --until
-                --owner --app --enabled --disabled --allow-overlap --no-overlap --power --quiet'
-            [[ $command == edit ]] || options+=' --dry-run'
+                --owner --app --enabled --disabled --allow-overlap --no-overlap --power --dry-run --quiet --json'
             ;;
         export) options='--web' ;;
-        remove) options='--yes' ;;
-        run) options='--wait' ;;
-        stop) options='--after' ;;
-        check) options='--repair' ;;
+        enable | disable) options='--json' ;;
+        remove) options='--yes --json' ;;
+        run) options='--wait --json' ;;
+        stop) options='--after --json' ;;
+        check) options='--repair --json' ;;
         import)
-            options='--replace --dry-run'
+            options='--replace --dry-run --json'
             [[ $cur == -* ]] || compopt -o default 2>/dev/null # names of files
             ;;
         esac
         case $command in
-        show | history | log | export | edit | enable | disable | remove | run | stop)
+        show | next | history | log | export | edit | enable | disable | remove | run | stop)
             words=$(tavisched complete-ids 2>/dev/null | cut -f 1)
             ;;
         esac

@@ -7,6 +7,8 @@ complete -c tavisched -n __fish_use_subcommand -s v -l verbose -d 'Show the libr
 
 complete -c tavisched -n __fish_use_subcommand -a list -d 'Show the tasks'
 complete -c tavisched -n __fish_use_subcommand -a show -d 'Show every field of a task'
+complete -c tavisched -n __fish_use_subcommand -a next -d 'Show when tasks will be started'
+complete -c tavisched -n __fish_use_subcommand -a calendar -d 'Show past and coming runs on a timeline'
 complete -c tavisched -n __fish_use_subcommand -a history -d 'Show what runs did'
 complete -c tavisched -n __fish_use_subcommand -a log -d 'Show what the last run printed'
 complete -c tavisched -n __fish_use_subcommand -a export -d 'Write tasks as a JSON array'
@@ -21,7 +23,7 @@ complete -c tavisched -n __fish_use_subcommand -a stop -d 'End running tasks'
 complete -c tavisched -n __fish_use_subcommand -a sync -d 'Write the lines of /etc/crontab anew'
 complete -c tavisched -n __fish_use_subcommand -a check -d 'Look for what is wrong with this machine'
 
-complete -c tavisched -n '__fish_seen_subcommand_from show history log export edit enable disable remove rm run stop' \
+complete -c tavisched -n '__fish_seen_subcommand_from show next history log export edit enable disable remove rm run stop' \
     -k -a '(tavisched complete-ids 2>/dev/null)'
 complete -c tavisched -n '__fish_seen_subcommand_from import' -F
 
@@ -33,7 +35,17 @@ complete -c tavisched -n '__fish_seen_subcommand_from list' -l next -x -d 'Only 
 complete -c tavisched -n '__fish_seen_subcommand_from list' -l sort -d 'Field to sort by' \
     -x -a 'id name state schedule next owner last'
 complete -c tavisched -n '__fish_seen_subcommand_from list' -l reverse -d 'The other way round'
-complete -c tavisched -n '__fish_seen_subcommand_from list show history' -l json -d 'As JSON for scripts'
+complete -c tavisched -n '__fish_seen_subcommand_from list show next calendar history check' -l json -d 'As JSON for scripts'
+complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l json -d 'The task, and errors, as JSON for scripts'
+complete -c tavisched -n '__fish_seen_subcommand_from enable disable remove import run stop' -l json \
+    -d 'Errors as JSON for scripts'
+complete -c tavisched -n '__fish_seen_subcommand_from next' -s n -l number -x -d 'At most so many starts'
+complete -c tavisched -n '__fish_seen_subcommand_from next' -l until -x -d 'Only those until then, YYYY-MM-DD or 7d'
+complete -c tavisched -n '__fish_seen_subcommand_from next' -l all -d 'Also of tasks that are not listable'
+complete -c tavisched -n '__fish_seen_subcommand_from calendar' -l days -x -d 'So many days, today the first'
+complete -c tavisched -n '__fish_seen_subcommand_from calendar' -l past -x -d 'And so many before today'
+complete -c tavisched -n '__fish_seen_subcommand_from calendar' -l hours -d 'Columns of an hour or less'
+complete -c tavisched -n '__fish_seen_subcommand_from calendar' -l all -d 'Also tasks that are not listable'
 complete -c tavisched -n '__fish_seen_subcommand_from export' -l web -d 'As the web back end exchanges them'
 complete -c tavisched -n '__fish_seen_subcommand_from history' -l limit -x -d 'At most so many'
 complete -c tavisched -n '__fish_seen_subcommand_from history' -l failed -d 'Only those without a good end'
@@ -61,7 +73,7 @@ complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l allow-overlap
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l no-overlap -d 'Wait for an earlier run'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l power -d 'Switch the machine on or off' -x -a 'on off'
 complete -c tavisched -n '__fish_seen_subcommand_from add edit' -s q -l quiet -d 'Print the id alone'
-complete -c tavisched -n '__fish_seen_subcommand_from add' -l dry-run -d 'Show what would come of it, store nothing'
+complete -c tavisched -n '__fish_seen_subcommand_from add edit' -l dry-run -d 'Show what would come of it, store nothing'
 complete -c tavisched -n '__fish_seen_subcommand_from import' -l replace -d 'Overwrite tasks of the same id and name'
 complete -c tavisched -n '__fish_seen_subcommand_from import' -l dry-run -d 'Show what would come of it, store nothing'
 

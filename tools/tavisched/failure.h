@@ -8,13 +8,17 @@
 #include <cstdio>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 namespace tavisched {
 
 // The input is not accepted, and nothing was changed.
 struct Refusal : std::runtime_error {
-    using runtime_error::runtime_error;
+    // The option, without dashes, is the one at fault; "" for none in particular.
+    explicit Refusal(const std::string &what, std::string atFault = "")
+        : runtime_error(what), option(std::move(atFault)) {}
     static constexpr int kExitStatus = 2;
+    std::string option;
 };
 
 // The machine did not go along.

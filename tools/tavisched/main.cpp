@@ -4,6 +4,8 @@
 #include "failure.h"
 #include "text/utf8.h"
 #include "waiting.h"
+#include "json/json.h"
+#include "json/plain.h"
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
@@ -37,6 +39,21 @@ CLI::App *subcommand(CLI::App &app, Command &command, const char *name, const ch
 
 // ---- Options of several subcommands ----
 
+struct Settings {
+    ListOptions list;
+    TaskOptions task;
+    ImportOptions import;
+    std::vector<std::string> ids;
+    std::string id;
+    HistoryOptions history;
+    std::string run;
+    int after = 10;
+    NextOptions next;
+    CalendarOptions calendar;
+    Manner manner;
+    bool json = false, web = false, yes = false, wait = false, repair = false, follow = false;
+};
+
 // A number as it was typed; digits alone, as lists show it.
 template <typename Number>
 Number parseNumber(const std::string &text, const char *what, const char *command) {
@@ -68,8 +85,13 @@ void idsOption(CLI::App *sub, std::vector<std::string> &ids, bool required) {
     sub->add_option("ID", ids, "ids of tasks")->required(required);
 }
 
-void jsonOption(CLI::App *sub, bool &json, const char *what) {
+void jsonOption(CLI::App *sub, bool &json, const char *what = "as JSON for scripts") {
     sub->add_flag("--json", json, what);
+}
+
+// For commands that print no tasks. How a command fails is decided by the option as it was typed.
+void jsonErrorsOption(CLI::App *sub, Settings &given) {
+    jsonOption(sub, given.json, "errors as JSON for scripts");
 }
 
 void taskOptions(CLI::App *sub, TaskOptions &options) {
@@ -96,20 +118,13 @@ void taskOptions(CLI::App *sub, TaskOptions &options) {
     sub->add_option("--power", options.power, "switch the machine on or off")->type_name("on|off");
 }
 
-// ---- Subcommands ----
+void mannerOptions(CLI::App *sub, Manner &manner) {
+    sub->add_flag("--dry-run", manner.dryRun, "show what would come of it, store nothing");
+    sub->add_flag("-q,--quiet", manner.quiet, "print the id alone");
+    jsonOption(sub, manner.json, "the task, and errors, as JSON for scripts");
+}
 
-struct Settings {
-    ListOptions list;
-    TaskOptions task;
-    ImportOptions import;
-    std::vector<std::string> ids;
-    std::string id;
-    HistoryOptions history;
-    std::string run;
-    int after = 10;
-    bool json = false, web = false, dryRun = false, quiet = false, yes = false, wait = false,
-         repair = false, follow = false;
-};
+// ---- Subcommands ----
 
 void addListCommand(CLI::App &app, Settings &given, Command &command) {
     auto *const listing =
@@ -125,7 +140,7 @@ void addListCommand(CLI::App &app, Settings &given, Command &command) {
     listing->add_option("--sort", given.list.sort, "field to sort by")
         ->check(CLI::IsMember(sortFields()));
     listing->add_flag("--reverse", given.list.reverse, "the other way round");
-    jsonOption(listing, given.list.json, "as JSON for scripts");
+    jsonOption(listing, given.list.json);
 }
 
 void addRunReadingCommands(CLI::App &app, Settings &given, Command &command) {
@@ -153,6 +168,38 @@ void addRunReadingCommands(CLI::App &app, Settings &given, Command &command) {
     output->add_flag("--follow", given.follow, "go on until the run ends");
 }
 
+void addTimeCommands(CLI::App &app, Settings &given, Command &command) {
+    auto *const coming = subcommand(app, command, "next", "show when tasks will be started",
+                                    "tavisched next --until 24h", [&] {
+                                        given.next.ids = parseIds(given.ids);
+                                        return next(given.next);
+                                    });
+    idsOption(coming, given.ids, false);
+    coming
+        ->add_option("-n,--number", given.next.number,
+                     "at most so many starts; 10, or with --until all")
+        ->type_name("NUMBER")
+        ->check(CLI::Range(1, 1000000));
+    coming->add_option("--until", given.next.until, "only those until then, a date as a whole")
+        ->type_name("YYYY-MM-DD|7d");
+    coming->add_flag("--all", given.next.all, "also of tasks that are not listable");
+    jsonOption(coming, given.next.json, "as JSON for scripts, a line each");
+
+    auto *const timeline =
+        subcommand(app, command, "calendar", "show past and coming runs on a timeline",
+                   "tavisched calendar --days 2 --hours", [&] { return calendar(given.calendar); });
+    timeline->add_option("--days", given.calendar.days, "so many days, today the first; 7")
+        ->type_name("NUMBER")
+        ->check(CLI::Range(1, 366));
+    timeline->add_option("--past", given.calendar.past, "and so many before today; 1")
+        ->type_name("NUMBER")
+        ->check(CLI::Range(0, 366));
+    timeline->add_flag("--hours", given.calendar.hours,
+                       "columns of an hour or less, one part below the other");
+    timeline->add_flag("--all", given.calendar.all, "also tasks that are not listable");
+    jsonOption(timeline, given.calendar.json);
+}
+
 void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
     addListCommand(app, given, command);
 
@@ -160,8 +207,9 @@ void addReadingCommands(CLI::App &app, Settings &given, Command &command) {
         subcommand(app, command, "show", "show every field of a task", "tavisched show 3",
                    [&] { return show(parseId(given.id), given.json); });
     showing->add_option("ID", given.id, "id of the task")->required();
-    jsonOption(showing, given.json, "as JSON for scripts");
+    jsonOption(showing, given.json);
 
+    addTimeCommands(app, given, command);
     addRunReadingCommands(app, given, command);
 
     auto *const exporting = subcommand(app, command, "export", "write tasks as a JSON array",
@@ -176,33 +224,35 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
         subcommand(app, command, "add", "store a new task",
                    "tavisched add --name Backup --command /usr/local/bin/backup --weekly Mon,Fri "
                    "--at 22:00 --owner alice",
-                   [&] { return add(given.task, given.dryRun, given.quiet); });
+                   [&] { return add(given.task, given.manner); });
     taskOptions(adding, given.task);
-    adding->add_flag("--dry-run", given.dryRun, "show what would come of it, store nothing");
-    adding->add_flag("-q,--quiet", given.quiet, "print the id alone");
+    mannerOptions(adding, given.manner);
 
     auto *const editing =
         subcommand(app, command, "edit", "change a task; what is left out keeps its value",
                    "tavisched edit 3 --at 23:30 --every 0",
-                   [&] { return edit(parseId(given.id), given.task, given.quiet); });
+                   [&] { return edit(parseId(given.id), given.task, given.manner); });
     editing->add_option("ID", given.id, "id of the task")->required();
     taskOptions(editing, given.task);
-    editing->add_flag("-q,--quiet", given.quiet, "print the id alone");
+    mannerOptions(editing, given.manner);
 
-    idsOption(subcommand(app, command, "enable", "let tasks run when they are due",
-                         "tavisched enable 3 4",
-                         [&] { return setEnabled(parseIds(given.ids), true); }),
-              given.ids, true);
-    idsOption(subcommand(app, command, "disable", "keep tasks without running them",
-                         "tavisched disable 3",
-                         [&] { return setEnabled(parseIds(given.ids), false); }),
-              given.ids, true);
+    auto *const enabling =
+        subcommand(app, command, "enable", "let tasks run when they are due",
+                   "tavisched enable 3 4", [&] { return setEnabled(parseIds(given.ids), true); });
+    auto *const disabling =
+        subcommand(app, command, "disable", "keep tasks without running them",
+                   "tavisched disable 3", [&] { return setEnabled(parseIds(given.ids), false); });
+    for (CLI::App *const sub : {enabling, disabling}) {
+        idsOption(sub, given.ids, true);
+        jsonErrorsOption(sub, given);
+    }
 
     auto *const removing =
         subcommand(app, command, "remove", "remove tasks", "tavisched remove 3 4 --yes",
                    [&] { return removeTasks(parseIds(given.ids), given.yes); });
     idsOption(removing, given.ids, true);
     removing->add_flag("-y,--yes", given.yes, "do not ask; needed without a terminal");
+    jsonErrorsOption(removing, given);
 
     auto *const importing =
         subcommand(app, command, "import", "store the tasks of a JSON array, all or none",
@@ -213,6 +263,7 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
                         "overwrite tasks of the same id and name");
     importing->add_flag("--dry-run", given.import.dryRun,
                         "show what would come of it, store nothing");
+    jsonErrorsOption(importing, given);
 }
 
 void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
@@ -222,6 +273,7 @@ void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
     idsOption(running, given.ids, true);
     running->add_flag("--wait", given.wait,
                       "wait for the end, show the output and exit as the command");
+    jsonErrorsOption(running, given);
 
     auto *const stopping =
         subcommand(app, command, "stop", "end running tasks", "tavisched stop 3 --after 60",
@@ -230,13 +282,16 @@ void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
     stopping->add_option("--after", given.after, "kill what is left after so many seconds")
         ->type_name("SECONDS")
         ->check(CLI::Range(0, 86400));
+    jsonErrorsOption(stopping, given);
 
     subcommand(app, command, "sync", "write the lines of /etc/crontab anew", "tavisched sync",
                [] { return syncTasks(); });
 
-    subcommand(app, command, "check", "look for what is wrong with this machine",
-               "tavisched check --repair", [&] { return check(given.repair); })
-        ->add_flag("--repair", given.repair, "repair what needs no person");
+    auto *const checking =
+        subcommand(app, command, "check", "look for what is wrong with this machine",
+                   "tavisched check --repair", [&] { return check(given.repair, given.json); });
+    checking->add_flag("--repair", given.repair, "repair what needs no person");
+    jsonOption(checking, given.json, "as JSON for scripts, a line each");
 
     subcommand(app, command, "complete-ids", "ids and names, for completion",
                "tavisched complete-ids", [] { return completeIds(); })
@@ -320,6 +375,12 @@ std::string explain(const CLI::App &app, const CLI::ParseError &error) {
            (sub ? sub->get_name() + " " : "") + "--help\" tells more.";
 }
 
+// The option that the parser's message begins with.
+std::string optionNamed(const std::string &message) {
+    const size_t end = message.find(':');
+    return message.starts_with("--") && end != std::string::npos ? message.substr(2, end - 2) : "";
+}
+
 // People know these from elsewhere.
 std::string commandFor(const std::string &typed) {
     return typed == "ls" ? "list" : typed == "rm" ? "remove" : typed;
@@ -340,13 +401,33 @@ std::vector<std::string> argumentsOf(int argc, char **argv) {
 
 // ---- Executing ----
 
-int fail(const std::exception &error, int status) {
-    std::fflush(stdout);
-    std::fprintf(stderr, "tavisched: %s\n", printableLines(error.what()).c_str());
-    return status;
-}
+// Tells of the end without success, as JSON when the command was asked to print that.
+class Failing {
+  public:
+    explicit Failing(bool json) : json_(json) {}
 
-int execute(const Command &command) {
+    int with(const std::string &what, int status, const std::string &option = "") const {
+        std::fflush(stdout);
+        if (json_) {
+            Json::Value error;
+            error["error"] = plainText(what);
+            error["option"] = option.empty() ? Json::Value() : Json::Value(option);
+            error["status"] = status;
+            std::fprintf(stderr, "%s\n", jsonLine(error).c_str());
+        } else {
+            std::fprintf(stderr, "tavisched: %s\n", printableLines(what).c_str());
+        }
+        return status;
+    }
+    int with(const Refusal &refusal) const {
+        return with(refusal.what(), Refusal::kExitStatus, refusal.option);
+    }
+
+  private:
+    bool json_;
+};
+
+int execute(const Command &command, const Failing &fail) {
     try {
         if (geteuid() != 0) {
             throw Failure("tasks are kept in root's files: it must be run by root");
@@ -358,9 +439,9 @@ int execute(const Command &command) {
         }
         return status;
     } catch (const Refusal &refusal) {
-        return fail(refusal, Refusal::kExitStatus);
+        return fail.with(refusal);
     } catch (const std::exception &failure) {
-        return fail(failure, Failure::kExitStatus);
+        return fail.with(failure.what(), Failure::kExitStatus);
     }
 }
 
@@ -378,21 +459,22 @@ int tavischedMain(int argc, char **argv) {
     addReadingCommands(app, given, command);
     addChangingCommands(app, given, command);
     addMachineCommands(app, given, command);
+    std::vector<std::string> arguments = argumentsOf(argc, argv);
+    const Failing fail(std::find(arguments.begin(), arguments.end(), "--json") != arguments.end());
     try {
-        app.parse(argumentsOf(argc, argv));
+        app.parse(std::move(arguments));
     } catch (const CLI::ParseError &error) {
         return error.get_exit_code() == 0
                    ? app.exit(error)
-                   : fail(Refusal(explain(app, error)), Refusal::kExitStatus);
+                   : fail.with(Refusal(explain(app, error), optionNamed(error.what())));
     }
     if (!command) {
-        return fail(Refusal("a command is needed; \"tavisched --help\" lists them"),
-                    Refusal::kExitStatus);
+        return fail.with(Refusal("a command is needed; \"tavisched --help\" lists them"));
     }
     unsetenv("TZ"); // times are the machine's, as cron takes them
     umask(022);
     openlog("tavisched", LOG_PID | (verbose ? LOG_PERROR : 0), LOG_USER);
-    return execute(command);
+    return execute(command, fail);
 }
 
 } // namespace
@@ -401,6 +483,6 @@ int main(int argc, char **argv) {
     try {
         return tavischedMain(argc, argv);
     } catch (const std::exception &error) {
-        return fail(error, Failure::kExitStatus);
+        return Failing(false).with(error.what(), Failure::kExitStatus);
     }
 }

@@ -1,10 +1,8 @@
 // The subcommand "add": stores a new task, or shows what would come of it.
-#include "commands/commands.h"
+#include "commands/tell.h"
 #include "failure.h"
 #include "tasks/change.h"
 #include "tasks/findings.h"
-#include "tasks/report.h"
-#include "text/words.h"
 
 #include <cstdio>
 
@@ -14,28 +12,14 @@ namespace {
 
 Task makeTask(const TaskOptions &options) {
     if (!options.power && !options.command) {
-        throw Refusal("a task needs --command, or --power for a power schedule");
+        throw Refusal("a task needs --command, or --power for a power schedule", "command");
     }
     Task task = newTask(options.power ? TAVI_SCHED_BACKEND_AUTOPOWER : TAVI_SCHED_BACKEND_SCHEDULE);
     apply(options, *task);
     return task;
 }
 
-std::string withoutSchedule(const TaskOptions &options) {
-    return options.schedule() ? "" : "Note: no schedule was given, so it is daily at 00:00.";
-}
-
-// What the machine does at the time of a power schedule.
-std::string effectOf(const TAVI_SCHED_TASK &task) {
-    if (!isEnabled(task)) {
-        return "nothing while it is disabled";
-    }
-    return task.appArgs == kPowerOn
-               ? "the machine's clock is set to switch it on, should it be off then"
-               : "cron runs the power-off check, which switches the machine off if it may be";
-}
-
-int dryRun(const TaskOptions &options, bool quiet) {
+void dryRun(const TaskOptions &options, const Manner &manner) {
     const Tasks tasks = Tasks::read();
     const Task task = makeTask(options);
     requirePossible(Tasks::readPower(), *task, nullptr);
@@ -43,28 +27,7 @@ int dryRun(const TaskOptions &options, bool quiet) {
     if (!isPower(*task)) {
         TAVISchedTaskNextId(&task->id);
     }
-    computeNextRun(*task);
-    if (quiet) {
-        std::printf("%ld\n", static_cast<long>(task->id));
-        return 0;
-    }
-    std::printf("Schedule: %s\n", scheduleInWords(*task).c_str());
-    if (isPower(*task)) {
-        std::printf("What happens: %s\n", effectOf(*task).c_str());
-    } else {
-        std::printf("Crontab line: %s\n",
-                    crontabLine(*task).value_or("none while disabled").c_str());
-    }
-    std::printf("Next run: %s\n", nextRun(*task).value_or("never").c_str());
-    std::vector<std::string> notes;
-    if (const std::string remark = remarkOn(*task); !remark.empty()) {
-        notes.push_back("Note: " + remark + ".");
-    }
-    if (const std::string note = withoutSchedule(options); !note.empty()) {
-        notes.push_back(note);
-    }
-    print(notes);
-    return 0;
+    tellPreview(*task, tasks, manner);
 }
 
 Task store(const TaskOptions &options) {
@@ -77,20 +40,19 @@ Task store(const TaskOptions &options) {
 
 } // namespace
 
-int add(const TaskOptions &options, bool isDryRun, bool quiet) {
-    if (isDryRun) {
-        return dryRun(options, quiet);
-    }
-    const Task task = store(options);
-    if (quiet) {
-        std::printf("%ld\n", static_cast<long>(task->id));
+int add(const TaskOptions &options, const Manner &manner) {
+    if (manner.dryRun) {
+        dryRun(options, manner);
     } else {
-        print(reportOf(*task, task->id));
-        if (const std::string note = withoutSchedule(options); !note.empty()) {
-            print({note});
-        }
+        const Task task = store(options);
+        tellStored(*task, task->id, manner);
     }
-    warnWhenNothingRuns();
+    if (!manner.quiet && !manner.json && !options.schedule()) {
+        std::printf("Note: no schedule was given, so it is daily at 00:00.\n");
+    }
+    if (!manner.dryRun) {
+        warnWhenNothingRuns();
+    }
     return 0;
 }
 

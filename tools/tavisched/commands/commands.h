@@ -39,9 +39,31 @@ struct HistoryOptions {
 int history(const HistoryOptions &options);
 int log(int32_t id, std::optional<int64_t> number, bool follow);
 int exportTasks(const Ids &ids, bool web);
+struct NextOptions {
+    Ids ids;           // none: of all tasks
+    int number = 0;    // at most so many starts; 0 = 10, or all until a moment that was given
+    std::string until; // such as "2026-12-24" or "24h"
+    bool all = false;
+    bool json = false;
+};
+int next(const NextOptions &options);
+struct CalendarOptions {
+    int days = 7; // from today on
+    int past = 1; // before today
+    bool hours = false;
+    bool all = false;
+    bool json = false;
+};
+int calendar(const CalendarOptions &options);
 
-int add(const TaskOptions &options, bool dryRun, bool quiet);
-int edit(int32_t id, const TaskOptions &options, bool quiet);
+// How a change of a task goes, and is told.
+struct Manner {
+    bool dryRun = false;
+    bool quiet = false; // the id alone
+    bool json = false;
+};
+int add(const TaskOptions &options, const Manner &manner);
+int edit(int32_t id, const TaskOptions &options, const Manner &manner);
 int setEnabled(const Ids &ids, bool enabled); // enable.cpp
 int removeTasks(const Ids &ids, bool yes);
 struct ImportOptions {
@@ -54,7 +76,7 @@ int importTasks(const ImportOptions &options);
 int run(const Ids &ids, bool wait);
 int stop(const Ids &ids, int graceSeconds);
 int syncTasks();
-int check(bool repair);
+int check(bool repair, bool json);
 
 // Ids and names of all tasks, a line each, for completion.
 int completeIds();

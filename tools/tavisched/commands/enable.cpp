@@ -34,8 +34,10 @@ std::vector<Changed> changeStates(const Ids &ids, bool enabled) {
 } // namespace
 
 int setEnabled(const Ids &ids, bool enabled) {
-    for (const auto &[task, idBefore] : changeStates(ids, enabled)) {
-        print(reportOf(*task, idBefore));
+    const std::vector<Changed> changed = changeStates(ids, enabled);
+    const Tasks stored = Tasks::read();
+    for (const auto &[task, idBefore] : changed) {
+        print(reportOf(*task, idBefore, stored));
     }
     if (enabled) {
         warnWhenNothingRuns();

@@ -3,6 +3,7 @@
 #include "failure.h"
 #include "tasks/findings.h"
 #include "tasks/runs_table.h"
+#include "tasks/starts.h"
 #include "text/moments.h"
 #include "text/utf8.h"
 #include "text/words.h"
@@ -19,9 +20,16 @@ namespace tavisched {
 
 namespace {
 
-const Run *lastRunOf(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
+// A task with what a line says of it.
+struct Listed {
+    const TAVI_SCHED_TASK *task;
+    const Run *lastRun; // or nullptr
+    std::optional<time_t> next;
+};
+
+Listed lookAt(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
     const auto run = runs.find(task.id);
-    return run == runs.end() ? nullptr : &run->second;
+    return {&task, run == runs.end() ? nullptr : &run->second, nextStart(task)};
 }
 
 // ---- Which ----
@@ -35,79 +43,79 @@ bool hasWord(const TAVI_SCHED_TASK &task, const Run *run, const std::string &wor
            holds(task.app, word) || folded(stateInWords(task, run)) == word;
 }
 
-// The end of a time such as "24h" from now, as next runs are written.
-std::string endOf(const std::string &span) {
+// The end of a time such as "24h" from now.
+time_t endOf(const std::string &span) {
     const auto seconds = parseSpan(span);
     if (!seconds) {
         throw Refusal("--next: \"" + printable(span) +
                       "\" is not accepted; accepted: a time such as 30m, 24h, 7d or 2w");
     }
-    return localTime(time(nullptr) + *seconds).substr(0, sizeof "YYYY-MM-DD hh:mm" - 1);
+    return time(nullptr) + *seconds;
 }
 
 // Whether a task is to be listed.
 class Filter {
   public:
     explicit Filter(const ListOptions &options)
-        : options_(options), until_(options.next.empty() ? "" : endOf(options.next)) {
+        : options_(options),
+          until_(options.next.empty() ? std::nullopt : std::optional(endOf(options.next))) {
         for (const std::string &word : options.words) {
             words_.push_back(folded(word));
         }
     }
-    bool operator()(const TAVI_SCHED_TASK &task, const Run *run) const {
+    bool operator()(const Listed &listed) const {
         const std::string &owner = options_.owner;
+        const TAVI_SCHED_TASK &task = *listed.task;
+        const Run *const run = listed.lastRun;
         return (options_.all || task.listable == 1) &&
                (!options_.failed || (run && hasFailed(*run))) &&
                (owner.empty() || owner == ownerName(task.owner) ||
                 owner == std::to_string(task.owner)) &&
-               (until_.empty() || nextRun(task).value_or("never") <= until_) &&
+               (!until_ || (listed.next && *listed.next <= *until_)) &&
                std::all_of(words_.begin(), words_.end(),
                            [&](const std::string &word) { return hasWord(task, run, word); });
     }
 
   private:
     const ListOptions &options_;
-    std::string until_;
+    std::optional<time_t> until_;
     std::vector<std::string> words_;
 };
 
 // ---- In which order ----
 
-using Before = std::function<bool(const TAVI_SCHED_TASK &, const TAVI_SCHED_TASK &)>;
+using Before = std::function<bool(const Listed &, const Listed &)>;
 
-time_t lastStart(const TAVI_SCHED_TASK &task, const LatestRuns &runs) {
-    const Run *const run = lastRunOf(task, runs);
-    return run ? startOf(*run) : 0;
-}
-
-std::map<std::string, Before> orders(const LatestRuns &runs) {
-    return {{"id", [](auto &one, auto &other) { return one.id < other.id; }},
-            {"name", [](auto &one, auto &other) { return strcasecmp(one.name, other.name) < 0; }},
-            {"state", [](auto &one, auto &other) { return one.state > other.state; }},
-            {"schedule",
-             [](auto &one, auto &other) { return scheduleInWords(one) < scheduleInWords(other); }},
-            {"next",
-             [](auto &one, auto &other) {
-                 return nextRun(one).value_or("") < nextRun(other).value_or("");
-             }},
-            {"owner",
-             [](auto &one, auto &other) { return ownerName(one.owner) < ownerName(other.owner); }},
-            {"last", [&runs](auto &one, auto &other) {
-                 return lastStart(one, runs) > lastStart(other, runs);
-             }}};
+const std::map<std::string, Before> &orders() {
+    const auto byTask = [](auto field) -> Before {
+        return [field](const Listed &one, const Listed &other) {
+            return field(*one.task) < field(*other.task);
+        };
+    };
+    static const std::map<std::string, Before> all = {
+        {"id", byTask([](const auto &task) { return task.id; })},
+        {"name",
+         [](const Listed &one, const Listed &other) {
+             return strcasecmp(one.task->name, other.task->name) < 0;
+         }},
+        {"state", byTask([](const auto &task) { return -task.state; })},
+        {"schedule", byTask([](const auto &task) { return scheduleInWords(task); })},
+        {"next", [](const Listed &one, const Listed &other) { return one.next < other.next; }},
+        {"owner", byTask([](const auto &task) { return ownerName(task.owner); })},
+        {"last", [](const Listed &one, const Listed &other) {
+             return startOf(*one.lastRun) > startOf(*other.lastRun);
+         }}};
+    return all;
 }
 
 // Tasks without a next or a last run come last, in either direction.
-void sort(TaskPointers &tasks, const ListOptions &options, const LatestRuns &runs) {
-    const Before before = orders(runs).at(options.sort);
-    const auto lacksField = [&](const TAVI_SCHED_TASK *task) {
-        return (options.sort == "next" && !nextRun(*task)) ||
-               (options.sort == "last" && !lastRunOf(*task, runs));
+void sort(std::vector<Listed> &tasks, const ListOptions &options) {
+    const auto hasField = [&](const Listed &listed) {
+        return (options.sort != "next" || listed.next) &&
+               (options.sort != "last" || listed.lastRun);
     };
-    const auto lacking = std::stable_partition(tasks.begin(), tasks.end(),
-                                               [&](const auto *task) { return !lacksField(task); });
-    std::stable_sort(tasks.begin(), lacking,
-                     [&](const auto *one, const auto *other) { return before(*one, *other); });
+    const auto lacking = std::stable_partition(tasks.begin(), tasks.end(), hasField);
+    std::stable_sort(tasks.begin(), lacking, orders().at(options.sort));
     if (options.reverse) {
         std::reverse(tasks.begin(), lacking);
     }
@@ -122,22 +130,23 @@ std::string resultWithTime(const Run &run) {
            (goesOn(run) ? "" : " " + ago(startOf(run), time(nullptr)));
 }
 
-Row rowOf(const TAVI_SCHED_TASK &task, const Run *run) {
+Row rowOf(const Listed &listed) {
+    const TAVI_SCHED_TASK &task = *listed.task;
+    const Run *const run = listed.lastRun;
     return {{std::to_string(task.id)},
             {printable(task.name)},
             {stateInWords(task, run), isEnabled(task) ? Style::Plain : Style::Faint},
             {scheduleInWords(task)},
-            {nextRun(task).value_or("-")},
+            {listed.next       ? localMinute(*listed.next)
+             : isEnabled(task) ? "never"
+                               : "-"},
             {printable(ownerName(task.owner))},
             run ? Cell{printable(resultWithTime(*run)), styleOf(*run)} : Cell{"-"}};
 }
 
-void printTasks(const TaskPointers &tasks, const LatestRuns &runs) {
+void printTasks(const std::vector<Listed> &tasks) {
     std::vector<Row> rows;
-    rows.reserve(tasks.size());
-    for (const TAVI_SCHED_TASK *const task : tasks) {
-        rows.push_back(rowOf(*task, lastRunOf(*task, runs)));
-    }
+    std::transform(tasks.begin(), tasks.end(), std::back_inserter(rows), rowOf);
     printTable({{"ID", true},
                 {"NAME", false, true},
                 {"STATE", false, false, 2},
@@ -146,6 +155,16 @@ void printTasks(const TaskPointers &tasks, const LatestRuns &runs) {
                 {"OWNER", false, true, 1},
                 {"LAST RUN", false, true, 3}},
                std::move(rows));
+}
+
+void printAsJson(const std::vector<Listed> &shown, const TaskPointers &all,
+                 const LatestRuns &runs) {
+    auto notes = notesOnAll(all);
+    Json::Value values(Json::arrayValue);
+    for (const Listed &listed : shown) {
+        values.append(plainTask(*listed.task, runs, notes[listed.task]));
+    }
+    printJson(values);
 }
 
 } // namespace
@@ -160,21 +179,21 @@ int list(const ListOptions &options) {
     const Filter filter(options);
     const Tasks tasks = Tasks::read();
     const LatestRuns runs = readLatestRuns();
-    TaskPointers shown;
-    std::copy_if(tasks.all().begin(), tasks.all().end(), std::back_inserter(shown),
-                 [&](const auto *task) { return filter(*task, lastRunOf(*task, runs)); });
-    sort(shown, options, runs);
-    if (options.json) {
-        Json::Value values(Json::arrayValue);
-        for (const TAVI_SCHED_TASK *const task : shown) {
-            values.append(plainTask(*task, runs));
+    std::vector<Listed> shown;
+    for (const TAVI_SCHED_TASK *const task : tasks.all()) {
+        const Listed listed = lookAt(*task, runs);
+        if (filter(listed)) {
+            shown.push_back(listed);
         }
-        printJson(values);
+    }
+    sort(shown, options);
+    if (options.json) {
+        printAsJson(shown, tasks.all(), runs);
     } else if (shown.empty()) {
         std::printf("There are no tasks%s.\n",
                     tasks.all().empty() ? "" : " to list; --all shows all");
     } else {
-        printTasks(shown, runs);
+        printTasks(shown);
     }
     std::fflush(stdout);
     warnWhenNothingRuns();

@@ -1,6 +1,7 @@
-// The subcommand "show": every field of one task, and how it ran. The others are not read.
+// The subcommand "show": every field of one task, and how it ran.
 #include "commands/commands.h"
 #include "tasks/runs_table.h"
+#include "tasks/starts.h"
 #include "text/utf8.h"
 #include "text/words.h"
 #include "json/json.h"
@@ -76,15 +77,14 @@ std::string firstDay(const TAVI_SCHED_TASK &task) {
     return text.data();
 }
 
-void printTask(const TAVI_SCHED_TASK &task, const Run *lastRun) {
-    const std::string never = isEnabled(task) ? "never" : "never while disabled";
+void printTask(const TAVI_SCHED_TASK &task, const Run *lastRun, const Notes &notes) {
     std::printf("%s\n", styled("Task " + std::to_string(task.id) + ": " + printable(task.name),
                                Style::Strong)
                             .c_str());
     printField("Kind", isPower(task) ? "power schedule (taviautopower)" : "task (tavischedule)");
     printField("State", stateInWords(task, lastRun));
     printField("Schedule", scheduleInWords(task));
-    printField("Next run", nextRun(task).value_or(never));
+    printField("Next run", nextStartInWords(task) + (isEnabled(task) ? "" : " while disabled"));
     printField("Last run", printable(lastRunInWords(lastRun)));
     printField("Owner", printable(ownerName(task.owner)) + " (" + std::to_string(task.owner) + ")");
     printField("Command", commandInLines(task.command));
@@ -99,6 +99,9 @@ void printTask(const TAVI_SCHED_TASK &task, const Run *lastRun) {
     printField("First day", firstDay(task));
     if (!isPower(task)) {
         printField("Crontab", crontabLine(task).value_or("no line while disabled"));
+    }
+    for (const std::string &note : notes) {
+        printField("Note", note);
     }
 }
 
@@ -118,11 +121,13 @@ std::vector<Run> lastRuns(int32_t id) {
 int show(int32_t id, bool json) {
     const Task task = readTask(id);
     const std::vector<Run> runs = lastRuns(id);
+    const Notes notes = notesOn(*task, Tasks::read().all());
     if (json) {
-        printJson(plainTask(*task, runs.empty() ? LatestRuns{} : LatestRuns{{id, runs.front()}}));
+        printJson(plainTaskWithStarts(
+            *task, runs.empty() ? LatestRuns{} : LatestRuns{{id, runs.front()}}, notes));
         return 0;
     }
-    printTask(*task, runs.empty() ? nullptr : &runs.front());
+    printTask(*task, runs.empty() ? nullptr : &runs.front(), notes);
     if (!runs.empty()) {
         std::printf("\n");
         printRunsTable(runs);

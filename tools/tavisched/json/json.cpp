@@ -29,23 +29,27 @@ std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json
 
 namespace {
 
-void print(const Json::Value &value, const char *indentation) {
+std::string write(const Json::Value &value, const char *indentation) {
     Json::StreamWriterBuilder builder;
     builder["indentation"] = indentation;
     builder["precision"] = 15;
     builder["emitUTF8"] = true;
     builder["enableYAMLCompatibility"] = true; // no blank before a colon
-    std::printf("%s\n", printableLines(Json::writeString(builder, value)).c_str());
+    return printableLines(Json::writeString(builder, value));
 }
 
 } // namespace
 
 void printJson(const Json::Value &value) {
-    print(value, "  ");
+    std::printf("%s\n", write(value, "  ").c_str());
 }
 
 void printJsonLine(const Json::Value &value) {
-    print(value, "");
+    std::printf("%s\n", jsonLine(value).c_str());
+}
+
+std::string jsonLine(const Json::Value &value) {
+    return write(value, "");
 }
 
 } // namespace tavisched

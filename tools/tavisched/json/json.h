@@ -14,5 +14,7 @@ std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json
 void printJson(const Json::Value &value);
 // The same on one line.
 void printJsonLine(const Json::Value &value);
+// The same as a text without a line feed.
+std::string jsonLine(const Json::Value &value);
 
 } // namespace tavisched

@@ -56,7 +56,8 @@ constexpr struct Member {
 };
 constexpr const char *kBackend = "backend";
 constexpr const char *kOwner = "owner";
-constexpr std::array<std::string_view, 3> kThatFollow = {"schedule", "nextRun", "lastRun"};
+constexpr std::array<std::string_view, 6> kThatFollow = {"schedule", "nextRun", "nextStart",
+                                                         "lastRun",  "notes",   "starts"};
 
 const Member *memberNamed(std::string_view name) {
     const auto *const member = std::find_if(std::begin(kMembers), std::end(kMembers),
@@ -70,16 +71,12 @@ std::string nameOfKey(const std::string &key) {
     return member == std::end(kMembers) ? key : member->name;
 }
 
-std::string utf8(const std::string &text) {
-    return isUtf8(text) ? text : printable(text);
-}
-
 // ---- Writing ----
 
 // A mask that is none is written as it is.
 Json::Value daysOf(const std::string &week) {
     if (week.size() != TAVI_SCHED_WEEK_DAYS || week.find_first_not_of("01") != std::string::npos) {
-        return utf8(week);
+        return plainText(week);
     }
     Json::Value days(Json::arrayValue);
     for (size_t day = 0; day < week.size(); ++day) {
@@ -101,9 +98,9 @@ Json::Value valueOf(Kind kind, const std::string &text, const TAVI_SCHED_TASK &t
     case Kind::Days:
         return daysOf(text);
     case Kind::Command:
-        return utf8(task.command);
+        return plainText(task.command);
     default:
-        return utf8(text);
+        return plainText(text);
     }
 }
 
@@ -144,7 +141,7 @@ std::optional<std::string> textOf(const Member &member, const Json::Value &value
         return std::string(TAVI_SCHED_WEEK_DAYS, '0');
     }
     try {
-        return parseDays(value.isString() ? value.asString() : join(days, ","), "accepted");
+        return parseDays(value.isString() ? value.asString() : join(days, ","), "--weekly");
     } catch (const Refusal &) {
         return refuse("days, such as [\"Mon\", \"Fri\"]");
     }
@@ -194,6 +191,10 @@ void readMembers(const Json::Value &element, Hash &form, ImportFaults &faults) {
 
 } // namespace
 
+std::string plainText(const std::string &text) {
+    return isUtf8(text) ? text : printable(text);
+}
+
 Json::Value plainStored(const TAVI_SCHED_TASK &task) {
     const Hash form(task);
     Json::Value value;
@@ -216,7 +217,7 @@ Json::Value plainRun(const Run &run) {
     Json::Value value;
     value["run"] = number(run.run);
     value["task"] = run.taskId;
-    value["name"] = utf8(run.name);
+    value["name"] = plainText(run.name);
     value["taskRemoved"] = run.isOfRemovedTask == 1;
     value["owner"] = ownerName(run.owner);
     value["startedBy"] = run.mode == 1 ? Json::Value() : Json::Value(startInWords(run));
@@ -239,13 +240,39 @@ Json::Value plainRun(const Run &run) {
     return value;
 }
 
-Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns) {
+Json::Value plainTimes(const std::vector<time_t> &times) {
+    Json::Value value(Json::arrayValue);
+    for (const time_t time : times) {
+        value.append(isoTime(time));
+    }
+    return value;
+}
+
+Json::Value plainPower(const TAVI_SCHED_TASK &task) {
+    return isPower(task) ? Json::Value(task.appArgs == kPowerOn ? "on" : "off") : Json::Value();
+}
+
+Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns,
+                      const Notes &notes) {
     const auto next = nextRun(task);
+    const auto start = nextStart(task);
     const auto run = latestRuns.find(task.id);
     Json::Value value = plainStored(task);
     value["schedule"] = scheduleInWords(task);
     value["nextRun"] = next ? Json::Value(*next) : Json::Value();
+    value["nextStart"] = start ? Json::Value(isoTime(*start)) : Json::Value();
     value["lastRun"] = run == latestRuns.end() ? Json::Value() : plainRun(run->second);
+    value["notes"] = Json::Value(Json::arrayValue);
+    for (const std::string &note : notes) {
+        value["notes"].append(note);
+    }
+    return value;
+}
+
+Json::Value plainTaskWithStarts(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns,
+                                const Notes &notes) {
+    Json::Value value = plainTask(task, latestRuns, notes);
+    value["starts"] = plainTimes(comingStarts(task));
     return value;
 }
 

@@ -3,6 +3,7 @@
 #pragma once
 
 #include "tasks/runs.h"
+#include "tasks/starts.h"
 #include "tasks/tasks.h"
 #include "json/faults.h"
 
@@ -10,10 +11,20 @@
 
 namespace tavisched {
 
-// What is stored of a task. Bytes that are no UTF-8 become U+FFFD.
+// Bytes that are no UTF-8 become U+FFFD.
+std::string plainText(const std::string &text);
+// What is stored of a task.
 Json::Value plainStored(const TAVI_SCHED_TASK &task);
-// The same with what follows from it: the schedule in words, the next run, the last one.
-Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns);
+// The same with what follows from it: the schedule in words, the next run as the library shows it
+// and as it will be, the last one, and what is remarkable.
+Json::Value plainTask(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns,
+                      const Notes &notes);
+// That with the starts that come next.
+Json::Value plainTaskWithStarts(const TAVI_SCHED_TASK &task, const LatestRuns &latestRuns,
+                                const Notes &notes);
+Json::Value plainTimes(const std::vector<time_t> &times);
+// "on" or "off" for a power schedule, else null.
+Json::Value plainPower(const TAVI_SCHED_TASK &task);
 Json::Value plainRun(const Run &run);
 
 // A task that was read, and what a person should know of it; no task when it has faults.

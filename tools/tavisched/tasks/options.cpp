@@ -22,7 +22,7 @@ constexpr uint32_t kLastHour = 23;
 constexpr uint32_t kAnyYear = 2012; // one in which every day of the year is there
 
 [[noreturn]] void refuse(const char *option, const std::string &what) {
-    throw Refusal(std::string(option) + ": " + what);
+    throw Refusal(std::string(option) + ": " + what, option + std::strlen("--"));
 }
 
 [[noreturn]] void refuseText(const char *option, std::string_view text, const char *accepted) {
@@ -288,6 +288,27 @@ void refuseConflicts(const TaskOptions &options) {
     }
 }
 
+// The option that sets a field, by the field's stored key; "" for none.
+std::string optionOf(const std::string &key, const TaskOptions &options) {
+    constexpr struct {
+        std::string_view key;
+        const char *option;
+    } kOptions[] = {{"name", "name"},         {"cmd", "command"},          {"owner", "owner"},
+                    {"app", "app"},           {"run hour", "at"},          {"run min", "at"},
+                    {"repeat hour", "every"}, {"last work hour", "until"}, {"week", "weekly"},
+                    {"app args", "power"}};
+    const auto *const row = std::find_if(std::begin(kOptions), std::end(kOptions),
+                                         [&](const auto &option) { return option.key == key; });
+    if (row != std::end(kOptions)) {
+        return row->option;
+    }
+    return !key.starts_with("start ") ? ""
+           : options.once             ? "once"
+           : options.yearly           ? "yearly"
+           : options.monthly          ? "monthly"
+                                      : "";
+}
+
 } // namespace
 
 bool TaskOptions::schedule() const {
@@ -318,7 +339,8 @@ void apply(const TaskOptions &options, TAVI_SCHED_TASK &task) {
     // A fault that was there before cannot be helped here and must not stand in the way.
     const auto fault = findFault(task);
     if (fault && (!faultBefore || std::strcmp(faultBefore->reason, fault->reason) != 0)) {
-        throw Refusal(called(task) + ": " + printable(inWords(*fault)));
+        throw Refusal(called(task) + ": " + printable(inWords(*fault)),
+                      optionOf(fault->key, options));
     }
     if (options.schedule() || options.enabled) {
         refusePast(task);
@@ -329,7 +351,8 @@ void refusePast(TAVI_SCHED_TASK &task) {
     computeNextRun(task);
     if (std::string_view(task.nextTriggerTime) == "N/A") {
         throw Refusal("the time of " + called(task) + ", " + scheduleInWords(task) +
-                      ", has passed; accepted: a time in the future");
+                          ", has passed; accepted: a time in the future",
+                      "once");
     }
 }
 

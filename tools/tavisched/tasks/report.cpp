@@ -1,28 +1,66 @@
-// What is told of a task that was stored.
+// What is told of a task that was stored, or would be.
 #include "tasks/report.h"
+#include "tasks/starts.h"
+#include "text/utf8.h"
 #include "text/words.h"
 
 #include <cstdio>
 
 namespace tavisched {
 
-std::vector<std::string> reportOf(const TAVI_SCHED_TASK &stored, int32_t idBefore) {
-    Task task = copyOf(stored);
-    computeNextRun(*task);
-    if (isPower(*task)) { // lists name it otherwise
-        const Tasks power = Tasks::readPower();
-        if (const TAVI_SCHED_TASK *const same = findSameSchedule(power.all(), *task)) {
-            task = copyOf(*same);
-        }
+namespace {
+
+void addNotes(const TAVI_SCHED_TASK &task, const Tasks &stored, std::vector<std::string> &lines) {
+    for (const std::string &note : notesOn(task, stored.all())) {
+        lines.push_back("Note: " + note + ".");
     }
-    const std::string before = task->id == idBefore ? "" : ", was " + std::to_string(idBefore);
+}
+
+// What the machine does at the time of a power schedule.
+std::string effectOf(const TAVI_SCHED_TASK &task) {
+    if (!isEnabled(task)) {
+        return "nothing while it is disabled";
+    }
+    return task.appArgs == kPowerOn
+               ? "the machine's clock is set to switch it on, should it be off then"
+               : "cron runs the power-off check, which switches the machine off if it may be";
+}
+
+} // namespace
+
+Task asListed(const TAVI_SCHED_TASK &task, const Tasks &stored) {
+    const TAVI_SCHED_TASK *const same =
+        isPower(task) ? findSameSchedule(stored.all(), task) : stored.find(task.id);
+    Task listed = copyOf(same ? *same : task);
+    if (!same) {
+        computeNextRun(*listed);
+    }
+    return listed;
+}
+
+std::vector<std::string> reportOf(const TAVI_SCHED_TASK &task, int32_t idBefore,
+                                  const Tasks &stored) {
+    const Task listed = asListed(task, stored);
+    const std::string before = listed->id == idBefore ? "" : ", was " + std::to_string(idBefore);
     const std::string next =
-        isEnabled(*task) ? "next run " + nextRun(*task).value_or("never") : "disabled";
-    std::vector<std::string> lines = {called(*task) + before + ": " + scheduleInWords(*task) +
+        isEnabled(*listed) ? "next run " + nextStartInWords(*listed) : "disabled";
+    std::vector<std::string> lines = {called(*listed) + before + ": " + scheduleInWords(*listed) +
                                       ", " + next};
-    if (const std::string remark = remarkOn(*task); !remark.empty()) {
-        lines.push_back("Note: " + remark + ".");
+    addNotes(*listed, stored, lines);
+    return lines;
+}
+
+std::vector<std::string> previewOf(const TAVI_SCHED_TASK &task, const Tasks &stored) {
+    std::vector<std::string> starts;
+    for (const time_t start : comingStarts(task)) {
+        starts.push_back(localMinute(start));
     }
+    std::vector<std::string> lines = {
+        "Schedule: " + scheduleInWords(task),
+        isPower(task) ? "What happens: " + effectOf(task)
+                      : "Crontab line: " + crontabLine(task).value_or("none while disabled"),
+        "Next runs: " + (starts.empty() ? "never" : join(starts, ", "))};
+    addNotes(task, stored, lines);
     return lines;
 }
 

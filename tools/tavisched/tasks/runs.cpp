@@ -122,6 +122,24 @@ bool printFrom(int64_t run, int64_t &offset, Printer &printer) {
 
 } // namespace
 
+namespace {
+
+LatestRuns readNewest(int32_t taskId) {
+    LatestRuns latest;
+    try {
+        TAVI_SCHED_RUN_FILTER filter = runsOf(taskId);
+        filter.newestOnly = 1;
+        for (const Run &run : readRuns(filter)) {
+            latest.try_emplace(run.taskId, run);
+        }
+    } catch (const Failure &failure) {
+        std::cerr << "tavisched: warning: " << failure.what() << "\n";
+    }
+    return latest;
+}
+
+} // namespace
+
 std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter) {
     Collector found;
     const int count = TAVISchedRunList(&filter, Collector::add, &found);
@@ -135,17 +153,11 @@ std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter) {
 }
 
 LatestRuns readLatestRuns() {
-    LatestRuns latest;
-    try {
-        TAVI_SCHED_RUN_FILTER filter = kAllRuns;
-        filter.newestOnly = 1;
-        for (const Run &run : readRuns(filter)) {
-            latest.try_emplace(run.taskId, run);
-        }
-    } catch (const Failure &failure) {
-        std::cerr << "tavisched: warning: " << failure.what() << "\n";
-    }
-    return latest;
+    return readNewest(-1);
+}
+
+LatestRuns readLatestRunOf(int32_t taskId) {
+    return readNewest(taskId);
 }
 
 std::optional<Run> findRun(int64_t run) {

@@ -25,6 +25,8 @@ std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter);
 // The newest run of every task that has one. Nothing, with a warning, when they cannot be read:
 // tasks can be shown all the same.
 LatestRuns readLatestRuns();
+// The same for one task.
+LatestRuns readLatestRunOf(int32_t taskId);
 // One run, or nothing when it has no record.
 std::optional<Run> findRun(int64_t run);
 

@@ -59,7 +59,7 @@ bool addDays(std::string_view part, std::string &week) {
 
 } // namespace
 
-std::string parseDays(std::string_view text, const std::string &subject) {
+std::string parseDays(std::string_view text, const char *option) {
     std::string lower(text);
     std::transform(lower.begin(), lower.end(), lower.begin(),
                    [](unsigned char letter) { return std::tolower(letter); });
@@ -71,9 +71,10 @@ std::string parseDays(std::string_view text, const std::string &subject) {
             begin == std::string::npos ? "" : part.substr(begin, end - begin + 1);
         if (!addDays(day, week)) {
             throw Refusal(
-                subject + ": \"" + printable(day) +
-                "\" is no day of the week; accepted: a list such as Mon,Fri or Mon-Fri of "
-                "Sun, Mon, Tue, Wed, Thu, Fri, Sat, and weekdays, weekend, daily");
+                std::string(option) + ": \"" + printable(day) +
+                    "\" is no day of the week; accepted: a list such as Mon,Fri or Mon-Fri of "
+                    "Sun, Mon, Tue, Wed, Thu, Fri, Sat, and weekdays, weekend, daily",
+                option + std::string_view("--").size());
         }
     }
     return week;

@@ -7,8 +7,7 @@
 namespace tavisched {
 
 // Turns "Mon,Fri", "Mon, Fri", "Mon-Fri", "monday", "weekdays", "weekend" or "daily" into seven
-// characters '0' or '1', Sunday first. Throws a Refusal that begins with `subject` for anything
-// else.
-std::string parseDays(std::string_view text, const std::string &subject);
+// characters '0' or '1', Sunday first. Refuses anything else in the name of the option.
+std::string parseDays(std::string_view text, const char *option);
 
 } // namespace tavisched

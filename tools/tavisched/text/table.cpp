@@ -6,7 +6,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <optional>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -21,13 +20,6 @@ bool takesColours() {
     const char *const terminal = std::getenv("TERM");
     return isatty(STDOUT_FILENO) == 1 && (!noColour || *noColour == '\0') && terminal &&
            std::strcmp(terminal, "dumb") != 0;
-}
-
-// Nothing where there is none.
-std::optional<size_t> terminalWidth() {
-    winsize size{};
-    const bool known = ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
-    return known ? std::optional<size_t>(size.ws_col) : std::nullopt;
 }
 
 std::vector<size_t> naturalWidths(const std::vector<Column> &columns,
@@ -113,6 +105,12 @@ void printBare(const Row &row) {
 }
 
 } // namespace
+
+std::optional<size_t> terminalWidth() {
+    winsize size{};
+    const bool known = ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
+    return known ? std::optional<size_t>(size.ws_col) : std::nullopt;
+}
 
 std::string styled(const std::string &text, Style style) {
     static const bool coloured = takesColours();

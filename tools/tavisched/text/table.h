@@ -2,6 +2,7 @@
 // nor padded, two blanks between them.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -12,6 +13,9 @@ enum class Style { Plain, Strong, Faint, Good, Bad, Busy };
 // The text in the style's colour when standard output is a terminal that takes colours and the
 // environment's NO_COLOR is not set.
 std::string styled(const std::string &text, Style style);
+
+// Nothing where there is no terminal.
+std::optional<size_t> terminalWidth();
 
 struct Cell {
     std::string text;

@@ -89,24 +89,6 @@ std::string scheduleInWords(const TAVI_SCHED_TASK &task) {
     return words;
 }
 
-std::string remarkOn(const TAVI_SCHED_TASK &task) {
-    if (task.repeatHour > 0 &&
-        task.runHour + task.repeatHour > std::max(task.runHour, task.lastWorkHour)) {
-        return format("it runs once a day, at %02u:%02u, as %u hours later is after hour %u",
-                      task.runHour, task.runMin, task.repeatHour,
-                      std::max(task.runHour, task.lastWorkHour));
-    }
-    const bool missesMonths = task.type == TAVI_SCHED_TYPE_MONTHLY && task.startDay > 28;
-    const bool missesYears =
-        task.type == TAVI_SCHED_TYPE_YEARLY && task.startMonth == 2 && task.startDay == 29;
-    if (!missesMonths && !missesYears) {
-        return "";
-    }
-    return std::string(missesMonths ? "months" : "years") +
-           " without that day are passed over; the next run may be shown as the day after the end "
-           "of such a month";
-}
-
 std::string stateInWords(const TAVI_SCHED_TASK &task, const Run *run) {
     if (task.type == TAVI_SCHED_TYPE_ONCE && isEnabled(task) && !nextRun(task)) {
         return run && run->began != 0 ? "done" : "past";
@@ -204,6 +186,16 @@ std::string localTime(time_t time) {
     std::array<char, 32> text{};
     std::strftime(text.data(), text.size(), "%Y-%m-%d %H:%M:%S", &local);
     return text.data();
+}
+
+std::string localMinute(time_t time) {
+    return localTime(time).substr(0, std::strlen("YYYY-MM-DD hh:mm"));
+}
+
+std::string weekDayOf(time_t time) {
+    tm local{};
+    localtime_r(&time, &local);
+    return TAVISchedWeekDayNames[local.tm_wday];
 }
 
 std::string ownerName(uint32_t uid) {

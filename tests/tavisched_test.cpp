@@ -399,19 +399,19 @@ TEST_F(CommandLine, ShowsTheCalendar) {
     writeFile("/usr/tavi/etc/auto_power",
               "[power on]\n000=1 127 7 0\n[power off]\n000=1 127 4 0\n");
     done("add --name failing --command 'exit 3' --monthly 1 --disabled");
-    done("add --name early --command x --at 05:30 --every 1 --until 7");
-    done("add --name same --command x --at 07:30 --every 12");
+    done("add --name early --command x --at 05:00 --every 1 --until 8");
+    done("add --name same --command x --at 08:00 --every 12");
     run("run 1 --wait");
     const std::string shown = done("calendar --days 2 --past 0 --hours --all");
-    EXPECT_THAT(shown, testing::ContainsRegex("\n1 failing  .*x.*\n2 early  .*!!o"));
-    EXPECT_THAT(shown, HasSubstr("│   ░!!o"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\n1 failing  .*x.*\n2 early  .*!!!o"));
+    EXPECT_THAT(shown, HasSubstr("│   ░!!!o"));
     EXPECT_THAT(shown, testing::ContainsRegex("\nsame minute  .*[*]\n"));
-    EXPECT_THAT(shown, testing::ContainsRegex("\nSame minute: ... ....-..-.. 07:30, tasks 2 3\n"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\nSame minute: ... ....-..-.. 08:00, tasks 2 3\n"));
     EXPECT_THAT(done("calendar --days 2 --past 0"), testing::ContainsRegex("\nA column is 1 h."));
     EXPECT_THAT(done("calendar --days 90"), testing::ContainsRegex("\n3 same .*22222"));
     const std::string json = done("calendar --json");
-    for (const char *const member : {"\"result\": \"exit 3\"", "T05:30:00", "\"power\": \"off\"",
-                                     "\"schedule\": \"daily 07:30 every 12 h until 23:30\""}) {
+    for (const char *const member : {"\"result\": \"exit 3\"", "T05:00:00", "\"power\": \"off\"",
+                                     "\"schedule\": \"daily 08:00 every 12 h until 23:00\""}) {
         EXPECT_THAT(json, HasSubstr(member));
     }
     EXPECT_THAT(json, testing::ContainsRegex("\"tasks\": *\n? *\\[\n? *2,\n? *3\n"));

@@ -231,9 +231,10 @@ TAVI_SCHED_API int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask);
 /* The moments from `from` until before `until` (seconds since the epoch) at which an enabled task
  * will really be started: those at which cron takes its line and the task is then due, in the
  * process's time zone. Of an hour that daylight saving time skips there is none, of one that it
- * repeats the first. For a power schedule the moments at which the machine goes on or off; what is
- * skipped switches it off at once. Writes the first `cMax` of them, in rising order, and returns
- * how many it wrote, or -1. Nothing is allocated; the time it takes is linear in the days. */
+ * repeats the first. For a power schedule the moments at which the machine goes on or off: of what
+ * is skipped a power-off comes at once, and a power-on as if the clock had not been changed. Writes
+ * the first `cMax` of them, in rising order, and returns how many it wrote, or -1. Nothing is
+ * allocated; the time it takes is linear in the days. */
 TAVI_SCHED_API int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t until,
                                        int64_t *rgStarts, size_t cMax);
 /* The first of them from `from` on: 1 with the moment, 0 when there is none, however long one

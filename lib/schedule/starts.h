@@ -4,7 +4,8 @@
 // in an hour that the end of daylight saving time repeats, the first time; what the beginning of it
 // skips cron catches up at once, and the due test, which looks at the time there is then, lets
 // nothing run that is not due there anyway: a task that is due in the skipped hour's minute and in
-// the one after it is started twice in that one. Power-off lines have no due test.
+// the one after it is started twice in that one. Power-off lines have no due test, and the wake
+// alarm rings as if the clock had not been changed.
 #pragma once
 
 #include "schedule/clock.h"
@@ -40,8 +41,9 @@ void forEachStart(const TAVI_SCHED_TASK &task, int64_t from, int64_t until, Func
                 continue;
             }
             auto moment = clock.at(hour, task.runMin);
-            if (!moment && isPowerOff(task)) {
-                moment = clock.changeAt(hour, task.runMin);
+            if (!moment && isPower(task)) {
+                moment = isPowerOff(task) ? clock.changeAt(hour, task.runMin)
+                                          : clock.asIfUnchanged(hour, task.runMin);
             }
             if (moment && *moment >= from && *moment < until && !function(*moment)) {
                 return;

@@ -110,7 +110,8 @@ class Columns {
         tm local{};
         localtime_r(&time, &local);
         const auto day = std::upper_bound(days_.begin(), days_.end(), time) - days_.begin() - 1;
-        const auto minute = static_cast<size_t>(local.tm_hour * 60 + local.tm_min);
+        const auto minute =
+            static_cast<size_t>(local.tm_hour) * 60 + static_cast<size_t>(local.tm_min);
         return static_cast<size_t>(day) * grid_.perDay() + minute / grid_.minutes;
     }
     // The moment at which a column begins, also the one behind the last.

@@ -595,6 +595,41 @@ TEST_F(CommandLine, ShowsOutputsAndStops) {
     EXPECT_EQ(status_, 1);
 }
 
+TEST_F(CommandLine, MakesUpForMissedTimes) {
+    for (const char *const command : {"echo made up", "true", "echo disabled", "exit 1"}) {
+        done(std::string("add --at 00:00 --command '") + command + "'");
+    }
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+    shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
+    done("disable 3"); // looks for them, as every change does
+    EXPECT_THAT(done("list"), testing::ContainsRegex("1  Task 1 .*  missed "));
+    run("run 2 --wait");
+    done("remove 4 --yes");
+    EXPECT_EQ(done("run --missed --wait"),
+              "task 1 (Task 1): started\nmade up\ntask 1 (Task 1): ok\n");
+    shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+    shell("python3 -c \"import sqlite3; c = sqlite3.connect('/var/lib/tavischeduler/runs.sqlite'); "
+          "c.execute('DELETE FROM runs WHERE result<40 AND task_id=2'); c.commit()\"");
+    EXPECT_EQ(done("run --missed"), "task 2 (Task 2): started\n"); // found by this very command
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+}
+
+TEST_F(CommandLine, DoesWithoutRecords) {
+    done("add --command 'exit 3'");
+    done("add --command 'kill -9 $$'");
+    shell("rm -rf /var/lib/tavischeduler/*; mkdir /var/lib/tavischeduler/runs.sqlite");
+    EXPECT_THAT(run("run 1 2 --wait"), AllOf(HasSubstr("(Task 1): exit 3, and not recorded; "),
+                                             HasSubstr("(Task 2): killed by signal 9, and not")));
+    EXPECT_EQ(status_, 3);
+    EXPECT_THAT(run("list"), AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 2")));
+    EXPECT_EQ(status_, 0);
+    for (const char *const command : {"history", "log 1", "stop 1", "run --missed"}) {
+        EXPECT_THAT(run(command), HasSubstr("; see \"tavisched check\"")) << command;
+        EXPECT_EQ(status_, 1) << command;
+    }
+}
+
 TEST_F(CommandLine, FitsTheTerminal) {
     Task task = newTask();
     TAVISchedCTaskSetName(task.get(), "\033[2J日本日本日本日本日本日本 é name");
@@ -649,7 +684,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"mkdir -m 775 /usr/tavi/g; chgrp bin /usr/tavi/g; cp /usr/tavi/bin/tavischedtask "
          "/usr/tavi/g; ln -sf /usr/tavi/g/tavischedtask /tmp",
          "others than root can replace", true},
-        {"rmdir /tmp/lock", "/tmp/lock is missing", true},
+        {"rm -r /tmp/lock", "/tmp/lock is missing", true},
         {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},
         {"touch /tmp/scheduled_tasks.tmp.999999", "whose process is gone", true},
         {"mount -n -t tmpfs -o size=4k small /usr/tavi/etc; cp -a /run/etc/scheduled_tasks "
@@ -657,7 +692,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "the file system of /usr/tavi/etc has no room left (bytes)", false},
         {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},
         {"chown bin /tmp/lock", "/tmp/lock must belong to root", true},
-        {"rmdir /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
+        {"rm -r /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
         {"chmod 777 /tmp/lock", "/tmp/lock must belong to root", true},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
         {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
@@ -705,11 +740,31 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "task_scheduler/b is skipped: it is not executable", false},
         {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler", "all plug-in handlers are skipped",
          false},
+        {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler_run", "task_scheduler_run must", false},
+        {"chmod 711 /var/lib/tavischeduler", "/var/lib/tavischeduler, where runs", true},
+        {"chown bin /var/lib/tavischeduler/runs.sqlite", "runs.sqlite, where runs", true},
+        {"rm -r /var/lib/tavischeduler/output; touch /var/lib/tavischeduler/output", "is no folder",
+         false},
+        {"rm /var/lib/tavischeduler/runs.sqlite-*; echo no database > "
+         "/var/lib/tavischeduler/runs.sqlite",
+         "/var/lib/tavischeduler/runs.sqlite are damaged", true},
+        {"python3 -c \"import sqlite3; c = sqlite3.connect('/var/lib/tavischeduler/runs.sqlite'); "
+         "c.execute('PRAGMA wal_checkpoint(truncate)')\"; "
+         "head -c 4096 /dev/zero | dd of=/var/lib/tavischeduler/runs.sqlite bs=4096 seek=1 "
+         "conv=notrunc 2>/dev/null",
+         "runs.sqlite are damaged", true},
+        {"rm -r /var/lib/tavischeduler/*; mkdir /var/lib/tavischeduler/runs.sqlite",
+         "/var/lib/tavischeduler/runs.sqlite cannot be read", false},
+        {"printf '[limits]\nruns=0\n' > /usr/tavi/etc/run_records", "runs is no number above 0: 0",
+         false},
+        {"printf '[limits]\nruns_per_tasks=9\n' > /usr/tavi/etc/run_records",
+         "no limit of the name runs_per_tasks", false},
     };
     for (const auto &c : kCases) {
         SetUp();
         done("add --command x");
         done("add --power off --at 23:00");
+        run("run 1 --wait");
         ASSERT_THAT(done("check"), HasSubstr("All is well."));
         shell("rm -rf /run/etc; cp -a /usr/tavi/etc /run");
         shell(c.harm);

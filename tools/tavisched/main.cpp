@@ -107,8 +107,9 @@ struct Settings {
     HistoryOptions history;
     std::string run;
     int after = 10;
-    bool json = false, web = false, dryRun = false, quiet = false, yes = false, wait = false,
-         repair = false, follow = false;
+    RunOptions running;
+    bool json = false, web = false, dryRun = false, quiet = false, yes = false, repair = false,
+         follow = false;
 };
 
 void addListCommand(CLI::App &app, Settings &given, Command &command) {
@@ -216,12 +217,14 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
 }
 
 void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
-    auto *const running =
-        subcommand(app, command, "run", "run tasks now, in the background",
-                   "tavisched run 3 --wait", [&] { return run(parseIds(given.ids), given.wait); });
-    idsOption(running, given.ids, true);
-    running->add_flag("--wait", given.wait,
+    auto *const running = subcommand(app, command, "run", "run tasks now, in the background",
+                                     "tavisched run 3 --wait",
+                                     [&] { return run(parseIds(given.ids), given.running); });
+    idsOption(running, given.ids, false);
+    running->add_flag("--wait", given.running.wait,
                       "wait for the end, show the output and exit as the command");
+    running->add_flag("--missed", given.running.missed,
+                      "those that missed their last time, each once");
 
     auto *const stopping =
         subcommand(app, command, "stop", "end running tasks", "tavisched stop 3 --after 60",

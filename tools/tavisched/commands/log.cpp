@@ -5,7 +5,6 @@
 #include "tasks/tasks.h"
 #include "text/words.h"
 
-#include <algorithm>
 #include <cstdio>
 
 namespace tavisched {
@@ -22,10 +21,9 @@ Run runToShow(int32_t id, std::optional<int64_t> number) {
         }
         return *run;
     }
-    const std::vector<Run> runs = readRuns(runsOf(id));
-    const auto run = std::find_if(runs.begin(), runs.end(),
-                                  [](const Run &one) { return one.began != 0 || goesOn(one); });
-    if (run == runs.end()) {
+    const auto run =
+        findNewest(runsOf(id), [](const Run &one) { return one.began != 0 || goesOn(one); });
+    if (!run) {
         throw Failure(called(*readTask(id)) + " has no run on record that printed anything");
     }
     return *run;

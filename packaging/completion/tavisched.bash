@@ -48,7 +48,7 @@ _tavisched() {
             ;;
         export) options='--web' ;;
         remove) options='--yes' ;;
-        run) options='--wait' ;;
+        run) options='--wait --missed' ;;
         stop) options='--after' ;;
         check) options='--repair' ;;
         import)

@@ -580,7 +580,7 @@ TEST_F(CommandLine, ShowsOutputsAndStops) {
         "timeout --preserve-status -s INT 2 /usr/tavi/bin/tavisched run 2 --wait > /tmp/wait 2>&1; "
         "echo $? >> /tmp/wait");
     EXPECT_THAT(readFile("/tmp/wait"), HasSubstr("goes on (\"tavisched stop\" ends it)\n130\n"));
-    done("run 2");
+    EXPECT_THAT(done("run 2"), HasSubstr("(Task 2): waiting for task 2 since 2"));
     EXPECT_TRUE(waitFor("/usr/tavi/bin/tavisched list | grep '^ *2 .*waiting for task 2 since'"));
     shell("(/usr/tavi/bin/tavisched log 2 --run 2 --follow > /tmp/followed; touch /tmp/over) &");
     EXPECT_THAT(done("stop 2 --after 1"), HasSubstr("(Task 2), run 2: asked to end; what"));

@@ -28,7 +28,7 @@ constexpr int kSignalBase = 128;
 // Milliseconds; a run that cannot be recorded is asked after less and less.
 constexpr int kFirstPause = 20;
 constexpr int kLongestPause = 1000;
-constexpr int64_t kPatience = 5000;
+constexpr int64_t kPatience = 2000;
 
 // A task that was started; the descriptor ends with the run.
 struct Started {
@@ -117,25 +117,44 @@ std::optional<Run> statusOf(const Started &started) {
     return search.found;
 }
 
-// Records that cannot be read keep nobody from waiting for the end.
-template <typename Read> void readRecords(Read &&read, bool warns) {
+// Records that cannot be read keep nobody from waiting for the end. False, with a warning, when
+// they cannot.
+template <typename Read> bool readRecords(Read &&read) {
     try {
         read();
+        return true;
     } catch (const Failure &failure) {
-        if (warns) {
-            std::cerr << "tavisched: warning: " << failure.what() << "\n";
-        }
+        std::cerr << "tavisched: warning: " << failure.what() << "\n";
+        return false;
     }
 }
 
+// Says of each run that it has started, or what it waits for or why it did not start, which is on
+// record then: who asks for missed ones again finds that they were made up for. Whether records can
+// be read.
+bool tellOfStarts(const std::vector<Started> &runs) {
+    const int64_t until = now() + kPatience;
+    bool hasRecords = true;
+    for (const Started &started : runs) {
+        std::optional<Run> run;
+        hasRecords = hasRecords && readRecords([&] { run = awaitRecord(started, until - now()); });
+        std::printf("%s: %s\n", called(*started.task).c_str(),
+                    run && run->began == 0 ? resultInWords(*run).c_str() : "started");
+    }
+    std::fflush(stdout);
+    return hasRecords;
+}
+
 // Shows what it prints until its end.
-void follow(const Started &started) {
+void follow(const Started &started, bool hasRecords) {
     const auto show = [&] {
         if (const auto run = awaitRecord(started, INT32_MAX)) {
             printOutput(run->run, true);
         }
     };
-    readRecords(show, true);
+    if (hasRecords) {
+        readRecords(show);
+    }
     while (!ends(started, -1)) {
     }
     close(started.end);
@@ -144,7 +163,10 @@ void follow(const Started &started) {
 // The run's exit status, when it has ended. One whose end could not be recorded seems interrupted.
 int reportEnd(const Started &started) {
     std::optional<Run> run;
-    readRecords([&] { run = recordOf(started); }, false);
+    try {
+        run = recordOf(started);
+    } catch (const Failure &) { // that has been told
+    }
     const bool isRecorded = run && run->result != TAVI_SCHED_RUN_INTERRUPTED;
     const auto status = isRecorded ? std::nullopt : statusOf(started);
     run = status ? status : run;
@@ -201,28 +223,21 @@ std::vector<Task> readMissed() {
     return missed;
 }
 
-int runAll(const std::vector<Task> &tasks, const RunOptions &options) {
+int runAll(const std::vector<Task> &tasks, bool wait) {
     std::vector<Started> runs;
-    if (options.wait) {
+    if (wait) {
         tellWhenInterrupted();
     }
     std::transform(tasks.begin(), tasks.end(), std::back_inserter(runs),
                    [](const Task &task) { return start(*task); });
-    // A reader that goes away keeps none from being started.
-    for (const Started &started : runs) {
-        std::printf("%s: started\n", called(*started.task).c_str());
-    }
-    std::fflush(stdout);
+    // A reader that goes away has kept none from being started.
+    const bool hasRecords = tellOfStarts(runs);
     tellNoMoreOfWaiting();
     int status = 0;
-    for (const Started &started : runs) {
-        if (options.wait) {
-            follow(started);
-            const int result = reportEnd(started);
-            status = status == 0 ? result : status;
-        } else if (options.missed) { // who asks again finds it made up for
-            awaitRecord(started, kPatience);
-        }
+    for (const Started &started : wait ? runs : std::vector<Started>()) {
+        follow(started, hasRecords);
+        const int result = reportEnd(started);
+        status = status == 0 ? result : status;
     }
     return status;
 }
@@ -238,7 +253,7 @@ int run(const Ids &ids, const RunOptions &options) {
     if (tasks.empty()) {
         std::printf("No task has missed its last time.\n");
     }
-    return runAll(tasks, options);
+    return runAll(tasks, options.wait);
 }
 
 } // namespace tavisched

@@ -607,6 +607,7 @@ TEST_F(CommandLine, MakesUpForMissedTimes) {
     done("remove 4 --yes");
     EXPECT_EQ(done("run --missed --wait"),
               "task 1 (Task 1): started\nmade up\ntask 1 (Task 1): ok\n");
+    EXPECT_THAT(done("history"), testing::ContainsRegex("4  Task 4 .removed.  2.* missed\n"));
     shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
     EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
     shell("python3 -c \"import sqlite3; c = sqlite3.connect('/var/lib/tavischeduler/runs.sqlite'); "

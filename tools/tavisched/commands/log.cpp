@@ -3,6 +3,7 @@
 #include "failure.h"
 #include "tasks/runs.h"
 #include "tasks/tasks.h"
+#include "text/utf8.h"
 #include "text/words.h"
 
 #include <cstdio>
@@ -18,6 +19,10 @@ Run runToShow(int32_t id, std::optional<int64_t> number) {
         if (!run || run->taskId != id) {
             throw Refusal("task " + std::to_string(id) + " has no run " + std::to_string(*number) +
                           "; \"tavisched history " + std::to_string(id) + "\" lists its runs");
+        }
+        if (run->isOfRemovedTask == 1) {
+            std::fprintf(stderr, "tavisched: run %lld is of a removed task, %s\n",
+                         static_cast<long long>(run->run), printable(run->name).c_str());
         }
         return *run;
     }

@@ -29,9 +29,10 @@ const std::vector<Column> kColumns{{"RUN", true},
 
 Row rowOf(const Run &run) {
     const bool ended = run.ended != 0;
+    const std::string name = run.name[0] != '\0' ? printable(run.name) : "-";
     return {{std::to_string(run.run)},
             {std::to_string(run.taskId)},
-            {run.name[0] != '\0' ? printable(run.name) : "-"},
+            {run.isOfRemovedTask == 1 ? name + " (removed)" : name},
             {localTime(startOf(run))},
             {ended ? localTime(seconds(run.ended)) : "-"},
             {ended && run.began != 0 ? durationInWords(seconds(run.duration)) : "-"},

@@ -85,6 +85,7 @@ bool leaveOneOut(const std::vector<Column> &columns, Fitting &shown) {
 template <typename Value>
 std::vector<Value> picked(const std::vector<Value> &all, const std::vector<size_t> &places) {
     std::vector<Value> some;
+    some.reserve(places.size());
     for (const size_t place : places) {
         some.push_back(all[place]);
     }

@@ -32,6 +32,19 @@ void bench::writeFile(const char *path, const std::string &text) {
     require(file.good(), path);
 }
 
+double bench::privateKilobytes(int pid) {
+    std::ifstream map("/proc/" + std::to_string(pid) + "/smaps_rollup");
+    double kilobytes = 0;
+    for (std::string key; map >> key;) {
+        double value = 0;
+        if ((key == "Private_Clean:" || key == "Private_Dirty:") && map >> value) {
+            kilobytes += value;
+        }
+    }
+    require(kilobytes > 0, "smaps_rollup");
+    return kilobytes;
+}
+
 namespace {
 
 // The section that the library itself writes for a task with id 1.

@@ -22,6 +22,9 @@ void require(bool condition, const char *what);
 std::string readFile(const char *path);
 void writeFile(const char *path, const std::string &text);
 
+// Of the process, as the kernel counts it.
+double privateKilobytes(int pid);
+
 // Stores this many tasks with the ids from 1 upward, all daily at midnight, in the persistent file
 // and the working copy.
 void storeTasks(int count, const char *command = kCommand);

@@ -3,7 +3,9 @@
 // before the next start.
 #include "bench_support.h"
 
+#include <algorithm>
 #include <array>
+#include <cstdlib>
 #include <fcntl.h>
 #include <grp.h>
 #include <sqlite3.h>
@@ -21,6 +23,8 @@ constexpr const char *kCommand = "echo > /tmp/bench_fifo";
 constexpr const char *kStatus = "/tmp/sched_status.sqlite";
 constexpr const char *kReferenceStatus = "/tmp/bench_status.sqlite";
 constexpr const char *kReferenceLock = "/tmp/bench_lock";
+constexpr const char *kRunNumber = "/var/lib/tavischeduler/run_number";
+constexpr const char *kNumberAside = "/var/lib/tavischeduler/bench_number";
 constexpr int kManyTasks = 1000;
 constexpr int kDueTask = 500;
 
@@ -123,6 +127,41 @@ void run(benchmark::State &state) {
 
 BENCHMARK(run)->Iterations(100);
 
+// The same run without a record and without a pipe for its output, as it can have no number: a link
+// stands in the place of the file.
+void setRecording(bool isOn) {
+    const bool isSet =
+        isOn ? rename(kNumberAside, kRunNumber) == 0
+             : rename(kRunNumber, kNumberAside) == 0 && symlink("nowhere", kRunNumber) == 0;
+    bench::require(isSet, "rename");
+}
+
+void recordedRun(benchmark::State &state) {
+    bench::storeTasks(1, kCommand);
+    bench::makeWorkingCopyNew();
+    makeStatusDatabases();
+    const int fifo = prepare();
+    const auto startAndAwait = [&] {
+        bench::require(TAVISchedTaskRun(1, 0, 0) == 0, "TAVISchedTaskRun");
+        awaitByte(fifo);
+    };
+    startAndAwait(); // makes the records
+    waitForAll();
+    bench::Comparison comparison;
+    for (auto _ : state) {
+        comparison.product(startAndAwait);
+        waitForAll();
+        setRecording(false);
+        comparison.reference(startAndAwait);
+        waitForAll();
+        setRecording(true);
+    }
+    close(fifo);
+    comparison.reportTo(state, "recorded run until the command starts, to one unrecorded", 1.3);
+}
+
+BENCHMARK(recordedRun)->Iterations(100);
+
 // ---- From the start of the runner's process ----
 
 // Makes one of the tasks due in this minute, with enough of it left, unless it is already.
@@ -223,6 +262,37 @@ void runner(benchmark::State &state, void (*part)(), const char *what, double ai
     }
     comparison.reportTo(state, what, aim);
 }
+
+// ---- While the command runs ----
+
+// Of the process that waits for a command, which has printed and has been recorded.
+void memoryOfWaiting(benchmark::State &state) {
+    constexpr const char *kHold = "/tmp/bench_hold";
+    constexpr double kAim = 2048; // KiB
+    bench::storeTasks(kManyTasks,
+                      "head -c 1000000 /dev/zero; echo $PPID > /tmp/bench_fifo; read x < "
+                      "/tmp/bench_hold");
+    makeStatusDatabases();
+    const int fifo = prepare();
+    mkfifo(kHold, 0600);
+    TAVI_SCHED_DATE due{};
+    double most = 0;
+    for (auto _ : state) {
+        makeDue(due);
+        startRunner("--run");
+        std::array<char, 32> pid{};
+        bench::require(read(fifo, pid.data(), pid.size() - 1) > 1, "reading the FIFO");
+        usleep(500000); // its record is written while the command goes on
+        most = std::max(most, bench::privateKilobytes(std::atoi(pid.data())));
+        const int hold = open(kHold, O_WRONLY | O_CLOEXEC);
+        close(hold);
+        waitForAll();
+    }
+    close(fifo);
+    bench::report(state, "private memory of a waiting run, in 2 MiB", most / kAim, 1);
+}
+
+BENCHMARK(memoryOfWaiting)->Iterations(3);
 
 BENCHMARK_CAPTURE(runner, whole, wholeRunner, "runner's process until the command starts, to sh -c",
                   2.9)

@@ -1,5 +1,6 @@
 // Showing what runs did, and stopping one.
 #include "base/child.h"
+#include "runs/run_changes.h"
 #include "runs/run_output.h"
 #include "runs/run_records.h"
 #include "runs/stop_request.h"
@@ -14,6 +15,7 @@
 #include <ctime>
 #include <poll.h>
 #include <sys/inotify.h>
+#include <unistd.h>
 
 namespace {
 
@@ -100,6 +102,15 @@ int TAVISchedRunList(const TAVI_SCHED_RUN_FILTER *pFilter, TAVI_SCHED_RUN_READER
         .taskId = -1, .failedOnly = 0, .newestOnly = 0, .limit = 0, .since = 0};
     return sched::guarded(SCHED_SITE,
                           [&] { return list(pFilter ? *pFilter : all, reader, pContext); });
+}
+
+int TAVISchedMissedRunsFind() {
+    SCHED_REQUIRE(geteuid() == 0, "0 == geteuid()", -1);
+    if (sched::findMissedRuns() != 0) {
+        SCHED_SET_ERROR(sched::kReadWriteFailed);
+        return -1;
+    }
+    return 0;
 }
 
 int TAVISchedRunGet(int64_t run, TAVI_SCHED_RUN *pRun) {

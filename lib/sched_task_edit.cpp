@@ -3,6 +3,7 @@
 #include "runs/run_changes.h"
 #include "sched_backend.h"
 #include "sched_error.h"
+#include "sched_handle.h"
 #include "sched_hook.h"
 #include "tavischeduler.h"
 
@@ -14,6 +15,15 @@ int editBetweenHooks(sched::ChangeHook &hook, TAVI_SCHED_TASK *task) {
         return -1;
     }
     return sched::dispatch(SCHED_SITE, "edit", task, &TAVI_SCHED_BACKEND_RECORD::edit).value_or(-1);
+}
+
+// A power schedule's id follows from its content: the old one is free then, or another's.
+void leaveOldId(int32_t id, int32_t backend) {
+    const auto row = sched::findBackend(backend, &TAVI_SCHED_BACKEND_RECORD::get_by_id);
+    auto present = sched::allocateTask();
+    if (row && present && SchedBackends[*row].get_by_id(id, present.get()) == 0) {
+        sched::separateFromRemovedTask(id);
+    }
 }
 
 } // namespace
@@ -31,6 +41,10 @@ int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
     }
     sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
     const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;
+    if (result == 0 && oldTask.backend == TAVI_SCHED_BACKEND_AUTOPOWER) {
+        sched::whenStored(
+            [id = oldTask.id, backend = oldTask.backend] { leaveOldId(id, backend); });
+    }
     if (sched::isBatchOpen()) {
         sched::deferHook(hook, result);
     } else {

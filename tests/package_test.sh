@@ -102,8 +102,8 @@ lib=/usr/lib/$(cc -print-multiarch)
 expect_files tavischeduler /usr/sbin/tavisched{,task} "$lib"/lib{tavischeduler.so.4,taviplatform.so.1} \
     /usr/lib/tmpfiles.d/tavischeduler.conf $unit /usr/share/man/man8/tavisched{,task}.8.gz \
     /usr/share/{bash-completion/completions/tavisched,zsh/vendor-completions/_tavisched} \
-    /usr/share/fish/vendor_completions.d/tavisched.fish /usr/tavi/etc/plugins/task_scheduler \
-    $check /usr/share/tavischeduler/${check##*/} /usr/share/doc/tavischeduler/{copyright,{changelog.Debian,README.md}.gz}
+    /usr/share/fish/vendor_completions.d/tavisched.fish /usr/tavi/etc/plugins/task_scheduler{,_run} \
+    $check /usr/share/tavischeduler/{${check##*/},run-handlers/{mail-failures,post-to-url,prometheus-metrics}} /usr/share/doc/tavischeduler/{copyright,{changelog.Debian,README.md}.gz}
 expect_files tavischeduler-dev /usr/include/{tavischeduler,tavischedgetter,tavischedsetter}.h \
     /usr/include/{platc,platplugin,tavisdk}.h "$lib"/lib{tavischeduler,taviplatform}.so \
     "$lib"/{pkgconfig/tavischeduler.pc,cmake/tavischeduler/tavischeduler-config.cmake} \
@@ -219,4 +219,5 @@ step "purge"
 manage --purge tavischeduler{-cockpit,-dev,}
 expect_own_crontab purge
 expect "purge left or took files" diff $own/files <(files)
+expect "purge left records" [ ! -e /var/lib/tavischeduler ]
 step "passed"

@@ -118,6 +118,17 @@ std::string query(const std::string &sql) {
     return result;
 }
 
+void recorded(const std::string &sql, const char *untilKilled) {
+    sqlite3 *database = nullptr;
+    ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
+    EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK) << sql;
+    while (untilKilled) {
+        writeFile(untilKilled, "");
+        ::pause();
+    }
+    sqlite3_close(database);
+}
+
 int shell(const std::string &command) {
     const int status = std::system(command.c_str());
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;

@@ -2,7 +2,6 @@
 #include "support.h"
 
 #include <csignal>
-#include <sqlite3.h>
 #include <sys/prctl.h>
 
 namespace {
@@ -207,8 +206,10 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
                       HasSubstr("echo a\n               b\n")));
     // A power schedule's id follows from what it says; one that cannot be armed is not kept.
     done("add --power off --at 23:00 --weekly Mon");
+    done("run 90022300 --wait");
     EXPECT_THAT(done("edit 90022300 --at 23:30"),
                 HasSubstr("task 90022330 (PowerOff task 0), was 90022300: Mon 23:30, next run 2"));
+    EXPECT_THAT(run("history 90022300"), HasSubstr("there is no task")); // nor are there its runs
     EXPECT_THAT(done("disable 90022330"), HasSubstr("task 80022330 (PowerOff task 0), was 9002"));
     EXPECT_THAT(done("remove 80022330 --yes"), HasSubstr("removed"));
     const std::string before = machine();
@@ -631,10 +632,7 @@ TEST_F(CommandLine, TellsHowRunsEnded) {
     row(5, 50 * 3600, 6, 9);
     row(6, 5, 37, 0);
     row(7, 5, 3, 0);
-    sqlite3 *database = nullptr;
-    ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
-    EXPECT_EQ(sqlite3_exec(database, rows.c_str(), nullptr, nullptr, nullptr), SQLITE_OK);
-    sqlite3_close(database);
+    recorded(rows);
     shell("useradd ghost 2>/dev/null; echo ghost:x:4242:4242::/:/bin/sh >> /etc/passwd");
     done("add --command x --owner ghost");
     shell("sed -i /^ghost:/d /etc/passwd");
@@ -683,7 +681,7 @@ TEST_F(CommandLine, ShowsOutputsAndStops) {
         "timeout --preserve-status -s INT 2 /usr/tavi/bin/tavisched run 2 --wait > /tmp/wait 2>&1; "
         "echo $? >> /tmp/wait");
     EXPECT_THAT(readFile("/tmp/wait"), HasSubstr("goes on (\"tavisched stop\" ends it)\n130\n"));
-    done("run 2");
+    EXPECT_THAT(done("run 2"), HasSubstr("(Task 2): waiting for task 2 since 2"));
     EXPECT_TRUE(waitFor("/usr/tavi/bin/tavisched list | grep '^ *2 .*waiting for task 2 since'"));
     shell("(/usr/tavi/bin/tavisched log 2 --run 2 --follow > /tmp/followed; touch /tmp/over) &");
     EXPECT_THAT(done("stop 2 --after 1"), HasSubstr("(Task 2), run 2: asked to end; what"));
@@ -696,6 +694,42 @@ TEST_F(CommandLine, ShowsOutputsAndStops) {
     shell("rm /var/lib/tavischeduler/*/*");
     EXPECT_THAT(run("log 2 --run 2"), HasSubstr("the output of run 2 is no longer kept"));
     EXPECT_EQ(status_, 1);
+}
+
+TEST_F(CommandLine, MakesUpForMissedTimes) {
+    for (const char *const command : {"echo made up", "true", "echo disabled", "exit 1"}) {
+        done(std::string("add --at 00:00 --command '") + command + "'");
+    }
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+    shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
+    done("disable 3"); // looks for them, as every change does
+    EXPECT_THAT(done("list"), testing::ContainsRegex("1  Task 1 .*  missed "));
+    run("run 2 --wait");
+    done("remove 4 --yes");
+    EXPECT_EQ(done("run --missed --wait"),
+              "task 1 (Task 1): started\nmade up\ntask 1 (Task 1): ok\n");
+    EXPECT_THAT(done("history"), testing::ContainsRegex("4  Task 4 .removed.  2.* missed\n"));
+    shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+    recorded("DELETE FROM runs WHERE result<40 AND task_id=2");
+    EXPECT_EQ(done("run --missed"), "task 2 (Task 2): started\n"); // found by this very command
+    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
+}
+
+TEST_F(CommandLine, DoesWithoutRecords) {
+    done("add --command 'exit 3'");
+    done("add --command 'kill -9 $$'");
+    shell("rm -rf /var/lib/tavischeduler/*; mkdir /var/lib/tavischeduler/runs.sqlite");
+    EXPECT_THAT(run("run 1 2 --wait"), AllOf(HasSubstr("(Task 1): exit 3, and not recorded; "),
+                                             HasSubstr("(Task 2): killed by signal 9, and not")));
+    EXPECT_EQ(status_, 3);
+    EXPECT_THAT(run("list"), AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 2")));
+    EXPECT_EQ(status_, 0);
+    EXPECT_THAT(run("check"), HasSubstr("runs.sqlite is no file"));
+    for (const char *const command : {"history", "log 1", "stop 1", "run --missed"}) {
+        EXPECT_THAT(run(command), HasSubstr("; see \"tavisched check\"")) << command;
+        EXPECT_EQ(status_, 1) << command;
+    }
 }
 
 TEST_F(CommandLine, FitsTheTerminal) {
@@ -759,7 +793,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"mkdir -m 775 /usr/tavi/g; chgrp bin /usr/tavi/g; cp /usr/tavi/bin/tavischedtask "
          "/usr/tavi/g; ln -sf /usr/tavi/g/tavischedtask /tmp",
          "others than root can replace", true},
-        {"rmdir /tmp/lock", "/tmp/lock is missing", true},
+        {"rm -r /tmp/lock", "/tmp/lock is missing", true},
         {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},
         {"touch /tmp/scheduled_tasks.tmp.999999", "whose process is gone", true},
         {"mount -n -t tmpfs -o size=4k small /usr/tavi/etc; cp -a /run/etc/scheduled_tasks "
@@ -767,7 +801,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "the file system of /usr/tavi/etc has no room left (bytes)", false},
         {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},
         {"chown bin /tmp/lock", "/tmp/lock must belong to root", true},
-        {"rmdir /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
+        {"rm -r /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
         {"chmod 777 /tmp/lock", "/tmp/lock must belong to root", true},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
         {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
@@ -815,11 +849,27 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "task_scheduler/b is skipped: it is not executable", false},
         {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler", "all plug-in handlers are skipped",
          false},
+        {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler_run", "task_scheduler_run must", false},
+        {"chmod 711 /var/lib/tavischeduler", "/var/lib/tavischeduler, where runs", true},
+        {"chown bin /var/lib/tavischeduler/runs.sqlite", "runs.sqlite, where runs", true},
+        {"rm -r /var/lib/tavischeduler/output; touch /var/lib/tavischeduler/output", "is no folder",
+         false},
+        {"rm /var/lib/tavischeduler/runs.sqlite-*; echo no database > "
+         "/var/lib/tavischeduler/runs.sqlite",
+         "/var/lib/tavischeduler/runs.sqlite are damaged", true},
+        {"python3 -c \"import sqlite3; c = sqlite3.connect('/var/lib/tavischeduler/runs.sqlite'); "
+         "c.execute('PRAGMA wal_checkpoint(truncate)')\"; "
+         "head -c 4096 /dev/zero | dd of=/var/lib/tavischeduler/runs.sqlite bs=4096 seek=1 "
+         "conv=notrunc 2>/dev/null",
+         "runs.sqlite are damaged", true},
+        {"printf '[limits]\nruns_per_tasks=9\n' > /usr/tavi/etc/run_records",
+         "no limit of the name runs_per_tasks", false},
     };
     for (const auto &c : kCases) {
         SetUp();
         done("add --command x");
         done("add --power off --at 23:00");
+        run("run 1 --wait");
         ASSERT_THAT(done("check"), HasSubstr("All is well."));
         shell("rm -rf /run/etc; cp -a /usr/tavi/etc /run");
         shell(c.harm);

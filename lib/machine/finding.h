@@ -58,6 +58,8 @@ void inspectPower(Inspection &inspection);
 
 // inspect_runs.cpp
 void inspectStatusDatabase(Inspection &inspection);
+void inspectRecordFiles(Inspection &inspection);
+void inspectRecords(Inspection &inspection);
 void inspectPlugins(Inspection &inspection);
 
 } // namespace sched

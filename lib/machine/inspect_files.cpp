@@ -78,12 +78,18 @@ bool makeLockFolder() {
 }
 
 // A change and a run need another copy of the largest file that they write there.
-void inspectRoomIn(const char *folder, const char *file, Inspection &inspection) {
+struct Room {
+    const char *folder;
+    const char *file;
+    const char *consequence;
+};
+
+void inspectRoomIn(const Room &room, Inspection &inspection) {
     constexpr uintmax_t kMore = 4096; // bytes
     struct statvfs status {};
     std::error_code error;
-    const uintmax_t size = fs::file_size(file, error);
-    if (statvfs(folder, &status) != 0) {
+    const uintmax_t size = fs::file_size(room.file, error);
+    if (statvfs(room.folder, &status) != 0) {
         return;
     }
     const bool lacksBytes = status.f_bavail * status.f_frsize < kMore + (error ? 0 : size);
@@ -92,23 +98,25 @@ void inspectRoomIn(const char *folder, const char *file, Inspection &inspection)
         return;
     }
     inspection.hasRoom = false;
-    inspection.add(std::string("the file system of ") + folder + " has no room left (" +
-                       (lacksBytes ? "bytes" : "inodes") +
-                       "), so that no task can be changed or run",
+    inspection.add(std::string("the file system of ") + room.folder + " has no room left (" +
+                       (lacksBytes ? "bytes" : "inodes") + "), so that " + room.consequence,
                    std::string("make room; ") + (lacksBytes ? "du -x " : "du -x --inodes ") +
-                       folder + " shows what takes it");
+                       room.folder + " shows what takes it");
 }
 
 } // namespace
 
 void inspectRoom(Inspection &inspection) {
-    constexpr std::array<std::array<const char *, 2>, 3> kFolders = {
-        {{"/tmp", kWorkingCopy}, {kTaskFolder, kPersistent}, {"/etc", kCrontab}}};
+    constexpr const char *kNoTask = "no task can be changed or run";
+    constexpr std::array<Room, 4> kRooms = {{{"/tmp", kWorkingCopy, kNoTask},
+                                             {kTaskFolder, kPersistent, kNoTask},
+                                             {"/etc", kCrontab, kNoTask},
+                                             {kRecordFolder, kRunNumber, "runs are not recorded"}}};
     std::set<dev_t> seen;
-    for (const auto &[folder, file] : kFolders) {
+    for (const Room &room : kRooms) {
         struct stat status {};
-        if (stat(folder, &status) == 0 && seen.insert(status.st_dev).second) {
-            inspectRoomIn(folder, file, inspection);
+        if (stat(room.folder, &status) == 0 && seen.insert(status.st_dev).second) {
+            inspectRoomIn(room, inspection);
         }
     }
 }

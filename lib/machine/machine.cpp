@@ -40,6 +40,8 @@ constexpr Row kRows[] = {{"room", sched::inspectRoom},
                          {"power", sched::inspectPower},
                          {"lines", sched::inspectLines},
                          {"status database", sched::inspectStatusDatabase},
+                         {"record files", sched::inspectRecordFiles},
+                         {"records", sched::inspectRecords},
                          {"plug-ins", sched::inspectPlugins}};
 
 struct Named {

@@ -2,6 +2,7 @@
 #include "limits.h"
 #include "platc.h"
 #include "sched_error.h"
+#include "sched_guard.h"
 #include "sched_handle.h"
 #include "sched_paths.h"
 
@@ -10,39 +11,67 @@
 
 namespace {
 
+using Faults = std::vector<std::string>;
+
 constexpr TAVI_SCHED_RUN_LIMITS kDefaults{.runsPerTask = 50, .runs = 10000};
 
-void readLimit(PLATCSZHASH *section, const char *key, int32_t &limit) {
-    const char *const value = PLATCSzHashGetValue(section, key);
-    if (!value) {
-        return;
-    }
-    const std::string_view text(value);
+void readLimit(std::string_view key, std::string_view value, int32_t &limit, Faults &faults) {
     int32_t number = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (error != std::errc() || end != text.data() + text.size() || number <= 0) {
-        SCHED_LOG("%s: %s is no number above 0: %s", sched::kRunLimits, key,
-                  sched::LogText(value).c_str());
+    const auto [end, error] = std::from_chars(value.data(), value.data() + value.size(), number);
+    if (error != std::errc() || end != value.data() + value.size() || number <= 0) {
+        faults.push_back(std::string(key) + " is no number above 0: " + std::string(value));
         return;
     }
     limit = number;
 }
 
-} // namespace
-
-TAVI_SCHED_RUN_LIMITS sched::readRunLimits() {
+TAVI_SCHED_RUN_LIMITS read(Faults &faults) {
     TAVI_SCHED_RUN_LIMITS limits = kDefaults;
-    Hash section(8);
-    if (section && PLATCFileExist(kRunLimits) == 1 &&
-        PLATCFileGetSection(kRunLimits, "limits", section.address()) == 1) {
-        readLimit(section.get(), "runs_per_task", limits.runsPerTask);
-        readLimit(section.get(), "runs", limits.runs);
+    sched::Hash section(8);
+    sched::List keys(8);
+    if (!section || !keys || PLATCFileExist(sched::kRunLimits) != 1) {
+        return limits;
+    }
+    if (PLATCFileGetSection(sched::kRunLimits, "limits", section.address()) != 1) {
+        faults.emplace_back("there is no section [limits]");
+        return limits;
+    }
+    const int count = PLATCSzHashEnumKey(section.get(), keys.address());
+    for (int i = 0; i < count; ++i) {
+        const std::string_view key = PLATCSzListGet(keys.get(), i);
+        const char *const value = PLATCSzHashGetValue(section.get(), key.data());
+        if (key == "runs_per_task") {
+            readLimit(key, value, limits.runsPerTask, faults);
+        } else if (key == "runs") {
+            readLimit(key, value, limits.runs, faults);
+        } else {
+            faults.push_back("there is no limit of the name " + std::string(key));
+        }
     }
     return limits;
 }
 
+} // namespace
+
+TAVI_SCHED_RUN_LIMITS sched::readRunLimits() {
+    Faults faults;
+    const TAVI_SCHED_RUN_LIMITS limits = read(faults);
+    for (const std::string &fault : faults) {
+        SCHED_LOG("%s: %s", kRunLimits, LogText(fault.c_str()).c_str());
+    }
+    return limits;
+}
+
+std::vector<std::string> sched::faultsOfRunLimits() {
+    Faults faults;
+    read(faults);
+    return faults;
+}
+
 int TAVISchedRunLimitsGet(TAVI_SCHED_RUN_LIMITS *pLimits) {
     SCHED_REQUIRE(pLimits, "((void *)0) != pLimits", -1);
-    *pLimits = sched::readRunLimits();
-    return 0;
+    return sched::guarded(SCHED_SITE, [&] {
+        *pLimits = sched::readRunLimits();
+        return 0;
+    });
 }

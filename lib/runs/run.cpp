@@ -141,17 +141,25 @@ void sched::Run::store(bool isLast) {
     }
 }
 
-void sched::Run::waitFor(int32_t taskId, unsigned int seconds) {
+// A pause may end early, and the attempts between pauses take time too: what counts is the clock.
+void sched::Run::countWaiting() {
+    if (waitingFrom_ != 0) {
+        record_.waited = static_cast<int32_t>((steadyClock() - waitingFrom_ + 500) / 1000);
+    }
+}
+
+void sched::Run::waitFor(int32_t taskId, unsigned int) {
     const bool isFirst = record_.waitingSince == 0;
     if (isFirst) {
         record_.waitingSince = wallClock();
+        waitingFrom_ = steadyClock();
     }
+    countWaiting();
     record_.result = TAVI_SCHED_RUN_WAITING;
     if ((isFirst || record_.waitedFor != taskId) && claimNumber()) {
         record_.waitedFor = taskId;
         store(false);
     }
-    record_.waited += static_cast<int32_t>(seconds);
 }
 
 bool sched::Run::isOfPresentTask() {
@@ -164,6 +172,9 @@ bool sched::Run::isOfPresentTask() {
 
 void sched::Run::end(int32_t result, int32_t number) {
     watchCommands(nullptr);
+    if (began_ == 0) {
+        countWaiting();
+    }
     record_.result = wasStopped_ ? TAVI_SCHED_RUN_STOPPED_BY_USER : result;
     record_.number = number;
     record_.ended = wallClock();
@@ -197,6 +208,7 @@ std::vector<std::string> sched::Run::variables() const {
 
 void sched::Run::begun(pid_t process, base::Descriptor pipe) {
     awaited_ = process;
+    countWaiting();
     began_ = steadyClock();
     pipe_ = std::move(pipe);
     record_.result = TAVI_SCHED_RUN_RUNNING;

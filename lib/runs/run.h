@@ -26,7 +26,8 @@ class Run final : private CommandWatch {
     Run(const Run &) = delete;
     Run &operator=(const Run &) = delete;
 
-    // It met a running task, or 0 for the run lock, and waits.
+    // It met a running task, or 0 for the run lock, and is about to pause for up to so many
+    // seconds.
     void waitFor(int32_t taskId, unsigned int seconds);
     // A person has asked it to end. Its waits end early then.
     bool isStopped() const;
@@ -49,6 +50,7 @@ class Run final : private CommandWatch {
     void begun(pid_t process, base::Descriptor pipe) override;
     int wait(pid_t process) override;
 
+    void countWaiting();
     bool claimNumber();
     void store(bool isLast);
     void logBegin() const;
@@ -67,7 +69,8 @@ class Run final : private CommandWatch {
 
     RunRecord record_{};
     bool triedNumber_ = false;
-    int64_t began_ = 0; // on the clock that nobody sets
+    int64_t waitingFrom_ = 0; // on the clock that nobody sets, as the next one
+    int64_t began_ = 0;
     OutputFile output_;
     base::Descriptor pipe_;
     base::Descriptor children_; // tells of children that end

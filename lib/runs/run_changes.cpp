@@ -7,6 +7,7 @@
 #include "run_records.h"
 #include "sched_error.h"
 #include "sched_guard.h"
+#include "sched_handle.h"
 #include "sched_paths.h"
 #include "sched_text.h"
 
@@ -25,6 +26,7 @@ namespace {
 
 using sched::RunRecords;
 
+constexpr int64_t kMinute = 60;
 constexpr int64_t kDay = 86400;
 constexpr int64_t kFarthest = 31 * kDay; // nobody asks for more
 constexpr size_t kMostStarts = 32 * 24;
@@ -48,29 +50,71 @@ void separate(int32_t id, bool onlyIfNeeded) {
 
 // ---- Missed times ----
 
-struct Span {
+struct Look {
     int64_t from;
+    int64_t settled; // what was due before has been recorded by now
     int64_t until;
+    int64_t now;
 };
 
-// Those of the task's times in the span that no record tells of, the latest of them.
-std::vector<int64_t> missedTimes(const TAVI_SCHED_TASK &task, const Span &span,
-                                 RunRecords &records) {
+// The runs that are known, from both databases: what could not be recorded is in the status
+// database all the same, for as long as that lasts.
+class KnownRuns {
+  public:
+    explicit KnownRuns(RunRecords &records) : records_(records) {}
+    // Milliseconds since the epoch.
+    bool has(int32_t taskId, int64_t due) {
+        return records_.hasRunDue(taskId, due) || hasRow(taskId, due / 1000);
+    }
+
+  private:
+    bool hasRow(int32_t taskId, int64_t due) {
+        sqlite3_stmt *statement = nullptr;
+        if (open()) {
+            sqlite3_prepare_v2(database_.get(),
+                               "SELECT 1 FROM task_status WHERE task_id=?1 AND timestamp>=?2 AND "
+                               "timestamp<?2+60",
+                               -1, &statement, nullptr);
+        }
+        sqlite3_bind_int(statement, 1, taskId);
+        sqlite3_bind_int64(statement, 2, due);
+        const bool found = statement && sqlite3_step(statement) == SQLITE_ROW;
+        sqlite3_finalize(statement);
+        return found;
+    }
+    bool open() {
+        if (!isTried_) {
+            isTried_ = true;
+            sqlite3 *handle = nullptr;
+            TAVISchedDBOpenForReading(&handle);
+            database_.reset(handle);
+        }
+        return database_ != nullptr;
+    }
+
+    RunRecords &records_;
+    sched::Database database_;
+    bool isTried_ = false;
+};
+
+// Those of the task's times that no record tells of, the latest of them.
+std::vector<int64_t> missedTimes(const TAVI_SCHED_TASK &task, const Look &look, RunRecords &records,
+                                 KnownRuns &known) {
     std::array<int64_t, kMostStarts> starts; // NOLINT: filled before it is read
     const int count =
-        TAVISchedTaskStarts(&task, span.from, span.until, starts.data(), starts.size());
-    const int64_t known = count > 0 ? records.prunedUntil(task.id) : 0;
+        TAVISchedTaskStarts(&task, look.from, look.until, starts.data(), starts.size());
+    const int64_t gone = count > 0 ? records.prunedUntil(task.id) : 0;
     std::vector<int64_t> missed;
     for (int i = count - 1; i >= 0 && missed.size() < kMostMissed; --i) {
         const int64_t due = starts[static_cast<size_t>(i)] * 1000;
-        if (due > known && !records.hasRunDue(task.id, due)) {
+        if (due > gone && !known.has(task.id, due)) {
             missed.insert(missed.begin(), due);
         }
     }
     return missed;
 }
 
-bool recordMissed(const TAVI_SCHED_TASK &task, int64_t due, int64_t now, RunRecords &records) {
+bool recordMissed(const TAVI_SCHED_TASK &task, int64_t due, const Look &look, RunRecords &records) {
     const auto number = sched::claimRunNumber();
     if (!number) {
         return false;
@@ -80,39 +124,57 @@ bool recordMissed(const TAVI_SCHED_TASK &task, int64_t due, int64_t now, RunReco
     record.taskId = task.id;
     record.owner = task.owner;
     record.mode = 1;
-    record.result = TAVI_SCHED_RUN_MISSED;
+    record.result = due < look.settled * 1000 ? TAVI_SCHED_RUN_MISSED : sched::kAwaited;
     record.due = due;
     record.asked = due;
-    record.ended = now * 1000;
+    record.ended = look.now * 1000;
     sched::copyText(record.name, sizeof record.name, task.name);
     return records.write(record);
 }
 
-bool recordMissedOfAll(const Span &span, int64_t now) {
+// What was awaited at an earlier look, by the schedule that there was then.
+bool settleAwaited(const Look &look, RunRecords &records, KnownRuns &known) {
+    bool done = true;
+    for (sched::RunRecord &record : records.awaited(look.settled * 1000)) {
+        record.result = TAVI_SCHED_RUN_MISSED;
+        const bool hasRun = known.has(record.taskId, record.due);
+        done = (hasRun ? records.remove(record.run) : records.write(record)) && done;
+    }
+    return done;
+}
+
+bool recordMissedOfAll(const Look &look) {
     RunRecords records(RunRecords::Mode::Write, {}, kPatience);
-    if (!records) {
+    KnownRuns known(records);
+    if (!records || !settleAwaited(look, records, known)) {
         return false;
     }
     const TAVI_SCHED_RUN_LIMITS limits = sched::readRunLimits();
     bool done = true;
-    const auto look = [&](const char *, TAVI_SCHED_TASK *task) {
-        const auto missed = missedTimes(*task, span, records);
+    const auto onTask = [&](const char *, TAVI_SCHED_TASK *task) {
+        const auto missed = missedTimes(*task, look, records, known);
         for (const int64_t due : missed) {
-            done = done && recordMissed(*task, due, now, records);
+            done = done && recordMissed(*task, due, look, records);
         }
         if (!missed.empty()) {
             records.prune(limits, task->id);
         }
         return done;
     };
-    return sched::forEachStoredTask({.onTask = look}) == 0 && done;
+    return sched::forEachStoredTask({.onTask = onTask}) == 0 && done;
+}
+
+// Whether a minute begins there, as tasks are due at no other moment.
+bool hasMinute(int64_t from, int64_t until) {
+    return (from + kMinute - 1) / kMinute * kMinute < until;
 }
 
 // What is about to change makes the tasks others than those of the time before: what may still be
-// on its way then is not looked for any more.
+// on its way then is awaited by what they are now.
 enum class Next { Change, Nothing };
 
-// The time of the last look is that of a file; it stays when the look could not be taken.
+// The time of the last look is that of a file. It stays when the look could not be taken, unless
+// tasks are about to become others, which would be taken to have missed what was never theirs.
 int takeLook(int fd, Next next) {
     struct stat last {};
     const int64_t now = std::time(nullptr);
@@ -120,28 +182,35 @@ int takeLook(int fd, Next next) {
         return -1;
     }
     const bool isFirst = last.st_size == 0;
-    const Span span{.from = std::max<int64_t>(last.st_mtime, now - kFarthest),
-                    .until = now - kMargin};
-    if (!isFirst && span.from < span.until && !recordMissedOfAll(span, now)) {
+    const bool isChange = next == Next::Change;
+    Look look{.from = std::max<int64_t>(last.st_mtime, now - kFarthest),
+              .settled = now - kMargin,
+              .until = isChange ? now : now - kMargin,
+              .now = now};
+    if (!isFirst && look.from <= now && !hasMinute(look.from, now)) {
+        return 0;
+    }
+    if (!isFirst && !recordMissedOfAll(look) && !isChange) {
         return -1;
     }
     if (isFirst) {
         (void)!write(fd, "the time of this file is that of the last look for missed runs\n", 63);
+        look.until = now;
     }
-    const bool isOver = isFirst || next == Next::Change || last.st_mtime > now;
-    const timespec until{.tv_sec = isOver ? now : std::max<int64_t>(span.until, last.st_mtime),
-                         .tv_nsec = 0};
+    const int64_t lookedUntil = look.from > now ? now : std::max(look.from, look.until);
+    const timespec until{.tv_sec = lookedUntil, .tv_nsec = 0};
     const std::array<timespec, 2> times{until, until};
     return futimens(fd, times.data());
 }
 
-void look(Next next) {
+int look(Next next) {
     const base::Descriptor file(
         open(sched::kLastLook, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
-    if (file && flock(file.get(), LOCK_EX | LOCK_NB) == 0) {
-        const sched::KeptError error;
-        sched::guarded(SCHED_SITE, [&] { return takeLook(file.get(), next); });
+    if (!file || flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+        return -1;
     }
+    const sched::KeptError error;
+    return sched::guarded(SCHED_SITE, [&] { return takeLook(file.get(), next); });
 }
 
 // ---- Outputs without records ----
@@ -174,6 +243,10 @@ void sched::recordMissedRuns() {
     if (geteuid() == 0 && access(kRecordFolder, F_OK) == 0) {
         look(Next::Change);
     }
+}
+
+int sched::findMissedRuns() {
+    return mendRunNumber() ? look(Next::Nothing) : -1;
 }
 
 void sched::beginRecording() {

@@ -13,6 +13,8 @@ void separateFromNewTask(int32_t id);
 // Records the times at which tasks were due since the last look and nothing started them. To be
 // called before tasks change, as it goes by what they are now.
 void recordMissedRuns();
+// The same when nothing changes: what may still be on its way is left for the next look. 0 or -1.
+int findMissedRuns();
 // The same after the machine's start, from which on looks are taken.
 void beginRecording();
 

@@ -13,6 +13,7 @@
 #include <cinttypes>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
 #include <fcntl.h>
 #include <poll.h>
@@ -26,7 +27,7 @@ namespace {
 using sched::RunRecord;
 
 constexpr int kPause = 10; // milliseconds
-constexpr int kSchema = 1;
+constexpr int kSchema = 2;
 
 // Each brings the database from the version that is its place to the next one.
 constexpr const char *kUpgrades[kSchema] = {
@@ -40,7 +41,14 @@ constexpr const char *kUpgrades[kSchema] = {
     "CREATE INDEX runs_of_task ON runs(task_id, run);"
     "CREATE TABLE tasks(task_id INTEGER PRIMARY KEY, first_run INTEGER NOT NULL DEFAULT 0, "
     "pruned_until INTEGER NOT NULL DEFAULT 0);"
-    "PRAGMA user_version=1;"};
+    "PRAGMA user_version=1;",
+    // Those that are awaited.
+    "CREATE INDEX runs_awaited ON runs(due) WHERE result=-1;"
+    "PRAGMA user_version=2;"};
+
+// The first run that can be the present task's, of the task of a row of runs.
+constexpr const char *kFirstRun =
+    "ifnull((SELECT first_run FROM tasks AS t WHERE t.task_id=runs.task_id), 0)";
 
 // The one list of columns: statements, what is bound and what is read follow it.
 template <typename Row, typename Visit> void forEachColumn(Row &row, Visit &&visit) {
@@ -259,6 +267,7 @@ sched::RunRecords::RunRecords(Mode mode, Pause pause, int patience)
     isMissing_ = !hasRunRecords();
     if (mode == Mode::Write || !isMissing_) {
         if (!open(mode)) {
+            wasDamaged_ = isDamaged();
             database_.reset();
         }
     }
@@ -286,29 +295,42 @@ int sched::RunRecords::onBusy(void *self, int) {
     return 1;
 }
 
-// A damaged database is put aside once, whoever else finds it so.
 bool sched::RunRecords::open(Mode mode) {
-    if (openOnce(mode)) {
-        return true;
-    }
-    if (!isDamaged() || mode == Mode::Read) {
-        return failed("cannot be opened");
-    }
+    return openOnce(mode) ||
+           (isDamaged() && mode == Mode::Write ? replace() : failed("cannot be opened"));
+}
+
+// Once, whoever else finds it damaged.
+bool sched::RunRecords::replace() {
     const base::Descriptor folder(::open(kRecordFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!folder || flock(folder.get(), LOCK_EX) != 0 || openOnce(mode)) {
-        return database_ != nullptr;
+    if (!folder || flock(folder.get(), LOCK_EX) != 0) {
+        return failed("is damaged and cannot be put aside");
     }
-    if (!isDamaged()) {
-        return failed("cannot be opened");
+    const bool isOpen = openOnce(Mode::Write);
+    const Health found = health();
+    if (found != Health::Damaged) {
+        return (isOpen && found == Health::Whole) || failed("cannot be opened");
     }
     failed("is damaged and put aside");
     database_.reset();
     for (const char *path : {kRunDatabaseWal, kRunDatabaseIndex}) {
         unlink(path);
     }
-    return std::rename(kRunDatabase, kDamagedRuns) == 0 && openOnce(mode)
-               ? true
-               : failed("cannot be made");
+    return (std::rename(kRunDatabase, kDamagedRuns) == 0 && openOnce(Mode::Write)) ||
+           failed("cannot be made");
+}
+
+sched::RunRecords::Health sched::RunRecords::health() {
+    if (!database_) {
+        return wasDamaged_ ? Health::Damaged : Health::Unknown;
+    }
+    const Statement statement = prepare("PRAGMA quick_check(1)");
+    if (statement && sqlite3_step(statement.get()) == SQLITE_ROW) {
+        const auto *const said = sqlite3_column_text(statement.get(), 0);
+        const bool isWhole = said && std::strcmp(reinterpret_cast<const char *>(said), "ok") == 0;
+        return isWhole ? Health::Whole : Health::Damaged;
+    }
+    return isDamaged() ? Health::Damaged : Health::Unknown;
 }
 
 bool sched::RunRecords::isDamaged() const {
@@ -381,7 +403,7 @@ std::optional<int64_t> sched::RunRecords::number(const char *sql,
     }
 }
 
-bool sched::RunRecords::write(const RunRecord &record) {
+bool sched::RunRecords::insert(const RunRecord &record) {
     static const std::string sql = [] {
         std::string places;
         const RunRecord none{};
@@ -391,10 +413,15 @@ bool sched::RunRecords::write(const RunRecord &record) {
     }();
     const Statement statement = prepare(sql);
     if (!statement) {
-        return failed("a run is not recorded");
+        return false;
     }
     bind(statement.get(), record);
-    return sqlite3_step(statement.get()) == SQLITE_DONE || failed("a run is not recorded");
+    return sqlite3_step(statement.get()) == SQLITE_DONE;
+}
+
+bool sched::RunRecords::write(const RunRecord &record) {
+    return insert(record) || (isDamaged() && replace() && insert(record)) ||
+           failed("a run is not recorded");
 }
 
 namespace {
@@ -452,7 +479,7 @@ bool sched::RunRecords::prune(const TAVI_SCHED_RUN_LIMITS &limits, int32_t taskI
     bool done = true;
     for (const Surplus &row : surplus) {
         done =
-            done && number("DELETE FROM runs WHERE run=?", {row.run}) &&
+            done && remove(row.run) &&
             number("INSERT INTO tasks(task_id, pruned_until) VALUES(?1, ?2) ON CONFLICT(task_id) "
                    "DO UPDATE SET pruned_until=max(pruned_until, ?2)",
                    {row.taskId, row.time});
@@ -496,72 +523,104 @@ bool sched::RunRecords::has(int64_t run) {
 }
 
 bool sched::RunRecords::hasRunDue(int32_t taskId, int64_t due) {
-    return number("SELECT count(*) FROM runs WHERE task_id=? AND due=?", {taskId, due})
+    return number("SELECT count(*) FROM runs WHERE task_id=? AND due=? AND result>=0",
+                  {taskId, due})
                .value_or(1) != 0;
+}
+
+std::vector<RunRecord> sched::RunRecords::awaited(int64_t before) {
+    const Statement statement =
+        prepare("SELECT " + columns() + " FROM runs WHERE result=-1 AND due<?");
+    sqlite3_bind_int64(statement.get(), 1, before);
+    std::vector<RunRecord> found;
+    while (statement && sqlite3_step(statement.get()) == SQLITE_ROW) {
+        take(statement.get(), found.emplace_back());
+    }
+    return found;
+}
+
+bool sched::RunRecords::remove(int64_t run) {
+    return number("DELETE FROM runs WHERE run=?", {run}).has_value();
 }
 
 // ---- Reading ----
 
-int sched::RunRecords::list(const TAVI_SCHED_RUN_FILTER &filter,
-                            const std::function<bool(const RunRecord &)> &reader) {
-    static const std::string all =
-        "SELECT " + columns() +
-        ", run<ifnull((SELECT first_run FROM tasks AS t WHERE t.task_id=runs.task_id), 0) AS old ";
+std::optional<std::vector<int64_t>>
+sched::RunRecords::numbersOf(const TAVI_SCHED_RUN_FILTER &filter) {
     // Of a group the row of the greatest time is the one that the columns are of.
-    const std::string sql =
-        all + (filter.newestOnly != 0 ? ", max(asked)" : "") +
-        " FROM runs WHERE (?1=-1 OR task_id=?1) AND asked>=?2 AND (old=0 OR (?1=-1 AND ?3=0)) " +
-        (filter.newestOnly != 0 ? "GROUP BY task_id " : "") + "ORDER BY asked DESC, run DESC";
-    const Statement statement = prepare(sql);
-    if (!statement) {
-        failed("cannot be read");
-        return -1;
-    }
+    const bool isGrouped = filter.newestOnly != 0;
+    const Statement statement =
+        prepare(std::string("SELECT run") + (isGrouped ? ", max(asked)" : "") +
+                " FROM runs WHERE (?1=-1 OR task_id=?1) AND asked>=?2 AND result>=0 AND "
+                "((?1=-1 AND ?3=0) OR run>=" +
+                kFirstRun + ") " + (isGrouped ? "GROUP BY task_id " : "") +
+                "ORDER BY asked DESC, run DESC");
     sqlite3_bind_int64(statement.get(), 1, filter.taskId);
     sqlite3_bind_int64(statement.get(), 2, filter.since);
     sqlite3_bind_int64(statement.get(), 3, filter.newestOnly);
-    int count = 0;
-    RunRecord record{};
-    int result = SQLITE_ROW;
-    while ((filter.limit <= 0 || count < filter.limit) &&
-           (result = sqlite3_step(statement.get())) == SQLITE_ROW) {
-        take(statement.get(), record);
-        record.isOfRemovedTask =
-            sqlite3_column_int(statement.get(), sqlite3_column_count(statement.get()) -
-                                                    (filter.newestOnly != 0 ? 2 : 1));
-        complete(record);
-        if (filter.failedOnly != 0 && !hasFailed(record.result)) {
-            continue;
-        }
-        ++count;
-        if (!reader(record)) {
-            return count;
-        }
+    std::vector<int64_t> numbers;
+    int result = SQLITE_ERROR;
+    while (statement && (result = sqlite3_step(statement.get())) == SQLITE_ROW) {
+        numbers.push_back(sqlite3_column_int64(statement.get(), 0));
     }
-    if (result != SQLITE_ROW && result != SQLITE_DONE) {
+    return result == SQLITE_DONE ? std::optional(std::move(numbers)) : std::nullopt;
+}
+
+sched::RunRecords::Statement sched::RunRecords::prepareFind() {
+    return prepare("SELECT " + columns() + ", run<" + kFirstRun +
+                   " FROM runs WHERE run=? AND result>=0");
+}
+
+// Nothing when there is no such record any more, or it cannot be read: the database's error tells.
+std::optional<RunRecord> sched::RunRecords::fetch(sqlite3_stmt *statement, int64_t run) {
+    sqlite3_bind_int64(statement, 1, run);
+    std::optional<RunRecord> record;
+    if (sqlite3_step(statement) == SQLITE_ROW) {
+        record.emplace();
+        take(statement, *record);
+        record->isOfRemovedTask =
+            sqlite3_column_int(statement, sqlite3_column_count(statement) - 1);
+    }
+    sqlite3_reset(statement);
+    if (record) {
+        complete(*record);
+    }
+    return record;
+}
+
+// The numbers come first: however long the reader takes, nothing of the database is held meanwhile,
+// and no more than one record is in memory.
+int sched::RunRecords::list(const TAVI_SCHED_RUN_FILTER &filter,
+                            const std::function<bool(const RunRecord &)> &reader) {
+    const auto numbers = numbersOf(filter);
+    const Statement statement = prepareFind();
+    if (!numbers || !statement) {
         failed("cannot be read");
         return -1;
+    }
+    int count = 0;
+    for (auto run = numbers->begin();
+         run != numbers->end() && (filter.limit <= 0 || count < filter.limit); ++run) {
+        const auto record = fetch(statement.get(), *run);
+        if (!record && sqlite3_errcode(database_.get()) != SQLITE_OK) {
+            failed("cannot be read");
+            return -1;
+        }
+        if (record && (filter.failedOnly == 0 || hasFailed(record->result))) {
+            ++count;
+            if (!reader(*record)) {
+                break;
+            }
+        }
     }
     return count;
 }
 
 std::optional<RunRecord> sched::RunRecords::find(int64_t run) {
-    static const std::string sql = "SELECT " + columns() +
-                                   ", run<ifnull((SELECT first_run FROM tasks AS t WHERE "
-                                   "t.task_id=runs.task_id), 0) FROM runs WHERE run=?";
-    const Statement statement = prepare(sql);
-    sqlite3_bind_int64(statement.get(), 1, run);
-    const int result = statement ? sqlite3_step(statement.get()) : SQLITE_ERROR;
-    if (result != SQLITE_ROW) {
-        if (result != SQLITE_DONE) {
-            failed("cannot be read");
-        }
-        return std::nullopt;
+    const Statement statement = prepareFind();
+    auto record = statement ? fetch(statement.get(), run) : std::nullopt;
+    if (!record && sqlite3_errcode(database_.get()) != SQLITE_OK) {
+        failed("cannot be read");
     }
-    RunRecord record{};
-    take(statement.get(), record);
-    record.isOfRemovedTask =
-        sqlite3_column_int(statement.get(), sqlite3_column_count(statement.get()) - 1);
-    complete(record);
     return record;
 }

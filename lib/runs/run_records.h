@@ -12,6 +12,7 @@
 #include <optional>
 #include <sqlite3.h>
 #include <string>
+#include <vector>
 
 namespace sched {
 
@@ -20,6 +21,9 @@ struct RunRecord : TAVI_SCHED_RUN {
     int64_t processStart = 0;
     std::array<char, 40> boot{}; // of the machine's start that the process belongs to
 };
+
+// The result of a record that is not shown: its task was due, and what came of it is not known yet.
+inline constexpr int32_t kAwaited = -1;
 
 // Notes this process as the one that the run goes on in.
 void setProcess(RunRecord &record);
@@ -51,6 +55,11 @@ class RunRecords {
 
     explicit operator bool() const { return database_ != nullptr; }
     bool isMissing() const { return isMissing_; }
+    // Whether everything in it can be read.
+    enum class Health { Whole, Damaged, Unknown };
+    Health health();
+    // Puts a damaged database aside and makes another one.
+    bool replace();
 
     bool write(const RunRecord &record);
     // Removes what is beyond the limits, of the task and of all, with its outputs.
@@ -73,6 +82,9 @@ class RunRecords {
     // The last minute of the task's runs whose records are gone, in milliseconds.
     int64_t prunedUntil(int32_t taskId);
     bool hasRunDue(int32_t taskId, int64_t due);
+    // Those of kAwaited that were due before that moment.
+    std::vector<RunRecord> awaited(int64_t before);
+    bool remove(int64_t run);
 
   private:
     using Handle = std::unique_ptr<sqlite3, int (*)(sqlite3 *)>;
@@ -85,6 +97,10 @@ class RunRecords {
     bool upgrade();
     bool execute(const char *sql);
     Statement prepare(const std::string &sql);
+    bool insert(const RunRecord &record);
+    std::optional<std::vector<int64_t>> numbersOf(const TAVI_SCHED_RUN_FILTER &filter);
+    Statement prepareFind();
+    std::optional<RunRecord> fetch(sqlite3_stmt *statement, int64_t run);
     std::optional<int64_t> number(const char *sql, std::initializer_list<int64_t> values);
     bool failed(const char *what);
 
@@ -92,6 +108,7 @@ class RunRecords {
     int64_t patience_ = 0;    // until then a locked database is waited for
     bool hasGivenUp_ = false; // on purpose
     bool isMissing_ = false;
+    bool wasDamaged_ = false; // and is not open
     Handle database_{nullptr, sqlite3_close};
 };
 

@@ -57,7 +57,7 @@ bool setArguments(PLATPLUGIN *plugin, const TAVI_SCHED_RUN &run) {
         {"RUN_ENDED_AT", std::to_string(run.ended / 1000)},
         {"RUN_DURATION", seconds(run.duration)},
         {"RUN_WAITED", std::to_string(run.waited)},
-        {"RUN_OUTPUT", run.began == 0 ? "" : sched::outputPathOf(run.run)},
+        {"RUN_OUTPUT", run.began == 0 || run.run == 0 ? "" : sched::outputPathOf(run.run)},
         {"RUN_OUTPUT_SIZE", std::to_string(run.outputSize)},
     };
     for (const auto &[name, value] : arguments) {

@@ -50,7 +50,7 @@ _tavisched() {
         export) options='--web' ;;
         enable | disable) options='--json' ;;
         remove) options='--yes --json' ;;
-        run) options='--wait --json' ;;
+        run) options='--wait --missed --json' ;;
         stop) options='--after --json' ;;
         check) options='--repair --json' ;;
         import)

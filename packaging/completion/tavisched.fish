@@ -79,5 +79,6 @@ complete -c tavisched -n '__fish_seen_subcommand_from import' -l dry-run -d 'Sho
 
 complete -c tavisched -n '__fish_seen_subcommand_from remove' -s y -l yes -d 'Do not ask'
 complete -c tavisched -n '__fish_seen_subcommand_from run' -l wait -d 'Wait for the end'
+complete -c tavisched -n '__fish_seen_subcommand_from run' -l missed -d 'Those that missed their last time'
 complete -c tavisched -n '__fish_seen_subcommand_from stop' -l after -x -d 'Kill what is left after so many seconds'
 complete -c tavisched -n '__fish_seen_subcommand_from check' -l repair -d 'Repair what needs no person'

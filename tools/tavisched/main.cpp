@@ -51,7 +51,8 @@ struct Settings {
     NextOptions next;
     CalendarOptions calendar;
     Manner manner;
-    bool json = false, web = false, yes = false, wait = false, repair = false, follow = false;
+    RunOptions running;
+    bool json = false, web = false, yes = false, repair = false, follow = false;
 };
 
 // A number as it was typed; digits alone, as lists show it.
@@ -267,12 +268,14 @@ void addChangingCommands(CLI::App &app, Settings &given, Command &command) {
 }
 
 void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
-    auto *const running =
-        subcommand(app, command, "run", "run tasks now, in the background",
-                   "tavisched run 3 --wait", [&] { return run(parseIds(given.ids), given.wait); });
-    idsOption(running, given.ids, true);
-    running->add_flag("--wait", given.wait,
+    auto *const running = subcommand(app, command, "run", "run tasks now, in the background",
+                                     "tavisched run 3 --wait",
+                                     [&] { return run(parseIds(given.ids), given.running); });
+    idsOption(running, given.ids, false);
+    running->add_flag("--wait", given.running.wait,
                       "wait for the end, show the output and exit as the command");
+    running->add_flag("--missed", given.running.missed,
+                      "those that missed their last time, each once");
     jsonErrorsOption(running, given);
 
     auto *const stopping =

@@ -73,7 +73,11 @@ struct ImportOptions {
 };
 int importTasks(const ImportOptions &options);
 
-int run(const Ids &ids, bool wait);
+struct RunOptions {
+    bool wait = false;
+    bool missed = false; // all tasks that missed their last time, instead of ids
+};
+int run(const Ids &ids, const RunOptions &options);
 int stop(const Ids &ids, int graceSeconds);
 int syncTasks();
 int check(bool repair, bool json);

@@ -34,15 +34,16 @@ int history(const HistoryOptions &options) {
     filter.failedOnly = options.failed ? 1 : 0;
     filter.limit = options.limit;
     filter.since = options.since.empty() ? 0 : sinceOf(options.since);
-    const std::vector<Run> runs = readRuns(filter);
+    const bool isAny = findNewest(filter, [](const Run &) { return true; }).has_value();
     const bool isNarrowed = options.failed || !options.since.empty();
-    const Task task = options.id && runs.empty() ? readTask(*options.id) : nullptr; // or refused
+    const Task task = options.id && !isAny ? readTask(*options.id) : nullptr; // or refused
     if (options.json) {
-        for (const Run &run : runs) {
+        forEachRun(filter, [](const Run &run) {
             printJsonLine(plainRun(run));
-        }
-    } else if (!runs.empty()) {
-        printRunsTable(runs);
+            return true;
+        });
+    } else if (isAny) {
+        printRunsTable(filter);
     } else {
         std::printf("There are no %sruns%s on record.\n", isNarrowed ? "such " : "",
                     task ? (" of " + called(*task)).c_str() : "");

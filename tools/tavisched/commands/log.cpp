@@ -3,9 +3,9 @@
 #include "failure.h"
 #include "tasks/runs.h"
 #include "tasks/tasks.h"
+#include "text/utf8.h"
 #include "text/words.h"
 
-#include <algorithm>
 #include <cstdio>
 
 namespace tavisched {
@@ -20,12 +20,15 @@ Run runToShow(int32_t id, std::optional<int64_t> number) {
             throw Refusal("task " + std::to_string(id) + " has no run " + std::to_string(*number) +
                           "; \"tavisched history " + std::to_string(id) + "\" lists its runs");
         }
+        if (run->isOfRemovedTask == 1) {
+            std::fprintf(stderr, "tavisched: run %lld is of a removed task, %s\n",
+                         static_cast<long long>(run->run), printable(run->name).c_str());
+        }
         return *run;
     }
-    const std::vector<Run> runs = readRuns(runsOf(id));
-    const auto run = std::find_if(runs.begin(), runs.end(),
-                                  [](const Run &one) { return one.began != 0 || goesOn(one); });
-    if (run == runs.end()) {
+    const auto run =
+        findNewest(runsOf(id), [](const Run &one) { return one.began != 0 || goesOn(one); });
+    if (!run) {
         throw Failure(called(*readTask(id)) + " has no run on record that printed anything");
     }
     return *run;

@@ -20,8 +20,13 @@ struct Going {
 
 // Refused when none goes on.
 Going goingRunsOf(int32_t id) {
-    Going going{readTask(id), readRuns(runsOf(id))};
-    std::erase_if(going.runs, [](const Run &run) { return !goesOn(run); });
+    Going going{readTask(id), {}};
+    forEachRun(runsOf(id), [&](const Run &run) {
+        if (goesOn(run)) {
+            going.runs.push_back(run);
+        }
+        return true;
+    });
     if (going.runs.empty()) {
         throw Refusal(called(*going.task) + " is not running");
     }

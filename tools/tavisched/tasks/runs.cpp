@@ -21,15 +21,14 @@ constexpr unsigned int kNotFound = 0x2000;
 constexpr int kLongestWait = 1000; // milliseconds
 
 // No exception may pass through the library.
-struct Collector {
-    std::vector<Run> runs{};
+struct Reader {
+    const std::function<bool(const Run &)> &read;
     std::exception_ptr failure{};
 
-    static int add(void *collector, const Run *run) {
-        auto &self = *static_cast<Collector *>(collector);
+    static int take(void *reader, const Run *run) {
+        auto &self = *static_cast<Reader *>(reader);
         try {
-            self.runs.push_back(*run);
-            return 0;
+            return self.read(*run) ? 0 : 1;
         } catch (...) {
             self.failure = std::current_exception();
             return -1;
@@ -122,6 +121,40 @@ bool printFrom(int64_t run, int64_t &offset, Printer &printer) {
 
 } // namespace
 
+void forEachRun(const TAVI_SCHED_RUN_FILTER &filter,
+                const std::function<bool(const Run &)> &reader) {
+    Reader taking{.read = reader};
+    const int count = TAVISchedRunList(&filter, Reader::take, &taking);
+    if (taking.failure) {
+        std::rethrow_exception(taking.failure);
+    }
+    if (count < 0) {
+        throw Failure("the records of runs cannot be read: " + libraryError() +
+                      "; see \"tavisched check\"");
+    }
+}
+
+std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter) {
+    std::vector<Run> runs;
+    forEachRun(filter, [&](const Run &run) {
+        runs.push_back(run);
+        return true;
+    });
+    return runs;
+}
+
+std::optional<Run> findNewest(const TAVI_SCHED_RUN_FILTER &filter,
+                              const std::function<bool(const Run &)> &condition) {
+    std::optional<Run> found;
+    forEachRun(filter, [&](const Run &run) {
+        if (condition(run)) {
+            found = run;
+        }
+        return !found;
+    });
+    return found;
+}
+
 namespace {
 
 LatestRuns readNewest(int32_t taskId) {
@@ -139,18 +172,6 @@ LatestRuns readNewest(int32_t taskId) {
 }
 
 } // namespace
-
-std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter) {
-    Collector found;
-    const int count = TAVISchedRunList(&filter, Collector::add, &found);
-    if (found.failure) {
-        std::rethrow_exception(found.failure);
-    }
-    if (count < 0) {
-        throw Failure("the records of runs cannot be read: " + libraryError());
-    }
-    return std::move(found.runs);
-}
 
 LatestRuns readLatestRuns() {
     return readNewest(-1);

@@ -5,6 +5,7 @@
 
 #include <cstdint>
 #include <ctime>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -20,8 +21,14 @@ constexpr TAVI_SCHED_RUN_FILTER kAllRuns{
 constexpr TAVI_SCHED_RUN_FILTER runsOf(int32_t taskId) {
     return {.taskId = taskId, .failedOnly = 0, .newestOnly = 0, .limit = 0, .since = 0};
 }
-// The runs that the filter keeps, newest first; none where there are no records.
+// Hands over the runs that the filter keeps, newest first, until the reader answers false; none
+// where there are no records.
+void forEachRun(const TAVI_SCHED_RUN_FILTER &filter,
+                const std::function<bool(const Run &)> &reader);
 std::vector<Run> readRuns(const TAVI_SCHED_RUN_FILTER &filter);
+// The newest of them of which the condition holds.
+std::optional<Run> findNewest(const TAVI_SCHED_RUN_FILTER &filter,
+                              const std::function<bool(const Run &)> &condition);
 // The newest run of every task that has one. Nothing, with a warning, when they cannot be read:
 // tasks can be shown all the same.
 LatestRuns readLatestRuns();

@@ -6,6 +6,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <iterator>
+#include <numeric>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -22,17 +24,10 @@ bool takesColours() {
            std::strcmp(terminal, "dumb") != 0;
 }
 
-std::vector<size_t> naturalWidths(const std::vector<Column> &columns,
-                                  const std::vector<Row> &rows) {
-    std::vector<size_t> widths;
-    for (size_t i = 0; i < columns.size(); ++i) {
-        size_t width = widthOf(columns[i].title);
-        for (const Row &row : rows) {
-            width = std::max(width, widthOf(row[i].text));
-        }
-        widths.push_back(width);
+void widen(std::vector<size_t> &widths, const Row &row) {
+    for (size_t i = 0; i < row.size(); ++i) {
+        widths[i] = std::max(widths[i], widthOf(row[i].text));
     }
-    return widths;
 }
 
 // Takes columns from the widest that may give some, one at a time, until the table fits or none is
@@ -57,29 +52,48 @@ bool narrow(const std::vector<Column> &columns, std::vector<size_t> &widths, siz
     return true;
 }
 
+// What is shown of a table: places of columns, and how wide each of them is.
+struct Fitting {
+    std::vector<size_t> places;
+    std::vector<size_t> widths;
+};
+
 // Leaves out the column that goes first. False when none may go.
-bool leaveOneOut(std::vector<Column> &columns, std::vector<Row> &rows) {
-    size_t first = columns.size();
-    for (size_t i = 0; i < columns.size(); ++i) {
-        const bool isEarlier =
-            first == columns.size() || columns[i].leftOut < columns[first].leftOut;
-        first = columns[i].leftOut > 0 && isEarlier ? i : first;
-    }
-    if (first == columns.size()) {
+bool leaveOneOut(const std::vector<Column> &columns, Fitting &shown) {
+    const auto goesFirst = [&](size_t one, size_t other) {
+        const int first = columns[one].leftOut;
+        const int second = columns[other].leftOut;
+        return first != 0 && (second == 0 || first < second);
+    };
+    const auto first = std::min_element(shown.places.begin(), shown.places.end(), goesFirst);
+    if (columns[*first].leftOut == 0) {
         return false;
     }
-    columns.erase(columns.begin() + static_cast<ptrdiff_t>(first));
-    for (Row &row : rows) {
-        row.erase(row.begin() + static_cast<ptrdiff_t>(first));
-    }
+    shown.widths.erase(shown.widths.begin() + (first - shown.places.begin()));
+    shown.places.erase(first);
     return true;
 }
 
-std::vector<size_t> fit(std::vector<Column> &columns, std::vector<Row> &rows, size_t available) {
+template <typename Value>
+std::vector<Value> picked(const std::vector<Value> &all, const std::vector<size_t> &places) {
+    std::vector<Value> some;
+    some.reserve(places.size());
+    for (const size_t place : places) {
+        some.push_back(all[place]);
+    }
+    return some;
+}
+
+Fitting fit(const std::vector<Column> &columns, const std::vector<size_t> &widths,
+            size_t available) {
+    Fitting shown{.places = std::vector<size_t>(columns.size()), .widths = widths};
+    std::iota(shown.places.begin(), shown.places.end(), 0);
     for (;;) {
-        std::vector<size_t> widths = naturalWidths(columns, rows);
-        if (narrow(columns, widths, available) || !leaveOneOut(columns, rows)) {
-            return widths;
+        std::vector<size_t> narrowed = shown.widths;
+        if (narrow(picked(columns, shown.places), narrowed, available) ||
+            !leaveOneOut(columns, shown)) {
+            shown.widths = narrowed;
+            return shown;
         }
     }
 }
@@ -121,24 +135,33 @@ std::string styled(const std::string &text, Style style) {
     return std::string("\033[") + kCodes[static_cast<size_t>(style)] + "m" + text + "\033[0m";
 }
 
-void printTable(std::vector<Column> columns, std::vector<Row> rows) {
-    const auto width = terminalWidth();
-    std::vector<size_t> widths(columns.size(), 0);
-    if (width) {
-        widths = fit(columns, rows, *width);
-    }
+void printTable(std::vector<Column> columns, const std::vector<Row> &rows) {
+    printTable(std::move(columns),
+               [&](const RowReader &reader) { std::for_each(rows.begin(), rows.end(), reader); });
+}
+
+void printTable(std::vector<Column> columns, const RowSource &source) {
     Row titles;
-    for (const Column &column : columns) {
-        titles.push_back({column.title, Style::Strong});
+    std::transform(columns.begin(), columns.end(), std::back_inserter(titles),
+                   [](const Column &column) {
+                       return Cell{column.title, Style::Strong};
+                   });
+    const auto width = terminalWidth();
+    if (!width) {
+        printBare(titles);
+        source(printBare);
+        return;
     }
-    rows.insert(rows.begin(), std::move(titles));
-    for (const Row &row : rows) {
-        if (width) {
-            printRow(columns, widths, row);
-        } else {
-            printBare(row);
-        }
-    }
+    std::vector<size_t> widths(columns.size(), 0);
+    widen(widths, titles);
+    source([&](const Row &row) { widen(widths, row); });
+    const Fitting shown = fit(columns, widths, *width);
+    columns = picked(columns, shown.places);
+    const auto print = [&](const Row &row) {
+        printRow(columns, shown.widths, picked(row, shown.places));
+    };
+    print(titles);
+    source(print);
 }
 
 } // namespace tavisched

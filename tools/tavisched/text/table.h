@@ -2,6 +2,7 @@
 // nor padded, two blanks between them.
 #pragma once
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -32,6 +33,12 @@ struct Column {
 using Row = std::vector<Cell>;
 
 // Prints the columns' titles and the rows, aligned and fitted to the terminal's width.
-void printTable(std::vector<Column> columns, std::vector<Row> rows);
+void printTable(std::vector<Column> columns, const std::vector<Row> &rows);
+
+// The same for rows that are not kept: the source hands each of them over, a second time for a
+// terminal, whose columns' widths are found first.
+using RowReader = std::function<void(const Row &row)>;
+using RowSource = std::function<void(const RowReader &reader)>;
+void printTable(std::vector<Column> columns, const RowSource &source);
 
 } // namespace tavisched

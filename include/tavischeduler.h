@@ -260,8 +260,8 @@ TAVI_SCHED_API int TAVISchedOffHours(const TAVI_SCHED_TASK *const *rgTasks, size
                                      int64_t from, int64_t until, TAVI_SCHED_SPAN *rgSpans,
                                      size_t cMax);
 
-#define TAVI_SCHED_REMARK_NEVER 1        /* it will never run; not said of a once task that is past */
-#define TAVI_SCHED_REMARK_ONE_RUN 2      /* its interval leaves room for one run a day alone */
+#define TAVI_SCHED_REMARK_NEVER 1   /* it will never run; not said of a once task that is past */
+#define TAVI_SCHED_REMARK_ONE_RUN 2 /* its interval leaves room for one run a day alone */
 #define TAVI_SCHED_REMARK_SHORT_MONTHS 3 /* some months, or years, do not have its day */
 #define TAVI_SCHED_REMARK_SKIPPED_HOUR 4 /* daylight saving time skips a run */
 #define TAVI_SCHED_REMARK_OFF_HOURS 5    /* runs fall into hours in which the machine is off */

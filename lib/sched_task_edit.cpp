@@ -18,8 +18,9 @@ int editBetweenHooks(sched::ChangeHook &hook, TAVI_SCHED_TASK *task) {
 }
 
 // A power schedule's id follows from its content: the old one is free then, or another's.
-void leaveOldId(int32_t id, int32_t backend) {
-    const auto row = sched::findBackend(backend, &TAVI_SCHED_BACKEND_RECORD::get_by_id);
+void leaveOldPowerId(int32_t id) {
+    const auto row =
+        sched::findBackend(TAVI_SCHED_BACKEND_AUTOPOWER, &TAVI_SCHED_BACKEND_RECORD::get_by_id);
     auto present = sched::allocateTask();
     if (row && present && SchedBackends[*row].get_by_id(id, present.get()) == 0) {
         sched::separateFromRemovedTask(id);
@@ -42,8 +43,7 @@ int TAVISchedTaskEdit(TAVI_SCHED_TASK *pTask) {
     sched::ChangeHook hook(SCHED_SITE, "task_edit", &oldTask, pTask);
     const int result = hook.initialised() ? editBetweenHooks(hook, pTask) : -1;
     if (result == 0 && oldTask.backend == TAVI_SCHED_BACKEND_AUTOPOWER) {
-        sched::whenStored(
-            [id = oldTask.id, backend = oldTask.backend] { leaveOldId(id, backend); });
+        sched::whenStored(leaveOldPowerId, oldTask.id);
     }
     if (sched::isBatchOpen()) {
         sched::deferHook(hook, result);

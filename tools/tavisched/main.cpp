@@ -443,6 +443,8 @@ int execute(const Command &command, const Failing &fail) {
         return status;
     } catch (const Refusal &refusal) {
         return fail.with(refusal);
+    } catch (const std::bad_alloc &) {
+        throw; // there is none for words either
     } catch (const std::exception &failure) {
         return fail.with(failure.what(), Failure::kExitStatus);
     }
@@ -485,7 +487,10 @@ int tavischedMain(int argc, char **argv) {
 int main(int argc, char **argv) {
     try {
         return tavischedMain(argc, argv);
+    } catch (const std::bad_alloc &) {
+        std::fputs("tavisched: out of memory\n", stderr);
     } catch (const std::exception &error) {
-        return Failing(false).with(error.what(), Failure::kExitStatus);
+        std::fprintf(stderr, "tavisched: %s\n", error.what());
     }
+    return Failure::kExitStatus;
 }

@@ -576,13 +576,13 @@ typedef struct TAVI_SCHED_RUN_FILTER {
 
 /* Is handed one record, which is gone after the call; anything but 0 ends the list. */
 typedef int (*TAVI_SCHED_RUN_READER)(void *pContext, const TAVI_SCHED_RUN *pRun);
-/* Hands the runs that the filter (NULL: all) keeps to the reader, the newest first. Returns how
- * many it was handed, 0 where there are no records, or -1 with error 0x0900 or 0x0B00. */
+/* Hands the runs that the filter (NULL: all) keeps to the reader, the newest first, one at a time:
+ * nothing of the database is held while the reader works. Returns how many it was handed, 0 where
+ * there are no records, or -1 with error 0x0900 or 0x0B00. */
 TAVI_SCHED_API int TAVISchedRunList(const TAVI_SCHED_RUN_FILTER *pFilter,
                                     TAVI_SCHED_RUN_READER reader, void *pContext);
 /* Records what was missed up to three minutes ago, as the start of the machine and every change of
- * tasks do. 0, or -1 with error 0x0B00 when that cannot be looked for, or somebody else does. Root
- * alone. */
+ * tasks do. 0, or -1 with error 0x0B00 when that cannot be looked for. Root alone. */
 TAVI_SCHED_API int TAVISchedMissedRunsFind(void);
 /* One record. 0x2000 when there is none of that number. */
 TAVI_SCHED_API int TAVISchedRunGet(int64_t run, TAVI_SCHED_RUN *pRun);

@@ -710,21 +710,17 @@ TEST_F(CommandLine, MakesUpForMissedTimes) {
               "task 1 (Task 1): started\nmade up\ntask 1 (Task 1): ok\n");
     EXPECT_THAT(done("history"), testing::ContainsRegex("4  Task 4 .removed.  2.* missed\n"));
     shell("touch -d '2 days ago' /var/lib/tavischeduler/last_look");
-    EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
-    recorded("DELETE FROM runs WHERE result<40 AND task_id=2");
+    recorded("DELETE FROM runs WHERE task_id=2");
     EXPECT_EQ(done("run --missed"), "task 2 (Task 2): started\n"); // found by this very command
     EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
 }
 
 TEST_F(CommandLine, DoesWithoutRecords) {
     done("add --command 'exit 3'");
-    done("add --command 'kill -9 $$'");
     shell("rm -rf /var/lib/tavischeduler/*; mkdir /var/lib/tavischeduler/runs.sqlite");
-    EXPECT_THAT(run("run 1 2 --wait"), AllOf(HasSubstr("(Task 1): exit 3, and not recorded; "),
-                                             HasSubstr("(Task 2): killed by signal 9, and not")));
+    EXPECT_THAT(run("run 1 --wait"), HasSubstr("(Task 1): exit 3, and not recorded; "));
     EXPECT_EQ(status_, 3);
-    EXPECT_THAT(run("list"), AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 2")));
-    EXPECT_EQ(status_, 0);
+    EXPECT_THAT(run("list"), AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 1")));
     EXPECT_THAT(run("check"), HasSubstr("runs.sqlite is no file"));
     for (const char *const command : {"history", "log 1", "stop 1", "run --missed"}) {
         EXPECT_THAT(run(command), HasSubstr("; see \"tavisched check\"")) << command;
@@ -852,8 +848,6 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler_run", "task_scheduler_run must", false},
         {"chmod 711 /var/lib/tavischeduler", "/var/lib/tavischeduler, where runs", true},
         {"chown bin /var/lib/tavischeduler/runs.sqlite", "runs.sqlite, where runs", true},
-        {"rm -r /var/lib/tavischeduler/output; touch /var/lib/tavischeduler/output", "is no folder",
-         false},
         {"rm /var/lib/tavischeduler/runs.sqlite-*; echo no database > "
          "/var/lib/tavischeduler/runs.sqlite",
          "/var/lib/tavischeduler/runs.sqlite are damaged", true},

@@ -206,7 +206,8 @@ int takeLook(int fd, Next next) {
 int look(Next next) {
     const base::Descriptor file(
         open(sched::kLastLook, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600));
-    if (!file || flock(file.get(), LOCK_EX | LOCK_NB) != 0) {
+    const int wait = next == Next::Change ? LOCK_NB : 0; // a change has no time for others' looks
+    if (!file || flock(file.get(), LOCK_EX | wait) != 0) {
         return -1;
     }
     const sched::KeptError error;

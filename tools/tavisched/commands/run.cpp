@@ -160,15 +160,17 @@ void follow(const Started &started, bool hasRecords) {
     close(started.end);
 }
 
-// The run's exit status, when it has ended. One whose end could not be recorded seems interrupted.
+// The run's exit status, when it has ended. One whose end could not be recorded seems interrupted
+// by its record.
 int reportEnd(const Started &started) {
     std::optional<Run> run;
     try {
         run = recordOf(started);
     } catch (const Failure &) { // that has been told
     }
-    const bool isRecorded = run && run->result != TAVI_SCHED_RUN_INTERRUPTED;
-    const auto status = isRecorded ? std::nullopt : statusOf(started);
+    const bool isDoubtful = !run || run->result == TAVI_SCHED_RUN_INTERRUPTED;
+    const auto status = isDoubtful ? statusOf(started) : std::nullopt;
+    const bool isRecorded = run && (!status || status->result == run->result);
     run = status ? status : run;
     std::printf("%s: %s%s\n", called(*started.task).c_str(),
                 run ? resultInWords(*run).c_str() : "no result",

@@ -538,8 +538,9 @@ TAVI_SCHED_API int TAVISchedDBListLastStatus(struct sqlite3 *db, TAVI_SCHED_STAT
 #define TAVI_SCHED_RUN_DATABASE_FAILED 36
 #define TAVI_SCHED_RUN_OWNER_UNKNOWN 37
 #define TAVI_SCHED_RUN_TASK_REMOVED 38  /* while the run waited */
-#define TAVI_SCHED_RUN_TASK_DISABLED 39 /* while the run waited */
+#define TAVI_SCHED_RUN_TASK_DISABLED 39 /* while the run waited, or when cron asked for it */
 #define TAVI_SCHED_RUN_MISSED 40        /* the task was due, and cron did not start it */
+#define TAVI_SCHED_RUN_NOT_DUE 41       /* when cron asked for it */
 
 /* Times are milliseconds since the epoch, and 0 for what did not happen. */
 typedef struct TAVI_SCHED_RUN {
@@ -604,13 +605,15 @@ TAVI_SCHED_API int TAVISchedRunFollow(int64_t run, int64_t offset, int32_t milli
  * when it cannot be asked. */
 TAVI_SCHED_API int TAVISchedRunStop(int64_t run, int32_t graceSeconds);
 
-/* How many records are kept, of one task and of all; set by "runs_per_task" and "runs" in the
- * section [limits] of /usr/tavi/etc/run_records. */
+/* How many records are kept, of one task and of all, and whether there are records of what cron
+ * asked for when the task was disabled or not due; set by "runs_per_task", "runs" and "skipped" in
+ * the section [limits] of /usr/tavi/etc/run_records. */
 typedef struct TAVI_SCHED_RUN_LIMITS {
     int32_t runsPerTask; /* 50 by default */
     int32_t runs;        /* 10,000 by default */
+    int32_t skipped;     /* 1 or 0, which is the default */
 } TAVI_SCHED_RUN_LIMITS;
-/* The limits in force; a value that is no number above 0 is passed over with a log line. */
+/* The limits in force; a value that is none of these is passed over with a log line. */
 TAVI_SCHED_API int TAVISchedRunLimitsGet(TAVI_SCHED_RUN_LIMITS *pLimits);
 
 /* ---- What is wrong with the machine ---- */

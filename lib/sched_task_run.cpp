@@ -4,6 +4,7 @@
 #include "base/descriptor.h"
 #include "platc.h"
 #include "runs/run.h"
+#include "runs/run_changes.h"
 #include "runs/run_connection.h"
 #include "sched_backend.h"
 #include "sched_calendar.h"
@@ -217,7 +218,7 @@ class TaskRun {
         ++waits_;
         database_.reset();
         releaseLock();
-        run_.waitFor(taskId, seconds);
+        run_.waitFor(taskId);
         sleep(seconds);
         return Admission::Wait;
     }
@@ -420,6 +421,14 @@ int startChild(int32_t id, int32_t mode, TAVI_SCHED_TASK &task, const Followed *
     }
 }
 
+// No failure.
+int skip(const TAVI_SCHED_TASK &task, int32_t mode, int32_t why) {
+    if (mode == 1) {
+        sched::recordSkipped(task, why);
+    }
+    return 0;
+}
+
 int runTask(int32_t id, int32_t mode, int32_t enabledOnly, const Followed *followed) {
     TAVI_SCHED_TASK task{};
     if (TAVISchedTaskGetByID(id, &task) < 0) {
@@ -431,8 +440,11 @@ int runTask(int32_t id, int32_t mode, int32_t enabledOnly, const Followed *follo
         SCHED_SET_ERROR(sched::kNotFound);
         return -1;
     }
-    if ((enabledOnly == 1 && task.state == TAVI_SCHED_STATE_DISABLED) || (mode != 0 && mode != 1)) {
+    if (mode != 0 && mode != 1) {
         return 0;
+    }
+    if (enabledOnly == 1 && task.state == TAVI_SCHED_STATE_DISABLED) {
+        return skip(task, mode, TAVI_SCHED_RUN_TASK_DISABLED);
     }
     const int due = mode == 1 ? isDue(task) : 1;
     if (due < 0) {
@@ -440,7 +452,7 @@ int runTask(int32_t id, int32_t mode, int32_t enabledOnly, const Followed *follo
                   SCHED_LAST_ERROR);
     }
     if (due != 1) {
-        return due;
+        return due == 0 ? skip(task, mode, TAVI_SCHED_RUN_NOT_DUE) : due;
     }
     return startChild(id, mode, task, followed);
 }

@@ -513,10 +513,27 @@ TEST_F(Records, LimitsAndPruning) {
     EXPECT_EQ(readFrom(1, 0), 0x2000U);
     EXPECT_EQ(readFrom(5, -1), 0x0D00U);
     logs();
-    writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=-2\nruns=x\n");
+    writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=-2\nruns=x\nskipped=2\n");
     EXPECT_TRUE(TAVISchedRunLimitsGet(&limits) == 0 && limits.runsPerTask == 50 &&
-                limits.runs == 10000);
-    EXPECT_EQ(logs().size(), 2U);
+                limits.runs == 10000 && limits.skipped == 0);
+    EXPECT_EQ(logs().size(), 3U);
+}
+
+// What cron asks for in vain has records where that is asked for.
+TEST_F(Records, OfWhatIsSkipped) {
+    fakes.now = at("2024-05-15 08:31"); // it is due at midnight
+    Task task = storedTask();
+    for (const char *const skipped : {"0", "1"}) {
+        writeFile("/usr/tavi/etc/run_records", std::string("[limits]\nskipped=") + skipped + "\n");
+        for (const int state : {1, 0}) {
+            task->state = state;
+            TAVISchedTaskEdit(task.get());
+            EXPECT_EQ(TAVISchedTaskRun(1, 1, 1), 0);
+            EXPECT_EQ(TAVISchedTaskRun(1, 2, 1), 0); // nobody's request
+        }
+    }
+    EXPECT_EQ(results(ofTask(1)), "39:0 41:0 ");
+    EXPECT_EQ(shell("test -s /tmp/sched_status.sqlite"), 1);
 }
 
 // ---- Trouble ----

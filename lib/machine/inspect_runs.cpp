@@ -69,8 +69,8 @@ void inspectRecordFile(const RecordFile &file, Inspection &inspection) {
 void inspectLimits(Inspection &inspection) {
     for (const std::string &fault : faultsOfRunLimits()) {
         inspection.add(std::string(kRunLimits) + ": " + fault,
-                       "mend it by hand; accepted are runs_per_task and runs in the section "
-                       "[limits], each a number above 0");
+                       "mend it by hand; accepted are, in the section [limits], runs_per_task and "
+                       "runs, each a number above 0, and skipped, 0 or 1");
     }
 }
 

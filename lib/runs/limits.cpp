@@ -13,7 +13,7 @@ namespace {
 
 using Faults = std::vector<std::string>;
 
-constexpr TAVI_SCHED_RUN_LIMITS kDefaults{.runsPerTask = 50, .runs = 10000};
+constexpr TAVI_SCHED_RUN_LIMITS kDefaults{.runsPerTask = 50, .runs = 10000, .skipped = 0};
 
 void readLimit(std::string_view key, std::string_view value, int32_t &limit, Faults &faults) {
     int32_t number = 0;
@@ -23,6 +23,14 @@ void readLimit(std::string_view key, std::string_view value, int32_t &limit, Fau
         return;
     }
     limit = number;
+}
+
+void readFlag(std::string_view key, std::string_view value, int32_t &flag, Faults &faults) {
+    if (value != "0" && value != "1") {
+        faults.push_back(std::string(key) + " is neither 0 nor 1: " + std::string(value));
+        return;
+    }
+    flag = value == "1" ? 1 : 0;
 }
 
 TAVI_SCHED_RUN_LIMITS read(Faults &faults) {
@@ -44,6 +52,8 @@ TAVI_SCHED_RUN_LIMITS read(Faults &faults) {
             readLimit(key, value, limits.runsPerTask, faults);
         } else if (key == "runs") {
             readLimit(key, value, limits.runs, faults);
+        } else if (key == "skipped") {
+            readFlag(key, value, limits.skipped, faults);
         } else {
             faults.push_back("there is no limit of the name " + std::string(key));
         }

@@ -148,7 +148,7 @@ void sched::Run::countWaiting() {
     }
 }
 
-void sched::Run::waitFor(int32_t taskId, unsigned int) {
+void sched::Run::waitFor(int32_t taskId) {
     const bool isFirst = record_.waitingSince == 0;
     if (isFirst) {
         record_.waitingSince = wallClock();

@@ -28,7 +28,7 @@ class Run final : private CommandWatch {
 
     // It met a running task, or 0 for the run lock, and is about to pause for up to so many
     // seconds.
-    void waitFor(int32_t taskId, unsigned int seconds);
+    void waitFor(int32_t taskId);
     // A person has asked it to end. Its waits end early then.
     bool isStopped() const;
     // The task is still the one that was asked to run: its id was not given to another.

@@ -114,22 +114,30 @@ std::vector<int64_t> missedTimes(const TAVI_SCHED_TASK &task, const Look &look, 
     return missed;
 }
 
-bool recordMissed(const TAVI_SCHED_TASK &task, int64_t due, const Look &look, RunRecords &records) {
-    const auto number = sched::claimRunNumber();
-    if (!number) {
-        return false;
-    }
+// What cron should have started, or asked for in vain; the rest of the record is the caller's.
+sched::RunRecord recordOf(const TAVI_SCHED_TASK &task, int32_t result) {
     sched::RunRecord record{};
-    record.run = *number;
     record.taskId = task.id;
     record.owner = task.owner;
     record.mode = 1;
-    record.result = due < look.settled * 1000 ? TAVI_SCHED_RUN_MISSED : sched::kAwaited;
+    record.result = result;
+    sched::copyText(record.name, sizeof record.name, task.name);
+    return record;
+}
+
+bool writeNumbered(sched::RunRecord &record, RunRecords &records) {
+    const auto number = sched::claimRunNumber();
+    record.run = number.value_or(0);
+    return number && records.write(record);
+}
+
+bool recordMissed(const TAVI_SCHED_TASK &task, int64_t due, const Look &look, RunRecords &records) {
+    const bool isSettled = due < look.settled * 1000;
+    sched::RunRecord record = recordOf(task, isSettled ? TAVI_SCHED_RUN_MISSED : sched::kAwaited);
     record.due = due;
     record.asked = due;
     record.ended = look.now * 1000;
-    sched::copyText(record.name, sizeof record.name, task.name);
-    return records.write(record);
+    return writeNumbered(record, records);
 }
 
 // What was awaited at an earlier look, by the schedule that there was then.
@@ -238,6 +246,25 @@ void sched::separateFromRemovedTask(int32_t id) {
 
 void sched::separateFromNewTask(int32_t id) {
     separate(id, true);
+}
+
+void sched::recordSkipped(const TAVI_SCHED_TASK &task, int32_t result) {
+    if (geteuid() != 0) {
+        return;
+    }
+    const KeptError error;
+    guarded(SCHED_SITE, [&] {
+        const TAVI_SCHED_RUN_LIMITS limits = readRunLimits();
+        if (limits.skipped == 1) {
+            RunRecords records(RunRecords::Mode::Write, {}, kPatience);
+            RunRecord record = recordOf(task, result);
+            record.asked = record.ended = std::time(nullptr) * 1000;
+            if (records && writeNumbered(record, records)) {
+                records.prune(limits, task.id);
+            }
+        }
+        return 0;
+    });
 }
 
 void sched::recordMissedRuns() {

@@ -128,6 +128,7 @@ bool hasFailed(int32_t result) {
     case TAVI_SCHED_RUN_RUNNING:
     case TAVI_SCHED_RUN_SUCCESS:
     case TAVI_SCHED_RUN_WAITING:
+    case TAVI_SCHED_RUN_NOT_DUE:
         return false;
     default:
         return true;

@@ -25,7 +25,8 @@ constexpr struct {
               {TAVI_SCHED_RUN_OWNER_UNKNOWN, "owner-unknown"},
               {TAVI_SCHED_RUN_TASK_REMOVED, "task-removed"},
               {TAVI_SCHED_RUN_TASK_DISABLED, "task-disabled"},
-              {TAVI_SCHED_RUN_MISSED, "missed"}};
+              {TAVI_SCHED_RUN_MISSED, "missed"},
+              {TAVI_SCHED_RUN_NOT_DUE, "not-due"}};
 
 } // namespace
 

@@ -192,7 +192,7 @@ std::optional<Run> findRun(int64_t run) {
 
 bool hasFailed(const Run &run) {
     return run.result != TAVI_SCHED_RUN_SUCCESS && run.result != TAVI_SCHED_RUN_NONE &&
-           !goesOn(run);
+           run.result != TAVI_SCHED_RUN_NOT_DUE && !goesOn(run);
 }
 
 int exitStatusOf(const Run &run) {

@@ -136,7 +136,9 @@ std::string resultInWords(const Run &run) {
     case TAVI_SCHED_RUN_TASK_REMOVED:
         return "not run: removed meanwhile";
     case TAVI_SCHED_RUN_TASK_DISABLED:
-        return "not run: disabled meanwhile";
+        return run.waitingSince != 0 ? "not run: disabled meanwhile" : "not run: disabled";
+    case TAVI_SCHED_RUN_NOT_DUE:
+        return "not run: not due";
     case TAVI_SCHED_RUN_MISSED:
         return "missed";
     default:

@@ -199,19 +199,12 @@ struct Full {
     bool isBatch;
 };
 
-int edited() {
-    TAVI_SCHED_TASK task{};
-    if (TAVISchedTaskGetByID(2, &task) != 0) {
-        return 1;
-    }
-    TAVISchedCTaskSetName(&task, "edited");
-    task.runHour = 7;
-    TAVISchedCTaskSetCommand(&task, std::string(9000, 'y').c_str());
-    return TAVISchedTaskEdit(&task) == 0 ? 0 : 1;
+int editedHere() {
+    return edited("edited", std::string(9000, 'y'));
 }
 
 int batch() {
-    return TAVISchedChangeBegin() == 0 && edited() == 0 && powerCreated() == 0 &&
+    return TAVISchedChangeBegin() == 0 && editedHere() == 0 && powerCreated() == 0 &&
                    TAVISchedTaskRemove(1) == 0 && TAVISchedChangeCommit() == 0
                ? 0
                : 1;
@@ -223,7 +216,7 @@ TEST_F(Durability, FullFileSystems) {
     std::vector<Full> cases;
     for (const char *const folder : {"/usr/tavi/etc", "/tmp", "/etc"}) {
         for (const bool inodes : {false, true}) {
-            cases.push_back({"edit", folder, inodes, edited, false});
+            cases.push_back({"edit", folder, inodes, editedHere, false});
             cases.push_back({"batch", folder, inodes, batch, true});
         }
     }

@@ -38,14 +38,8 @@ struct Operation {
     bool isPower = false;
 };
 
-int edited() {
-    TAVI_SCHED_TASK task{};
-    if (TAVISchedTaskGetByID(2, &task) != 0) {
-        return 1;
-    }
-    TAVISchedCTaskSetName(&task, "a name of quite another length than the one it had");
-    task.runHour = 7;
-    return TAVISchedTaskEdit(&task) == 0 ? 0 : 1;
+int editedHere() {
+    return edited("a name of quite another length than the one it had");
 }
 
 int saved() {
@@ -63,9 +57,9 @@ int saved() {
 }
 
 int batchDone() {
-    const bool changed = TAVISchedChangeBegin() == 0 && created("first") == 0 && edited() == 0 &&
-                         TAVISchedTaskRemove(1) == 0 && powerCreated() == 0 && saved() == 0 &&
-                         created("second") == 0;
+    const bool changed = TAVISchedChangeBegin() == 0 && created("first") == 0 &&
+                         editedHere() == 0 && TAVISchedTaskRemove(1) == 0 && powerCreated() == 0 &&
+                         saved() == 0 && created("second") == 0;
     return changed && TAVISchedChangeCommit() == 0 ? 0 : 1;
 }
 
@@ -85,7 +79,7 @@ int tool(std::vector<const char *> arguments) {
 std::vector<Operation> operations(const std::vector<std::string> &names = {}) {
     std::vector<Operation> all = {
         {"create", [] { return created("new"); }},
-        {"edit", edited},
+        {"edit", editedHere},
         {"remove", [] { return TAVISchedTaskRemove(2) == 0 ? 0 : 1; }},
         {"save", saved},
         {.name = "batch", .run = batchDone, .isBatch = true},

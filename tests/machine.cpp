@@ -127,6 +127,19 @@ int created(const char *name, const char *command) {
     return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
 }
 
+int edited(const char *name, const std::string &command) {
+    TAVI_SCHED_TASK task{};
+    if (TAVISchedTaskGetByID(2, &task) != 0) {
+        return 1;
+    }
+    TAVISchedCTaskSetName(&task, name);
+    task.runHour = 7;
+    if (!command.empty()) {
+        TAVISchedCTaskSetCommand(&task, command.c_str());
+    }
+    return TAVISchedTaskEdit(&task) == 0 ? 0 : 1;
+}
+
 int powerCreated(uint32_t hour) {
     const Task task = newTask();
     if (!task) {

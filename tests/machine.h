@@ -41,6 +41,8 @@ std::string listOfFreshProcess();
 
 // Stores a task of that name, a power-off schedule: 0 or 1.
 int created(const char *name, const char *command = "true");
+// Task 2 with another name, and a command when there is one.
+int edited(const char *name, const std::string &command = "");
 int powerCreated(uint32_t hour = 22);
 
 // The result of a function in a process of its own, its exit status.

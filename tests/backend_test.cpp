@@ -143,14 +143,16 @@ TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (PRE)"));
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (POST)"));
     EXPECT_THAT(lines, Contains(HasSubstr("30-writable skipped")));
+    // What goes wrong in a handler is not the error of a change that fails.
+    row_.edit = nullptr;
+    EXPECT_EQ(failure(TAVISchedTaskEdit(task.get())), 0x2000U);
 
     shell("rm /tmp/hooks /usr/tavi/etc/plugins/task_scheduler/20-ok");
     EXPECT_EQ(TAVISchedTaskRemove(1), 0);
     const std::string removed = "10-fails task_remove p";
     EXPECT_EQ(readFile(kSeen), removed + "re" + old + "\n" + removed + "ost" + old + "\n");
 
-    // A backend of its own: the hook fires for a creation that found none, after the fact, and what
-    // goes wrong in it is not the creation's error.
+    // A backend of its own: the hook fires for a creation that found none, after the fact.
     shell("rm /tmp/hooks");
     logs();
     TAVISchedCTaskSetBackend(task.get(), -1);

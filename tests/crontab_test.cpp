@@ -274,6 +274,7 @@ TEST_F(Crontab, WhenALineIsDue) {
         {"1-5/2,59 */12 1,31 feb-MAR 5-7 root x",
          {1ULL << 59 | 0x2A, 0x1001, 0x80000002, 0xC, 0x61}},
         {"5-3 23 */30 12 sun root x", {0, 0x800000, 0x80000002, 0x1000, 1}},
+        {"0 0 1 jan,mar,may,jul,sep,nov mon,wed,fri root x", {1, 1, 2, 0xAAA, 0x2A}},
         {"@daily root x", {}},
         {"A=b", {}},
         {"60 * * * * root x", {}},

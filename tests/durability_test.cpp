@@ -151,6 +151,7 @@ TEST_F(Durability, TornRecord) {
           std::string(record.size(), '\0'), record + "more"}) {
         start_->restore();
         writeFile(kRecord, left);
+        shell("touch /etc/crontab.cutOff; touch -d '100 seconds ago' " + std::string(kRecord));
         EXPECT_EQ(listOfFreshProcess().find("failed"), std::string::npos);
         EXPECT_EQ(stateNow(), old) << left.size();
         EXPECT_THAT(leftovers(), IsEmpty());

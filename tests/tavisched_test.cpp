@@ -341,9 +341,10 @@ TEST_F(CommandLine, AsksBeforeItRemoves) {
     };
     done("add --command x");
     for (const auto &c : kCases) {
-        EXPECT_THAT(listedIds(), ElementsAre(1));
-        shell(std::string("cd /tmp; rm -f said; { until grep -qs y/N said; do sleep 0.01; done; ") +
-              c.meanwhile + " >&2; echo " + c.answer +
+        ASSERT_THAT(listedIds(), ElementsAre(1));
+        shell("cd /tmp; rm -f said; { timeout 60 sh -c 'until grep -qs y/N said; do sleep 0.01; "
+              "done'; " +
+              std::string(c.meanwhile) + " >&2; echo " + c.answer +
               "; } | script -qfec '/usr/tavi/bin/tavisched remove 1' said > /dev/null 2>&1");
         EXPECT_THAT(readFile("/tmp/said"), HasSubstr(c.said));
     }

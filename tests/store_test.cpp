@@ -163,6 +163,21 @@ TEST_F(Store, StrangeWorkingCopiesAreRefused) {
     EXPECT_EQ(readFile("/etc/target"), planted);
 }
 
+// What is repaired lasts as what is changed does.
+TEST_F(Store, ARepairedTaskFileIsFlushed) {
+    storedTask();
+    unlink(kPersistent);
+    const char *const names[] = {"missing files", nullptr};
+    TAVI_SCHED_FINDING *finding = nullptr;
+    ASSERT_EQ(TAVISchedMachineCheckOf(names, &finding), 1);
+    fileCalls();
+    EXPECT_EQ(TAVISchedFindingRepair(finding), 0);
+    EXPECT_THAT(fileCalls(), ElementsAre(HasSubstr("fsync /usr/tavi/etc/scheduled_tasks."),
+                                         HasSubstr("rename /usr/tavi/etc/scheduled_tasks."),
+                                         "fsync /usr/tavi/etc"));
+    TAVISchedFindingListFree(&finding);
+}
+
 TEST_F(Store, AWorkingCopyWithASecondNameIsReadAndChanged) {
     storeIds("1");
     ASSERT_EQ(link(kWorking, "/tmp/second-name"), 0);

@@ -8,7 +8,6 @@ namespace {
 using namespace support;
 
 constexpr const char *kDatabase = "/tmp/sched_status.sqlite";
-constexpr const char *kWal = "/tmp/sched_status.sqlite-wal";
 
 class StatusDatabase : public SchedTest {
   protected:
@@ -148,8 +147,8 @@ TEST_F(StatusDatabase, ReadersMakeNothingAndBelieveNoOther) {
             EXPECT_EQ(TAVISchedDBListStatus(db_, -1, Taken::take, nullptr), 0);
             EXPECT_EQ(TAVISchedDBClose(db_), 0);
             EXPECT_EQ(readFile("/tmp/victim"), "safe\n");
-            for (const char *const name : {"/tmp/sched_status.sqlite-journal", kWal}) {
-                EXPECT_EQ(statusOf(name).st_mode, S_IFREG | 0600U) << name;
+            for (const std::string end : {"-journal", "-wal"}) {
+                EXPECT_EQ(statusOf((kDatabase + end).c_str()).st_mode, S_IFREG | 0600U) << end;
             }
         } else {
             EXPECT_EQ(shell("cd /tmp; ls | cmp - before"), 0) << found;

@@ -20,8 +20,10 @@ class Backend : public SchedTest {
     static void addHandler(const std::string &name, const std::string &end, mode_t mode = 0755) {
         const std::string path = kHandlers + name;
         shell(std::string("mkdir -p ") + kHandlers);
-        writeFile(path, "#!/bin/sh\necho ${0##*/} $1 $2 $RESULT ORG $ORG_TASK_ID $ORG_NAME "
-                        "$ORG_WEEK $ORG_BACKEND NEW $NEW_TASK_ID $NEW_BACKEND $NEW_STATE >> " +
+        writeFile(path, "#!/bin/sh\necho ${0##*/} $1 $2 $RESULT ORG $ORG_TASK_ID $ORG_BACKEND "
+                        "$ORG_OWNER $ORG_NAME $ORG_TYPE $ORG_APP $ORG_YEAR $ORG_MONTH "
+                        "$ORG_DAY $ORG_HOUR $ORG_MIN $ORG_REPEAT_HOUR $ORG_LAST_WORK_HOUR "
+                        "$ORG_WEEK NEW $NEW_TASK_ID $NEW_BACKEND $NEW_STATE >> " +
                             (kSeen + ("\n" + end)));
         chmod(path.c_str(), mode);
     }
@@ -114,17 +116,23 @@ TEST_F(Backend, ListsAddRowByRow) {
 }
 
 TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
-    Task task = newTask();
+    Task task = taskOf({"2024-05-08 09:00", Yearly, {2031, 2, 3}, {4, 5}, 6, 7, "1000001", ""});
     TAVISchedCTaskSetName(task.get(), std::string(40, 'n').c_str());
+    TAVISchedCTaskSetApp(task.get(), "a.b");
+    task->owner = 8;
+    for (const char *const callers : {"ORG_NAME", "NEW_STATE"}) {
+        setenv(callers, "not the change's", 1);
+    }
     addHandler("20-ok", "");
     addHandler("10-fails", "exit 3");
-    addHandler("30-writable", "", 0757);
+    addHandler("30-writable", "", 0775);
     addHandler("40-not-executable", "", 0644);
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     EXPECT_EQ(readFile(kSeen), ""); // a creation that a backend served has no hook
     TAVISchedCTaskSetState(task.get(), 0);
     EXPECT_EQ(TAVISchedTaskEdit(task.get()), 0);
-    const std::string old = " 0 ORG 1 " + std::string(31, 'n') + " 1111111 -2 NEW";
+    const std::string old =
+        " 0 ORG 1 -2 8 " + std::string(31, 'n') + " 4 a.b 2031 2 3 4 5 6 7 1000001 NEW";
     std::string edited;
     for (const char *call : {"10-fails task_edit pre", "20-ok task_edit pre",
                              "10-fails task_edit post", "20-ok task_edit post"}) {
@@ -135,10 +143,13 @@ TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (PRE)"));
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (POST)"));
     EXPECT_THAT(lines, Contains(HasSubstr("30-writable skipped")));
+    // What goes wrong in a handler is not the error of a change that fails.
+    row_.edit = nullptr;
+    EXPECT_EQ(failure(TAVISchedTaskEdit(task.get())), 0x2000U);
 
-    shell("rm /tmp/hooks /usr/tavi/etc/plugins/task_scheduler/10-fails");
+    shell("rm /tmp/hooks /usr/tavi/etc/plugins/task_scheduler/20-ok");
     EXPECT_EQ(TAVISchedTaskRemove(1), 0);
-    const std::string removed = "20-ok task_remove p";
+    const std::string removed = "10-fails task_remove p";
     EXPECT_EQ(readFile(kSeen), removed + "re" + old + "\n" + removed + "ost" + old + "\n");
 
     // A backend of its own: the hook fires for a creation that found none, after the fact.
@@ -147,8 +158,10 @@ TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
     TAVISchedCTaskSetBackend(task.get(), -1);
     TAVISchedCTaskSetID(task.get(), -1);
     EXPECT_EQ(failure(TAVISchedTaskSave(task.get())), 0x2000U);
-    EXPECT_EQ(readFile(kSeen), "20-ok task_create post -1 ORG NEW -1 -1 0\n");
+    EXPECT_EQ(readFile(kSeen), "10-fails task_create post -1 ORG NEW -1 -1 0\n");
     EXPECT_THAT(logs().front(), HasSubstr("No create backend (-1) is found for task [-1] "));
+    unsetenv("ORG_NAME");
+    unsetenv("NEW_STATE");
 }
 
 } // namespace

@@ -4,6 +4,7 @@
 #include <csignal>
 #include <cstring>
 #include <fcntl.h>
+#include <sys/resource.h>
 
 namespace {
 
@@ -76,11 +77,11 @@ TEST_F(Crontab, ForeignLinesOwnerAndModeStay) {
     writeFile(kCrontab, "# /tmp/tavischedtask lines go\n9 9 * * * root "
                         "/tmp/tavischedtask --run id=9\n" +
                             foreign);
-    chmod(kCrontab, 0640);
     const bool owned = chown(kCrontab, 0, 7) == 0;
+    chmod(kCrontab, 07640);
     EXPECT_EQ(TAVISchedTaskSync(), 0);
     EXPECT_EQ(readFile(kCrontab), foreign + "\n" + kOwnLine);
-    EXPECT_EQ(statusOf(kCrontab).st_mode & 07777, 0640U);
+    EXPECT_EQ(statusOf(kCrontab).st_mode & 07777, 07640U);
     EXPECT_TRUE(!owned || statusOf(kCrontab).st_gid == 7);
     // Without a task the last line stays as it is, and again once there is nothing left to drop.
     TAVISchedTaskRemove(1);
@@ -115,6 +116,12 @@ TEST_F(Crontab, CronIsSignalledWhenItRuns) {
     EXPECT_THAT(logs(true), ElementsAre(HasSubstr("tavischedule.cpp:245 Failed to hup crond.")));
 }
 
+void limitFiles(rlim_t bytes) {
+    const rlimit limit{bytes, RLIM_INFINITY};
+    signal(SIGXFSZ, bytes == RLIM_INFINITY ? SIG_DFL : SIG_IGN);
+    setrlimit(RLIMIT_FSIZE, &limit);
+}
+
 // A failed rewrite answers the number of tasks, and the change counts as done.
 TEST_F(Crontab, FailedRewritesKeepTheOldFile) {
     struct Case {
@@ -126,7 +133,8 @@ TEST_F(Crontab, FailedRewritesKeepTheOldFile) {
     const Case cases[] = {
         {[] { fakes.fsyncFails = true; }, 0x0B00, 231, true},
         {[] { fakes.renameFails = true; }, 0x2800, 240, true},
-        // A full disk shows when the lines are flushed.
+        // A full disk shows when the lines are flushed, or before, when there are many.
+        {[] { limitFiles(4096); }, 0x0B00, 225, true},
         {[] {
              shell("cp /etc/crontab /tmp; mount -n -t tmpfs -o size=16k small /etc; "
                    "cp /tmp/crontab /etc; dd if=/dev/zero of=/etc/filler bs=4k 2>/dev/null");
@@ -135,16 +143,19 @@ TEST_F(Crontab, FailedRewritesKeepTheOldFile) {
         {[] { shell("umount -n /etc; rm /etc/crontab; mkdir /etc/crontab"); }, 0x0900, 179, false},
         {[] { shell("rmdir /etc/crontab"); }, 0x1234, 7, false},
     };
-    storedTask();
-    storedTask();
+    TAVISchedChangeBegin();
+    for (int i = 0; i < 200; ++i) {
+        storedTask();
+    }
+    ASSERT_EQ(TAVISchedChangeCommit(), 0);
     const std::string crontab = readFile(kCrontab);
-    logs();
     for (const Case &c : cases) {
         SCOPED_TRACE(c.line);
         c.arrange();
         PLATCErrSetEx(0x1234, "before.cpp", 7);
-        EXPECT_EQ(SchedBackends[0].sync(), 2);
+        EXPECT_EQ(SchedBackends[0].sync(), 200);
         fakes = {};
+        limitFiles(RLIM_INFINITY);
         EXPECT_EQ(PLATCErrGet(), c.code);
         EXPECT_EQ(PLATCErrorGetLine(), c.line);
         EXPECT_THAT(logs(true), ElementsAre(HasSubstr("cpp:280 sync task list failed. [0x")));
@@ -263,6 +274,7 @@ TEST_F(Crontab, WhenALineIsDue) {
         {"1-5/2,59 */12 1,31 feb-MAR 5-7 root x",
          {1ULL << 59 | 0x2A, 0x1001, 0x80000002, 0xC, 0x61}},
         {"5-3 23 */30 12 sun root x", {0, 0x800000, 0x80000002, 0x1000, 1}},
+        {"0 0 1 jan,mar,may,jul,sep,nov mon,wed,fri root x", {1, 1, 2, 0xAAA, 0x2A}},
         {"@daily root x", {}},
         {"A=b", {}},
         {"60 * * * * root x", {}},

@@ -31,29 +31,35 @@ class Durability : public SchedTest {
 
 // ---- Order ----
 
+constexpr const char *kScratch = "/tmp/scheduled_tasks.tmp.";
+
+// "new" is what was not there before.
 std::string shown(const tracer::Call &call) {
-    const bool isTemporary = call.path.starts_with("/etc/crontab.");
-    return call.name.substr(0, 6) + " " + (isTemporary ? "/etc/crontab.*" : call.path);
+    std::string path = call.path;
+    for (const std::string temporary : {"/etc/crontab.", kScratch}) {
+        path = path.starts_with(temporary) ? temporary + "*" : path;
+    }
+    return call.name.substr(0, 6) + (fs::exists(call.path) ? " " : " new ") + path;
 }
 
 TEST_F(Durability, OrderOfFlushesAndRenames) {
     std::vector<std::string> order;
-    const auto run =
-        tracer::run([] { return created("new"); }, {},
-                    [&](const tracer::Call &call) {
-                        const bool isFlush =
-                            call.name == "fsync" || call.name.starts_with("rename");
-                        const bool overwrites = call.isPrograms && call.name == "openat" &&
-                                                (call.path == kPersistent || call.path == kWorking);
-                        if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
-                            order.push_back(shown(call));
-                        }
-                    });
+    const auto run = tracer::run(
+        [] { return created("new"); }, {},
+        [&](const tracer::Call &call) {
+            const bool isFlush = call.name == "fsync" || call.name.starts_with("rename");
+            const bool overwrites = call.isPrograms && call.name == "openat" &&
+                                    (call.path == kPersistent || call.path == kWorking ||
+                                     call.path.starts_with(kScratch));
+            if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
+                order.push_back(shown(call));
+            }
+        });
     EXPECT_EQ(run.status, 0);
     const std::string record = kRecord;
     EXPECT_THAT(order,
-                ElementsAre("fsync " + record, "fsync /usr/tavi/etc",
-                            std::string("openat ") + kPersistent,
+                ElementsAre("openat " + std::string(kScratch) + "*", "fsync " + record,
+                            "fsync /usr/tavi/etc", std::string("openat ") + kPersistent,
                             std::string("fsync ") + kPersistent, std::string("openat ") + kWorking,
                             "fsync /etc/crontab.*", "rename /etc/crontab.*", "fsync /etc",
                             "rename " + record, "fsync /usr/tavi/etc"));
@@ -145,6 +151,7 @@ TEST_F(Durability, TornRecord) {
           std::string(record.size(), '\0'), record + "more"}) {
         start_->restore();
         writeFile(kRecord, left);
+        shell("touch /etc/crontab.cutOff; touch -d '100 seconds ago' " + std::string(kRecord));
         EXPECT_EQ(listOfFreshProcess().find("failed"), std::string::npos);
         EXPECT_EQ(stateNow(), old) << left.size();
         EXPECT_THAT(leftovers(), IsEmpty());

@@ -40,7 +40,7 @@ TEST_F(Platform, SectionFilesAreNeverServedStale) {
 TEST_F(Platform, SectionFilesKeepWhatTheyDoNotChange) {
     const std::string head = "; comment\n[a]\n\njunk\n k = v \nk==[x]\n";
     writeFile("/etc/f", head + "[b]\nk=1\n[a]\nk=second");
-    chmod("/etc/f", 0604);
+    chmod("/etc/f", 07604);
     EXPECT_EQ(sectionOf("/etc/f", "a"), "1:=[x]");
     EXPECT_EQ(sectionOf("/etc/f", "c"), "0:");
     EXPECT_EQ(sectionOf("/etc/none", "a"), "-1:");
@@ -53,7 +53,7 @@ TEST_F(Platform, SectionFilesKeepWhatTheyDoNotChange) {
     EXPECT_EQ(PLATCFileRemoveSection("/etc/f", "b"), 1);
     EXPECT_EQ(PLATCFileRemoveSection("/etc/f", "b"), 0);
     EXPECT_EQ(readFile("/etc/f"), head + "[a]\nk=second\n[c]\nk= [b] \n");
-    EXPECT_EQ(statusOf("/etc/f").st_mode & 07777, 0604U);
+    EXPECT_EQ(statusOf("/etc/f").st_mode & 07777, 07604U);
     // What would not come back as it went in is not written.
     const Texts bad = {{"a=b", ""}, {"[k", ""}, {"", ""}, {"k\n", ""}, {"k", "1\n2"}};
     for (const auto &[key, value] : bad) {
@@ -156,6 +156,19 @@ TEST_F(Platform, SeveralSectionsChangeInOneWrite) {
     EXPECT_EQ(failure(edit("/tmp/f", {{"d", hash}})), 0x0900U);
     EXPECT_TRUE(S_ISLNK(statusOf("/etc/loop").st_mode) && S_ISLNK(statusOf("/tmp/f").st_mode));
     PLATCSzHashFree(hash);
+}
+
+// The first line that matches, and a time by which cron sees every change.
+TEST_F(Platform, LinesAreSetOneByOne) {
+    writeFile("/etc/f", "a x\nb x\nc x");
+    const Texts changes = {{"y", "y\nb x\nc x"}, {nullptr, "y\nc x"}, {nullptr, "y\n"}};
+    for (const auto &[line, expected] : changes) {
+        const time_t before = statusOf("/etc/f").st_mtim.tv_sec;
+        EXPECT_EQ(PLATCFileSetLine("/etc/f", "x", line), 1);
+        EXPECT_EQ(readFile("/etc/f"), expected);
+        EXPECT_GT(statusOf("/etc/f").st_mtim.tv_sec, before);
+    }
+    EXPECT_EQ(PLATCFileSetLine("/etc/f", "x", nullptr), 0);
 }
 
 TEST_F(Platform, WhatAHandSpoiltInASectionFileIsTold) {

@@ -134,6 +134,38 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     }
 }
 
+// Entries of every kind of writer: the time for which the clock is armed, and the times of the
+// crontab's line; with none for it, "" where that is no failure.
+TEST_F(Power, EntriesAsTheyAreApplied) {
+    const struct {
+        TAVIAUTOPOWER entry;
+        const char *alarm, *times;
+    } cases[] = {
+        {{1, 64, 9, 1}, "2024-03-30 09:01", "1\t9\t*\t*\t6"},
+        {{1, 64, 9, 0}, "2024-04-06 09:00", "0\t9\t*\t*\t6"},
+        {{1, 65, 9, 0}, "2024-03-31 09:00", "0\t9\t*\t*\t0,6"},
+        {{1, 127, 23, 59}, "2024-03-30 23:59", "59\t23\t*\t*\t*"},
+        {{1, 127, 24, 0}, nullptr, nullptr},
+        {{1, 127, 23, 60}, nullptr, nullptr},
+        {{1, 0, 7, 30}, nullptr, ""},
+        {{0, 127, 7, 30}, nullptr, ""},
+        {{2, 127, 7, 30}, nullptr, "30\t7\t*\t*\t*"},
+    };
+    setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1); // summer begins on Sunday, 31 March
+    tzset();
+    fakes.now = at("2024-03-30 09:00");
+    for (const auto &c : cases) {
+        writeFile(kCrontab, kForeignCrontab);
+        writeFile("/sys/class/rtc/rtc0/wakealarm", "");
+        for (const int kind : {TAVI_AUTOPOWER_KIND_ON, TAVI_AUTOPOWER_KIND_OFF}) {
+            EXPECT_EQ(TAVIAutoPowerConfSet(kind, 1, &c.entry), 0);
+        }
+        EXPECT_EQ(row_.sync(), c.times ? 0 : -1);
+        EXPECT_EQ(alarm(), c.alarm ? "0\n" + std::to_string(at(c.alarm)) + "\n" : "0\n");
+        EXPECT_EQ(readFile(kCrontab), kForeignCrontab + (c.times && *c.times ? line(c.times) : ""));
+    }
+}
+
 // No configuration and no cron is one thing; not being able to tell is another.
 TEST_F(Power, WhatCannotBeLookedAtIsNotTakenForMissing) {
     TAVIAUTOPOWER entry{1, 127, 7, 30};

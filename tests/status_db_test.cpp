@@ -137,7 +137,7 @@ TEST_F(StatusDatabase, ReadersMakeNothingAndBelieveNoOther) {
                  {"touch $d", 0}, // the first runner is about to fill it
                  {"ln -s /tmp/other $d", -1},
                  {"cp other $d; chmod 666 $d", -1},
-                 {"cp other $d; ln -s victim $d-journal", 1}};
+                 {"cp other $d; ln -s victim $d-journal; ln -s victim $d-wal", 1}};
     EXPECT_EQ(TAVISchedDBClose(db_), 0);
     shell("mv /tmp/sched_status.sqlite /tmp/other; echo safe > /tmp/victim");
     for (const auto &[found, result] : cases) {
@@ -147,7 +147,9 @@ TEST_F(StatusDatabase, ReadersMakeNothingAndBelieveNoOther) {
             EXPECT_EQ(TAVISchedDBListStatus(db_, -1, Taken::take, nullptr), 0);
             EXPECT_EQ(TAVISchedDBClose(db_), 0);
             EXPECT_EQ(readFile("/tmp/victim"), "safe\n");
-            EXPECT_EQ(statusOf("/tmp/sched_status.sqlite-journal").st_mode, S_IFREG | 0600U);
+            for (const std::string end : {"-journal", "-wal"}) {
+                EXPECT_EQ(statusOf((kDatabase + end).c_str()).st_mode, S_IFREG | 0600U) << end;
+            }
         } else {
             EXPECT_EQ(shell("cd /tmp; ls | cmp - before"), 0) << found;
         }
@@ -191,7 +193,10 @@ TEST_F(StatusDatabase, WhatOthersPutThereIsNotFollowed) {
     ASSERT_NE(db_, nullptr);
     addRow("a", 1);
     EXPECT_EQ(readFile("/tmp/victim"), "safe");
-    EXPECT_EQ(statusOf(kDatabase).st_mode, S_IFREG | 0600U);
+    // The journal stays when it is done: its name is never free.
+    for (const char *const name : {kDatabase, "/tmp/sched_status.sqlite-journal"}) {
+        EXPECT_EQ(statusOf(name).st_mode, S_IFREG | 0600U) << name;
+    }
     if (chown(kDatabase, 4242, 4242) == 0) { // another user's database
         EXPECT_EQ(query("SELECT * FROM task_status"), "");
     }

@@ -96,16 +96,18 @@ TEST_F(Store, ChangesOfATask) {
     TAVISchedCTaskSetName(task.get(), "");
     EXPECT_EQ(TAVISchedTaskSave(task.get()), 0);
     EXPECT_STREQ(task->name, "Task 1");
-    TAVISchedCTaskSetID(task.get(), 42);
+    TAVISchedCTaskSetID(task.get(), -2);
     EXPECT_EQ(SchedBackends[0].edit(task.get()), 0); // an unknown id is added
-    EXPECT_THAT(listedIds(), ElementsAre(1, 42));
+    EXPECT_EQ(TAVISchedTaskSave(task.get()), 0);     // -1 alone is a new task
+    EXPECT_THAT(listedIds(), ElementsAre(-2, 1));
+    EXPECT_EQ(failure(TAVISchedTaskLoad(-2, task.get())), 0x0D00U);
     EXPECT_EQ(TAVISchedTaskRemove(1), 0);
-    EXPECT_THAT(listedIds(), ElementsAre(42));
+    EXPECT_THAT(listedIds(), ElementsAre(-2));
     const std::string crontab = readFile(kCrontab);
     writeFile(kCrontab, crontab + "# later\n");
     EXPECT_EQ(SchedBackends[0].remove(1), 0);
     EXPECT_EQ(readFile(kCrontab), crontab + "# later\n"); // nothing removed, no rewrite
-    EXPECT_EQ(SchedBackends[0].remove(42), 1);
+    EXPECT_EQ(SchedBackends[0].remove(-2), 1);
     EXPECT_EQ(readFile(kCrontab), std::string(kForeignCrontab) + "# later\n");
 }
 
@@ -159,6 +161,21 @@ TEST_F(Store, StrangeWorkingCopiesAreRefused) {
     ASSERT_EQ(symlink("/etc/target", kWorking), 0);
     expectRefused();
     EXPECT_EQ(readFile("/etc/target"), planted);
+}
+
+// What is repaired lasts as what is changed does.
+TEST_F(Store, ARepairedTaskFileIsFlushed) {
+    storedTask();
+    unlink(kPersistent);
+    const char *const names[] = {"missing files", nullptr};
+    TAVI_SCHED_FINDING *finding = nullptr;
+    ASSERT_EQ(TAVISchedMachineCheckOf(names, &finding), 1);
+    fileCalls();
+    EXPECT_EQ(TAVISchedFindingRepair(finding), 0);
+    EXPECT_THAT(fileCalls(), ElementsAre(HasSubstr("fsync /usr/tavi/etc/scheduled_tasks."),
+                                         HasSubstr("rename /usr/tavi/etc/scheduled_tasks."),
+                                         "fsync /usr/tavi/etc"));
+    TAVISchedFindingListFree(&finding);
 }
 
 TEST_F(Store, AWorkingCopyWithASecondNameIsReadAndChanged) {

@@ -114,7 +114,7 @@ struct When {
     const char *now;
     int type;
     uint32_t start[3], run[2], every, last;
-    const char *week, *expected;
+    const char *week, *expected = "";
 };
 // The row's task, new; the row's moment becomes the present.
 Task taskOf(const When &row);

@@ -52,8 +52,12 @@ class CommandLine : public SchedTest {
     }
     // The state of everything that a refused command must leave alone.
     static std::string machine() {
-        return readFile(kPersistent) + "|" + readFile(kWorking) + "|" + readFile(kCrontab) + "|" +
-               readFile("/usr/tavi/etc/auto_power");
+        std::string all;
+        for (const char *const path :
+             {kPersistent, kWorking, kCrontab, "/usr/tavi/etc/auto_power"}) {
+            all += readFile(path) + "|" + std::to_string(statusOf(path).st_mode) + "|";
+        }
+        return all;
     }
 
     static inline pid_t cron_ = 0;
@@ -227,6 +231,10 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
     EXPECT_THAT(readFile(kWorking), Not(HasSubstr("2099")));
     done("remove 2 --yes");
     EXPECT_THAT(listedIds(), ElementsAre(1));
+    // More of a kind than the library reads.
+    shell("awk 'BEGIN { print \"[power off]\"; for (i = 0; i < 100; i++) "
+          "printf \"%03d=1 1 %d %d\\n\", i, i / 60, i % 60 }' > /usr/tavi/etc/auto_power");
+    EXPECT_THAT(run("add --power off --at 05:00"), HasSubstr("100 power schedules of this kind"));
     // Beside a damaged entry the library would store and then fail.
     writeFile("/usr/tavi/etc/auto_power", "[power off]\n000=1 9 99 99\n");
     for (const char *const change : {"add --power off", "sync", "export"}) {
@@ -307,6 +315,7 @@ TEST_F(CommandLine, ChangesFollowOneAnother) {
 TEST_F(CommandLine, TakesBackAChangeOfSeveralTasks) {
     done("add --command x");
     done("add --command y");
+    shell("chmod 1640 /tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks");
     const std::string before = machine();
     shell(
         "mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
@@ -319,6 +328,29 @@ TEST_F(CommandLine, TakesBackAChangeOfSeveralTasks) {
     EXPECT_EQ(machine(), before);
     shell("while umount -n /etc/crontab; do :; done 2>/dev/null; rm -r /usr/tavi/etc/plugins");
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
+}
+
+// What was shown must still be true when the answer comes.
+TEST_F(CommandLine, AsksBeforeItRemoves) {
+    const struct {
+        const char *meanwhile, *answer, *said;
+    } kCases[] = {
+        {"true", "", "Nothing was removed."},
+        {"true", "n", "Nothing was removed."},
+        {"/usr/tavi/bin/tavisched edit 1 --at 05:00", "y",
+         "it has changed meanwhile: task 1 (Task "},
+        {"true", "y", "task 1 (Task 1): removed"},
+    };
+    done("add --command x");
+    for (const auto &c : kCases) {
+        ASSERT_THAT(listedIds(), ElementsAre(1));
+        shell("cd /tmp; rm -f said; { timeout 60 sh -c 'until grep -qs y/N said; do sleep 0.01; "
+              "done'; " +
+              std::string(c.meanwhile) + " >&2; echo " + c.answer +
+              "; } | script -qfec '/usr/tavi/bin/tavisched remove 1' said > /dev/null 2>&1");
+        EXPECT_THAT(readFile("/tmp/said"), HasSubstr(c.said));
+    }
+    EXPECT_THAT(listedIds(), IsEmpty());
 }
 
 TEST_F(CommandLine, ShowsTasksForScripts) {
@@ -583,19 +615,20 @@ TEST_F(CommandLine, ImportsAllOrNothing) {
 }
 
 TEST_F(CommandLine, RunsNowAndFollows) {
-    done("add --command 'echo $HOME > /tmp/ran'");
+    done("add --command 'echo $HOME $TZ $(umask) > /tmp/ran'");
     done("add --command 'exit 3'");
     done("add --command 'kill -9 $$'");
     // What it leaves behind is not waited for, nor taken for it.
     done("add --command 'sleep 1000 & /usr/tavi/bin/tavisched run 5; sleep 1.5' --disabled");
     done("add --command true --disabled");
     done("add --command true");
-    EXPECT_EQ(run("run 1 2 3 4 --wait"),
+    EXPECT_EQ(run("run 1 2 3 4 --wait", "umask 077; TZ=Asia/Tokyo "),
               "task 1 (Task 1): started\ntask 2 (Task 2): started\ntask 3 (Task 3): started\n"
               "task 4 (Task 4): started\ntask 1 (Task 1): ok\ntask 2 (Task 2): exit 3\n"
               "task 3 (Task 3): killed by signal 9\ntask 5 (Task 5): started\n"
               "task 4 (Task 4): ok\n");
     EXPECT_EQ(status_, 3);
+    EXPECT_EQ(readFile("/tmp/ran"), "/root 0022\n"); // nothing of the caller's
     run("run 3 --wait");
     EXPECT_EQ(status_, 128 + 9);
     EXPECT_EQ(done("run 1"), "task 1 (Task 1): started\n");

@@ -22,21 +22,6 @@ std::string sectionOf(const char *path, const std::string &name) {
     return result;
 }
 
-// A rewrite of the same length in the same tick of the file clock must show at once. Kernels that
-// refine the times of a file that is looked at do not do so in a ramfs.
-TEST_F(Platform, SectionFilesAreNeverServedStale) {
-    ASSERT_EQ(shell("mount -n -t ramfs ram /home"), 0);
-    for (int i = 1000; i < 3000; ++i) {
-        const std::string value = std::to_string(i);
-        writeFile("/home/f", "[a]\nk=" + value + "\n[b]\nk=x\n");
-        if (i % 500 == 0) {
-            shell("sleep 0.02"); // old enough to be remembered
-        }
-        EXPECT_EQ(sectionOf("/home/f", "a"), "1:" + value);
-    }
-    shell("umount -n /home");
-}
-
 TEST_F(Platform, SectionFilesKeepWhatTheyDoNotChange) {
     const std::string head = "; comment\n[a]\n\njunk\n k = v \nk==[x]\n";
     writeFile("/etc/f", head + "[b]\nk=1\n[a]\nk=second");

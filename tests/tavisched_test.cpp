@@ -277,14 +277,6 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
                 HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n"));
 }
 
-TEST_F(CommandLine, FiftyAtOnceLoseNothing) {
-    EXPECT_EQ(shell("for i in $(seq 50); do /usr/tavi/bin/tavisched add --command x -q & done "
-                    "> /tmp/ids; wait; [ \"$(sort -un /tmp/ids | wc -l)\" = 50 ]"),
-              0);
-    EXPECT_EQ(listedIds().size(), 50U);
-    EXPECT_THAT(done("check"), HasSubstr("All is well."));
-}
-
 TEST_F(CommandLine, ChangesFollowOneAnother) {
     done("add --command x");
     done("add --command x");

@@ -1,7 +1,7 @@
 #!/bin/bash
 # Runs clang-tidy on one source; nothing is printed but what it finds. The target "tidy" starts it.
 #
-#   tests/static_analysis.sh CLANG_TIDY BUILD_FOLDER SOURCE STAMP
+#   cmake/static_analysis.sh CLANG_TIDY BUILD_FOLDER SOURCE STAMP
 set -euo pipefail
 commands=$2/tidy/compile_commands.json
 mkdir -p "${4%/*}"

@@ -21,7 +21,7 @@ function(analyse_folder folder)
             file(GLOB rules ${folder}/.clang-tidy)
             add_custom_command(OUTPUT ${stamp} VERBATIM
                 COMMENT "clang-tidy ${name}"
-                COMMAND ${PROJECT_SOURCE_DIR}/tests/static_analysis.sh
+                COMMAND ${PROJECT_SOURCE_DIR}/cmake/static_analysis.sh
                     ${CLANG_TIDY} ${PROJECT_BINARY_DIR} ${file} ${stamp}
                 DEPENDS ${objects}/CMakeFiles/${target}.dir/${source}.o ${CLANG_TIDY}
                     ${PROJECT_SOURCE_DIR}/.clang-tidy ${rules})

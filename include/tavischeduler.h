@@ -575,7 +575,8 @@ typedef struct TAVI_SCHED_RUN_FILTER {
     int64_t since;      /* asked at that moment or later */
 } TAVI_SCHED_RUN_FILTER;
 
-/* Is handed one record, which is gone after the call; anything but 0 ends the list. */
+/* Is handed one record, which is gone after the call; anything but 0 ends the list. It must start
+ * no run: that would share the open database. */
 typedef int (*TAVI_SCHED_RUN_READER)(void *pContext, const TAVI_SCHED_RUN *pRun);
 /* Hands the runs that the filter (NULL: all) keeps to the reader, the newest first, one at a time:
  * nothing of the database is held while the reader works. Returns how many it was handed, 0 where

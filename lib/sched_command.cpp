@@ -219,8 +219,13 @@ int waitForShell(pid_t pid, Output &output, int report) {
         const int status = base::waitForChild(pid);
         return reported == 1 ? -1 : status;
     }
-    watching->begun(pid, std::move(output.reading));
-    const int status = watching->wait(pid);
+    int status = -1;
+    try {
+        watching->begun(pid, std::move(output.reading));
+        status = watching->wait(pid);
+    } catch (const std::bad_alloc &) { // the command runs on, unwatched
+        status = base::waitForChild(pid);
+    }
     return reported == 1 ? -1 : status;
 }
 

@@ -4,6 +4,19 @@
 #include "sched_handle.h"
 #include "tavischeduler.h"
 
+namespace {
+
+int listOf(size_t row, sched::TaskList &tasks, TAVI_SCHED_FILTER filter) {
+    const int count = SchedBackends[row].list_get(tasks.address(), filter);
+    if (count < 0) {
+        SCHED_LOG("Failed to list_get for backend [%d] [0x%04X %s:%d]", static_cast<int>(row),
+                  SCHED_LAST_ERROR);
+    }
+    return count;
+}
+
+} // namespace
+
 int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) {
     SCHED_REQUIRE(pTaskList, "((void *)0) != pTaskList", -1);
     sched::TaskList tasks;
@@ -15,10 +28,8 @@ int TAVISchedTaskListGet(TAVI_SCHED_TASK **pTaskList, TAVI_SCHED_FILTER filter) 
     const auto rows = sched::registeredBackends();
     for (size_t row = 0; row < rows.size(); ++row) {
         if (rows[row].list_get) {
-            const int result = rows[row].list_get(tasks.address(), filter);
+            const int result = listOf(row, tasks, filter);
             if (result < 0) {
-                SCHED_LOG("Failed to list_get for backend [%d] [0x%04X %s:%d]",
-                          static_cast<int>(row), SCHED_LAST_ERROR);
                 continue;
             }
             count = result;
@@ -43,7 +54,7 @@ int TAVISchedTaskListGetOf(int32_t backend, TAVI_SCHED_TASK **pTaskList, TAVI_SC
         return -1;
     }
     sched::TaskList tasks;
-    const int count = SchedBackends[*row].list_get(tasks.address(), filter);
+    const int count = listOf(*row, tasks, filter);
     if (count > 0) {
         *pTaskList = tasks.release();
     }

@@ -15,7 +15,7 @@ using sched::Field;
 using sched::FieldKind;
 
 // Number rows compare where the fields lie in memory, as 32-bit numbers, and not their values. This
-// is kept: the order of the crontab's lines and of the lists that callers show is defined by it.
+// is kept: the order of the lists that callers show is defined by it.
 template <typename Number> Number position(const Field &field, const TAVI_SCHED_TASK *task) {
     return static_cast<Number>(reinterpret_cast<uintptr_t>(task) + field.offset);
 }

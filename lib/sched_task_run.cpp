@@ -184,11 +184,11 @@ class TaskRun {
     void perform() {
         Admission admission = Admission::Wait;
         while (admission == Admission::Wait && !run_.isStopped()) {
-            admission = tryAdmission();
+            admission = isStillToRun() ? tryAdmission() : Admission::Refused;
         }
         if (run_.isStopped()) {
             outcome_ = TAVI_SCHED_RUN_STOPPED_BY_USER;
-        } else if (admission == Admission::Granted && isStillToRun() && record() && execute()) {
+        } else if (admission == Admission::Granted && record() && execute()) {
             storeResult();
         }
         database_.reset();
@@ -284,8 +284,8 @@ class TaskRun {
         return pause(seconds, running.taskId);
     }
 
-    // What waited reads its task once more: it may be gone, disabled or another by now. One that
-    // cannot be read is run as it was.
+    // What waited reads its task once more: it may be gone, disabled or another by now, and is then
+    // admitted as that. One that cannot be read is run as it was.
     bool isStillToRun() {
         const auto row =
             waits_ == 0 ? std::nullopt
@@ -294,7 +294,10 @@ class TaskRun {
             return true;
         }
         auto present = sched::allocateTask();
-        const int found = present ? SchedBackends[*row].get_by_id(task_.id, present.get()) : -1;
+        if (!present) {
+            return true;
+        }
+        const int found = SchedBackends[*row].get_by_id(task_.id, present.get());
         if (found == 0 || present->state == TAVI_SCHED_STATE_NOT_EXISTED ||
             !run_.isOfPresentTask()) {
             outcome_ = TAVI_SCHED_RUN_TASK_REMOVED;
@@ -377,7 +380,7 @@ class TaskRun {
                              base::Descriptor connection) {
     TAVISchedRandInit();
     sched::guarded(SCHED_SITE, [&] {
-        sched::closeCallersDescriptors(connection);
+        sched::leaveCaller(connection);
         TaskRun run(task, origin);
         run.perform();
         connection.close();

@@ -7,25 +7,14 @@
 
 #include <algorithm>
 
-namespace {
-
-// Years of four digits, which is what dates are made for.
-constexpr int64_t kEndOfTime = 253402300800;
-
-int64_t inTime(int64_t moment) {
-    return std::clamp<int64_t>(moment, 0, kEndOfTime);
-}
-
-} // namespace
-
 // Leap days are eight years apart at most, and clocks do not skip the same time every year.
 std::optional<int64_t> sched::findNextStart(const TAVI_SCHED_TASK &task, int64_t from) {
     constexpr int64_t kLongestWait = 10 * 366 * kDay;
     tzset();
-    from = inTime(from);
+    from = sched::inTime(from);
     const int64_t begin = std::max(from, secondsOf(Days(task).first()));
     std::optional<int64_t> next;
-    forEachStart(task, from, inTime(begin + kLongestWait), [&](int64_t moment) {
+    forEachStart(task, from, sched::inTime(begin + kLongestWait), [&](int64_t moment) {
         next = moment;
         return false;
     });
@@ -39,7 +28,7 @@ int TAVISchedTaskStarts(const TAVI_SCHED_TASK *pTask, int64_t from, int64_t unti
     SCHED_REQUIRE(cMax > 0, "0 < cMax", -1);
     tzset();
     size_t count = 0;
-    sched::forEachStart(*pTask, inTime(from), inTime(until), [&](int64_t moment) {
+    sched::forEachStart(*pTask, sched::inTime(from), sched::inTime(until), [&](int64_t moment) {
         rgStarts[count++] = moment;
         return count < cMax;
     });

@@ -1,6 +1,7 @@
 // Several changes as one.
 #include "support.h"
 
+#include <array>
 #include <sstream>
 
 namespace {
@@ -181,8 +182,36 @@ TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     waitpid(child, &status, 0);
     EXPECT_EQ(status, 0);
     EXPECT_THAT(logs(), Contains(HasSubstr("a change waits for this process")));
+    // One that waits for the end of the batch changes tasks like any other process.
+    std::array<int, 2> ends{};
+    ASSERT_EQ(pipe(ends.data()), 0);
+    const pid_t later = fork();
+    if (later == 0) {
+        char byte = 0;
+        const bool read = ::read(ends[0], &byte, 1) == 1;
+        _exit(read && TAVISchedTaskCreate(newTask().get()) == 0 ? 0 : 1);
+    }
     EXPECT_EQ(TAVISchedChangeCommit(), 0);
-    EXPECT_THAT(listedIds(), ElementsAre(1, 2));
+    EXPECT_EQ(write(ends[1], "x", 1), 1);
+    waitpid(later, &status, 0);
+    EXPECT_EQ(status, 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
+    close(ends[0]);
+    close(ends[1]);
+}
+
+// A filter may change what is listed.
+TEST_F(Batch, ListsWhileItGrows) {
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    const Task second = storedTask();
+    TAVI_SCHED_TASK *list = nullptr;
+    const auto filter = [](TAVI_SCHED_TASK *task) {
+        return task->id == 2 && TAVISchedTaskCreate(newTask().get()) != 0 ? 0 : 1;
+    };
+    EXPECT_EQ(TAVISchedTaskListGet(&list, filter), 2);
+    TAVISchedTaskListFree(&list);
+    EXPECT_EQ(TAVISchedChangeCommit(), 0);
+    EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
 }
 
 TEST_F(Batch, NewTasksUnderGivenIds) {

@@ -56,6 +56,14 @@ TEST_F(Crontab, LinesOfTasks) {
         EXPECT_EQ(readFile(kCrontab), kForeignCrontab); // a disabled task has none
         EXPECT_EQ(TAVISchedTaskRemove(1), 0);
     }
+    // The days behind the end of a short mask are not those of the task before.
+    for (const char *const week : {"0000000", "1"}) {
+        Task task = newTask();
+        TAVISchedCTaskSetWeekly(task.get());
+        TAVISchedCTaskSetWeek(task.get(), week);
+        ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    }
+    EXPECT_THAT(readFile(kCrontab), HasSubstr("0\t0\t*\t*\t0,1,2,3,4,5,6\troot"));
 }
 
 TEST_F(Crontab, ALineNeedsRoomForItsEnd) {

@@ -618,6 +618,7 @@ TEST_F(Records, ManyAtOnce) {
 #else
     constexpr int kMany = 200;
 #endif
+    fakes.pauseMicroseconds = 3000; // a locked status database is waited for
     Task task = newTask("echo $TAVI_RUN_ID");
     TAVISchedCTaskSetCanRunTaskSameTime(task.get(), 1);
     writeFile("/usr/tavi/etc/run_records", "[limits]\nruns_per_task=1000\n");

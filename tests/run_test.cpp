@@ -248,10 +248,13 @@ TEST_F(Run, FollowedToItsEnd) {
     std::array<int, 2> callers{};
     ASSERT_EQ(pipe2(callers.data(), O_NONBLOCK), 0);
     close(STDIN_FILENO);
+    signal(SIGUSR1, [](int) {});
     EXPECT_EQ(TAVISchedTaskRunFollowed(1, 0, 0, &pid, &end), 0);
+    signal(SIGUSR1, SIG_DFL);
     EXPECT_EQ(dup2(input, STDIN_FILENO), STDIN_FILENO);
     close(input);
     const int fifo = open("/tmp/fifo", O_WRONLY); // the command runs
+    EXPECT_EQ(signals(std::to_string(pid), "SigCgt") & 1ULL << (SIGUSR1 - 1), 0U);
     close(callers[1]);
     EXPECT_EQ(read(callers[0], &pid, 1), 0);
     close(callers[0]);

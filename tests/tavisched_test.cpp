@@ -745,7 +745,8 @@ TEST_F(CommandLine, DoesWithoutRecords) {
     shell("rm -rf /var/lib/tavischeduler/*; mkdir /var/lib/tavischeduler/runs.sqlite");
     EXPECT_THAT(run("run 1 --wait"), HasSubstr("(Task 1): exit 3, and not recorded; "));
     EXPECT_EQ(status_, 3);
-    EXPECT_THAT(run("list"), AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 1")));
+    EXPECT_THAT(run("list"),
+                AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 1")));
     EXPECT_THAT(run("check"), HasSubstr("runs.sqlite is no file"));
     for (const char *const command : {"history", "log 1", "stop 1", "run --missed"}) {
         EXPECT_THAT(run(command), HasSubstr("; see \"tavisched check\"")) << command;
@@ -870,7 +871,8 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "task_scheduler/b is skipped: it is not executable", false},
         {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler", "all plug-in handlers are skipped",
          false},
-        {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler_run", "task_scheduler_run must", false},
+        {"mkdir -pm 777 /usr/tavi/etc/plugins/task_scheduler_run", "task_scheduler_run must",
+         false},
         {"chmod 711 /var/lib/tavischeduler", "/var/lib/tavischeduler, where runs", true},
         {"chown bin /var/lib/tavischeduler/runs.sqlite", "runs.sqlite, where runs", true},
         {"rm /var/lib/tavischeduler/runs.sqlite-*; echo no database > "

@@ -1,6 +1,7 @@
 // The task sections that a batch has changed.
 #include "staged_tasks.h"
 
+#include <algorithm>
 #include <charconv>
 
 namespace sched {
@@ -26,18 +27,27 @@ PLATCSZHASH *StagedTasks::find(std::string_view section) const {
 }
 
 // A section that is stored again after its removal comes last.
-void StagedTasks::touch(const std::string &section) {
-    if (stateOf(section) == State::Removed) {
-        std::erase(order_, section);
-    }
-    if (stateOf(section) != State::Stored) {
+// Whatever fails here leaves the section as it was.
+std::unique_ptr<Hash> &StagedTasks::touch(const std::string &section) {
+    const State state = stateOf(section);
+    if (state != State::Stored) {
         order_.push_back(section);
+    }
+    try {
+        auto &form = forms_[section];
+        if (state == State::Removed) {
+            order_.erase(std::find(order_.begin(), order_.end(), section));
+        }
+        return form;
+    } catch (...) {
+        order_.pop_back();
+        throw;
     }
 }
 
 void StagedTasks::store(const std::string &section, int32_t id, std::unique_ptr<Hash> form) {
-    touch(section);
-    forms_[section] = std::move(form);
+    auto &place = touch(section);
+    place = std::move(form);
     if (ids) {
         ids->remove(section);
         ids->add(section, id);
@@ -45,8 +55,7 @@ void StagedTasks::store(const std::string &section, int32_t id, std::unique_ptr<
 }
 
 void StagedTasks::remove(const std::string &section) {
-    touch(section);
-    forms_[section] = nullptr;
+    touch(section) = nullptr;
     if (ids) {
         ids->remove(section);
     }

@@ -37,7 +37,7 @@ class StagedTasks {
     std::optional<Ids> ids;
 
   private:
-    void touch(const std::string &section);
+    std::unique_ptr<Hash> &touch(const std::string &section);
 
     std::map<std::string, std::unique_ptr<Hash>, std::less<>> forms_; // null: removed
     std::vector<std::string> order_;

@@ -81,10 +81,12 @@ bool isThere(const char *path, bool &unreadable) {
     return found != base::Found::Nothing && !unreadable;
 }
 
-// What a look-up finds before it reads: enumerations that a section does not name stay as they are.
+// What a look-up finds before it reads: enumerations that a section does not name stay as they are,
+// and so do the days behind the end of a short mask.
 void makeFresh(TAVI_SCHED_TASK &task) {
     task.state = 0;
     task.type = 0;
+    std::fill(std::begin(task.week), std::end(task.week), '\0');
 }
 
 // One pass, from section to section.
@@ -102,12 +104,13 @@ class Pass {
         return staged.stateOf(name) == sched::StagedTasks::State::Removed ||
                take(name, stagedForm ? stagedForm : form);
     }
+    // What is handed over may change what is staged.
     bool takeStaged() {
-        return std::all_of(staged.order().begin(), staged.order().end(),
-                           [&](const std::string &name) {
-                               PLATCSZHASH *const form = staged.find(name);
-                               return !form || stored_.contains(name) || take(name.c_str(), form);
-                           });
+        const std::vector<std::string> names = staged.order();
+        return std::all_of(names.begin(), names.end(), [&](const std::string &name) {
+            PLATCSZHASH *const form = staged.find(name);
+            return !form || stored_.contains(name) || take(name.c_str(), form);
+        });
     }
     bool isOutOfMemory() const { return isOutOfMemory_; }
 
@@ -545,12 +548,12 @@ int readStoredTask(int32_t id, TAVI_SCHED_TASK *task) {
 }
 
 int nextFreeId(int32_t *id) {
+    StagedTasks::Ids gathered;
     try {
         if (staged.ids) {
             *id = smallestFreeId(staged.ids->used);
             return 0;
         }
-        StagedTasks::Ids gathered;
         if (gatherIds(gathered) != 0) {
             return -1;
         }
@@ -562,7 +565,7 @@ int nextFreeId(int32_t *id) {
     } catch (const std::exception &) {
         setOwnError(kTaskOutOfMemory, SCHED_OWN_SITE);
         SCHED_LOG_AT(321, "Alloc id slot failed. num:[%d] [0x%04X %s:%d]",
-                     static_cast<int>(staged.order().size()), SCHED_LAST_ERROR);
+                     static_cast<int>(gathered.bySection.size()), SCHED_LAST_ERROR);
         return -1;
     }
 }

@@ -5,7 +5,6 @@
 #include "change_record.h"
 #include "sched_hook.h"
 
-
 namespace sched {
 
 // A backend's part in a batch. Every function answers 0 or -1, with error and log line.

@@ -9,6 +9,7 @@
 #include "sched_paths.h"
 
 #include <cerrno>
+#include <pthread.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -106,10 +107,27 @@ int sched::takeBackCutOffChange() {
     return result;
 }
 
+namespace {
+
+// A child has no part in its parent's change.
+void forgetInChild() {
+    recorded = false;
+    openChanges = 0;
+    takesBack = false;
+}
+
+void forgetInChildren() {
+    static const int registered = pthread_atfork(nullptr, nullptr, forgetInChild);
+    static_cast<void>(registered);
+}
+
+} // namespace
+
 sched::Change::Change() {
     if (!lock_) {
         return;
     }
+    forgetInChildren();
     isOutermost_ = openChanges++ == 0 && !takesBack;
     ready_ = !isOutermost_ || takeBackCutOffChange() == 0;
     recorded = recorded && !isOutermost_;
@@ -120,7 +138,7 @@ sched::Change::~Change() {
     if (!lock_) {
         return;
     }
-    --openChanges;
+    openChanges -= openChanges > 0 ? 1 : 0; // none in a child
     if (isOutermost_ && recorded) {
         recorded = false;
         takeBackOwn(false);

@@ -274,7 +274,7 @@ void sched::recordMissedRuns() {
 }
 
 int sched::findMissedRuns() {
-    return mendRunNumber() ? look(Next::Nothing) : -1;
+    return guarded(SCHED_SITE, [] { return mendRunNumber() ? look(Next::Nothing) : -1; });
 }
 
 void sched::beginRecording() {

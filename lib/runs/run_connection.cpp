@@ -3,6 +3,7 @@
 
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
@@ -45,6 +46,19 @@ std::vector<int> openDescriptors() {
     return numbers;
 }
 
+// What is ignored stays ignored, also by the command.
+void forgetHandlers() {
+    for (int signal = 1; signal < NSIG; ++signal) {
+        struct sigaction action {};
+        if (sigaction(signal, nullptr, &action) == 0 && action.sa_handler != SIG_IGN &&
+            action.sa_handler != SIG_DFL) {
+            action = {};
+            action.sa_handler = SIG_DFL;
+            sigaction(signal, &action, nullptr);
+        }
+    }
+}
+
 } // namespace
 
 bool sched::RunConnection::make() {
@@ -76,7 +90,8 @@ base::Descriptor sched::RunConnection::takePid(int32_t &pid) {
     return std::move(callers_);
 }
 
-void sched::closeCallersDescriptors(const base::Descriptor &kept) {
+void sched::leaveCaller(const base::Descriptor &kept) {
+    forgetHandlers();
     for (const int fd : openDescriptors()) {
         if (fd != kept.get() && !maySystemLogBe(fd)) {
             close(fd);

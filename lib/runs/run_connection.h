@@ -25,7 +25,8 @@ class RunConnection {
 };
 
 // In the run's process, which lives as long as the command does: what its caller has open, such as
-// a web server's connections, is closed, but for the system log's and the one that is kept.
-void closeCallersDescriptors(const base::Descriptor &kept);
+// a web server's connections, is closed, but for the system log's and the one that is kept. Nor are
+// signals the caller's functions' any more, which may know those descriptors.
+void leaveCaller(const base::Descriptor &kept);
 
 } // namespace sched

@@ -63,6 +63,8 @@ int TAVISchedOffHours(const TAVI_SCHED_TASK *const *rgTasks, size_t cTasks, int6
     SCHED_REQUIRE(rgSpans, "((void *)0) != rgSpans", -1);
     SCHED_REQUIRE(cMax > 0, "0 < cMax", -1);
     tzset();
+    from = sched::inTime(from);
+    until = sched::inTime(until);
     return sched::guarded(SCHED_SITE, [&] {
         size_t count = 0;
         const sched::OffHours hours({rgTasks, cTasks}, from, until);

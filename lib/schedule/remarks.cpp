@@ -335,6 +335,6 @@ int TAVISchedTaskRemarks(const TAVI_SCHED_TASK *const *rgTasks, size_t cTasks,
     tzset();
     return sched::guarded(SCHED_SITE, [&] {
         Teller teller(reader, pContext);
-        return tellAll({rgTasks, cTasks}, pOf, from, teller);
+        return tellAll({rgTasks, cTasks}, pOf, sched::inTime(from), teller);
     });
 }

@@ -55,4 +55,10 @@ void forEachStart(const TAVI_SCHED_TASK &task, int64_t from, int64_t until, Func
 // The first start from a moment on; nothing when there is none, however long one waits.
 std::optional<int64_t> findNextStart(const TAVI_SCHED_TASK &task, int64_t from);
 
+// Years of four digits, which is what dates are made for.
+inline int64_t inTime(int64_t moment) {
+    constexpr int64_t kEndOfTime = 253402300800;
+    return std::clamp<int64_t>(moment, 0, kEndOfTime);
+}
+
 } // namespace sched

@@ -174,6 +174,11 @@ TEST_F(Records, LongOutputsKeepTheirEnds) {
         const std::string path = kFolder + ("/output/" + std::to_string(seen.run));
         EXPECT_TRUE(readFile(path).starts_with(lines(0, kLines) + lines(count - kLines, count)));
         EXPECT_LT(readFile(path).size(), 2 * kPart + 200);
+        // A run that was killed while it replaced the oldest ten lines of the last part.
+        shell("sed -i 's/replacing 00000/replacing 00160/' " + path);
+        EXPECT_TRUE(cut == 0 || outputOf(seen.run) == lines(0, kLines) + "<" +
+                                                          std::to_string(cut + 160) + " cut>" +
+                                                          lines(count - kLines + 10, count));
     }
 }
 

@@ -44,7 +44,7 @@ struct Extent {
     int64_t start = 0;    // where the oldest byte of the last part stands in it
     int64_t replaced = 0; // how many of the oldest are being replaced
 
-    bool isCut() const { return total > kWhole; }
+    bool isCut() const { return total > kWhole || replaced > 0; }
     // The first byte of the last part that is there.
     int64_t oldest() const { return isCut() ? total - kOutputPart + replaced : kOutputPart; }
     int64_t placeOf(int64_t offset) const {
@@ -205,7 +205,8 @@ sched::OutputPiece sched::readOutput(int64_t run, int64_t &offset, char *buffer,
         const int64_t from =
             extent->isCut() && offset >= kOutputPart ? std::max(offset, extent->oldest()) : offset;
         const auto wanted = std::min(static_cast<int64_t>(size), extent->endAfter(from) - from);
-        if (wanted <= 0 && extent->replaced == 0) {
+        // Who was killed while it replaced bytes replaces no more.
+        if (wanted <= 0 && (extent->replaced == 0 || tries + 1 == kTries)) {
             return {.length = 0, .cut = 0};
         }
         const ssize_t length =

@@ -1,6 +1,7 @@
 // JSON text through save: what is stored comes back, and what is refused leaves everything as it
 // was.
 #include "fuzz.h"
+#include "json/json.h"
 
 namespace {
 
@@ -21,6 +22,25 @@ int count() {
     return fuzz::listTasks([](const TAVI_SCHED_TASK &) {});
 }
 
+// What the text gives a task, when nothing is wrong with it.
+fuzz::Pairs givenBy(const std::string &text) {
+    fuzz::Pairs pairs;
+    Json::Value root;
+    if (tavisched::parseJson(text, false, root) || !root.isObject()) {
+        return {};
+    }
+    for (const std::string &key : root.getMemberNames()) {
+        Json::Value value;
+        if (!root[key].isString() || tavisched::parseJson(root[key].asString(), true, value) ||
+            !value.isString() || value.asString().find('\0') != std::string::npos) {
+            return {};
+        }
+        pairs[key] = value.asString();
+    }
+    const bool isSound = TAVISchedHashCheck(fuzz::hashOf(pairs).get(), nullptr, 0) == 0;
+    return isSound ? pairs : fuzz::Pairs();
+}
+
 void save(const std::string &text, bool create) {
     const int before = count();
     const int32_t id = TAVISchedTaskSaveFromJson(text.c_str(), create);
@@ -31,6 +51,10 @@ void save(const std::string &text, bool create) {
     const fuzz::Task task = fuzz::newTask();
     REQUIRE(TAVISchedTaskGetByID(id, task.get()) == 0 && task->id == id);
     REQUIRE(!create || count() == before + 1);
+    const fuzz::Pairs form = fuzz::formOf(*task);
+    for (const auto &[key, value] : givenBy(text)) {
+        REQUIRE(key == "id" || form.at(key) == value);
+    }
     // Once more, it is the same task, but for U+FFFD, which takes more room than what it stands
     // for.
     const std::string stored = jsonOf(id);
@@ -54,6 +78,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     save(text, (mode & 0x80) != 0);
     REQUIRE(!isBatch || TAVISchedChangeRollback() == 0);
     REQUIRE(!isBatch || fuzz::readFile(fuzz::kWorking) == kStored);
+    const fuzz::Task task = fuzz::newTask();
+    REQUIRE(!isBatch || (TAVISchedTaskGetByID(1, task.get()) == 0 && task->runHour == 0));
+    REQUIRE(!isBatch || TAVISchedTaskGetByID(2, task.get()) == -1);
     REQUIRE(fuzz::readFile(fuzz::kPersistent) == fuzz::readFile(fuzz::kWorking));
     return 0;
 }

@@ -3,6 +3,7 @@
 #include "fuzz.h"
 
 #include <algorithm>
+#include <cstdio>
 #include <cstring>
 #include <optional>
 
@@ -10,12 +11,35 @@ namespace {
 
 using Entries = std::vector<TAVIAUTOPOWER>;
 
+// Each entry is its pair's four numbers.
+void requirePairs(int kind, const Entries &entries) {
+    const fuzz::Hash hash = fuzz::hashOf({});
+    PLATCSZHASH *form = hash.get();
+    PLATCFileGetSection(fuzz::kAutoPower, kind == TAVI_AUTOPOWER_KIND_ON ? "power on" : "power off",
+                        &form);
+    const fuzz::Pairs pairs = fuzz::pairsOf(form);
+    REQUIRE(entries.size() == std::min<size_t>(pairs.size(), TAVI_AUTOPOWER_MAX_ENTRIES));
+    for (size_t i = 0; i < entries.size(); ++i) {
+        const std::string key = std::to_string(1000 + i).substr(1);
+        unsigned int numbers[4] = {};
+        REQUIRE(pairs.contains(key) &&
+                std::sscanf(pairs.at(key).c_str(), "%u %u %u %u", &numbers[0], &numbers[1],
+                            &numbers[2], &numbers[3]) == 4);
+        REQUIRE(entries[i].enabled == numbers[0] && entries[i].weekBits == numbers[1] &&
+                entries[i].hour == numbers[2] && entries[i].minute == numbers[3]);
+    }
+}
+
 std::optional<Entries> entriesOf(int kind) {
     Entries entries(TAVI_AUTOPOWER_MAX_ENTRIES);
     const int count = TAVIAutoPowerConfGet(kind, TAVI_AUTOPOWER_MAX_ENTRIES, entries.data());
     REQUIRE(count >= -1 && count <= TAVI_AUTOPOWER_MAX_ENTRIES);
     entries.resize(static_cast<size_t>(std::max(count, 0)));
-    return count < 0 ? std::nullopt : std::optional(entries);
+    if (count < 0) {
+        return std::nullopt;
+    }
+    requirePairs(kind, entries);
+    return entries;
 }
 
 bool isSame(const std::optional<Entries> &one, const std::optional<Entries> &other) {

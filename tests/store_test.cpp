@@ -68,6 +68,7 @@ TEST_F(Store, UnreadableSectionsArePassedOverAndKept) {
     EXPECT_EQ(task.state, TAVI_SCHED_STATE_NOT_EXISTED);
     EXPECT_EQ(storedTask()->id, 4); // 1 and 3 are in use
     EXPECT_THAT(readFile(kWorking), HasSubstr(bad + "\n[2]"));
+    EXPECT_EQ(SchedBackends[0].get_by_id(2, &task), 1);
 }
 
 TEST_F(Store, WithoutAWorkingCopy) {

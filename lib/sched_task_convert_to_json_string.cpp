@@ -5,6 +5,7 @@
 #include "sched_handle.h"
 #include "sched_text.h"
 #include "tavischeduler.h"
+#include "validity/utf8.h"
 
 #include <exception>
 #include <json/json.h>
@@ -14,12 +15,13 @@ namespace {
 
 constexpr size_t kSmallestBuffer = 40960;
 
+// JsonCpp takes what follows the first byte of a character for the rest of it, whatever it is.
 std::string render(PLATCSZHASH *hash, const PLATCSZLIST *keys, int count) {
     Json::FastWriter writer;
     Json::Value root;
     for (int i = 0; i < count; ++i) {
         const char *const key = PLATCSzListGet(keys, i);
-        root[key] = writer.write(Json::Value(PLATCSzHashGetValue(hash, key)));
+        root[key] = writer.write(Json::Value(sched::toUtf8(PLATCSzHashGetValue(hash, key))));
     }
     return writer.write(root);
 }

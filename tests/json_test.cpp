@@ -26,8 +26,10 @@ TEST_F(Json, RoundTripOverwritesAndAnotherNameCreates) {
     Task task = newTask("echo \"1\"\necho 2");
     TAVISchedCTaskSetName(task.get(), "back\"up \xc3\xa9");
     TAVISchedCTaskSetAppArgs(task.get(), R"({"a": "b\n"})");
+    TAVISchedCTaskSetAction(task.get(), "\xec\x9b\"1"); // a character that is cut off
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     const std::string json = rendered(1);
+    EXPECT_THAT(json, HasSubstr(R"("action":"\"\\ufffd\\ufffd\\\"1\"\n")"));
     EXPECT_THAT(json, HasSubstr(R"("type":"\"daily\"\n")"));
     EXPECT_THAT(json, HasSubstr(R"("cmd":"\"ZWNobyAiMSIKZWNobyAy\"\n")"));
     EXPECT_EQ(json.back(), '\n');

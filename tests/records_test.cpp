@@ -292,7 +292,8 @@ TEST_F(Records, StopMeetsOnlyItsOwnRun) {
     EXPECT_EQ(PLATCProcAlive(pid), 1);
     // A run whose process dies is interrupted.
     kill(pid, SIGKILL);
-    shell("pkill -x -P 1 sleep; pkill -x -P " + std::to_string(getpid()) + " sleep");
+    // Its command is given to this process then, and may not have begun yet.
+    EXPECT_TRUE(waitFor("pkill -x -P 1," + std::to_string(getpid()) + " sleep"));
     waitForChildren();
     EXPECT_EQ(newest().result, TAVI_SCHED_RUN_INTERRUPTED);
 }

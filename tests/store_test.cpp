@@ -68,6 +68,7 @@ TEST_F(Store, UnreadableSectionsArePassedOverAndKept) {
     EXPECT_EQ(task.state, TAVI_SCHED_STATE_NOT_EXISTED);
     EXPECT_EQ(storedTask()->id, 4); // 1 and 3 are in use
     EXPECT_THAT(readFile(kWorking), HasSubstr(bad + "\n[2]"));
+    EXPECT_EQ(SchedBackends[0].get_by_id(2, &task), 1);
 }
 
 TEST_F(Store, WithoutAWorkingCopy) {
@@ -89,6 +90,39 @@ TEST_F(Store, WithoutAWorkingCopy) {
     EXPECT_EQ(readFile(kSetAside + std::string(".1")), "[9]\n");
     storedTask();
     EXPECT_EQ(shell("test $(ls /usr/tavi/etc | grep -Evc 'lock|reading') = 3"), 0);
+}
+
+TEST_F(Store, TheStartOfTheMachineFillsAnEmptyWorkingCopy) {
+    constexpr const char *kLast = "1 1 * * * root /tmp/tavischedtask --run id=9\n";
+    storeIds("1");
+    const std::string tasks = readFile(kWorking);
+    const struct {
+        const char *what;
+        std::optional<std::string> working, stored;
+        mode_t mode; // of what is stored
+        unsigned int error;
+        std::string filled;
+    } cases[] = {{"missing", {}, tasks, 0600, 0, tasks},
+                 {"empty", "", tasks, 0600, 0, tasks},
+                 {"made by hand", tasks, "[9]\n", 0600, 0, tasks},
+                 {"no tasks", {}, {}, 0, 0, ""},
+                 {"anybody's", {}, tasks, 0666, 0x0900, ""}};
+    for (const auto &[what, working, stored, mode, error, filled] : cases) {
+        shell("rm -rf /tmp/lock /tmp/scheduled_tasks /usr/tavi/etc/*");
+        if (working) {
+            writeFile(kWorking, *working);
+        }
+        if (stored) {
+            writeFile(kPersistent, *stored);
+            chmod(kPersistent, mode);
+        }
+        writeFile(kCrontab, kLast);
+        EXPECT_EQ(failure(TAVISchedStart()), error) << what;
+        EXPECT_EQ(shell("[ -f /tmp/scheduled_tasks ] && [ -d /tmp/lock ]"), 0) << what;
+        EXPECT_EQ(readFile(kWorking), filled) << what;
+        // Without tasks the lines stay, as the last trace of them.
+        EXPECT_THAT(readFile(kCrontab), HasSubstr(filled.empty() ? kLast : "--run id=1\n")) << what;
+    }
 }
 
 TEST_F(Store, ChangesOfATask) {

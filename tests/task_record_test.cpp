@@ -60,6 +60,22 @@ TEST_F(TaskRecord, BadArgumentsAreNamed) {
     EXPECT_THAT(logs(), ElementsAre("tavischedsetter.h" + reason + "(((void *)0) != szVal)=[0]\n",
                                     "tavischedgetter.h" + reason + "(0 < cbBuf)=[0]\n",
                                     "sched_util.cpp" + reason + "(((void *)0) != pDate1)=[0]\n"));
+    int (*const kCalls[])() = {
+        [] { return TAVISchedMachineCheck(nullptr); },
+        [] { return TAVISchedMachineCheckOf(nullptr, nullptr); },
+        [] { return TAVISchedTaskCheck(nullptr, nullptr); },
+        [] { return TAVISchedHashCheck(nullptr, nullptr, 0); },
+        [] { return TAVISchedTaskNextId(nullptr); },
+        [] { return TAVISchedDBOpenForReading(nullptr); },
+        [] { return TAVISchedDBSetStatus(nullptr, 1, 0, 3, nullptr); },
+        [] { return TAVISchedDBGetStatusByTaskID(nullptr, 1, nullptr, nullptr, nullptr, 0); },
+        [] { return TAVISchedDBListStatus(nullptr, 1, nullptr, nullptr); },
+        [] { return TAVISchedRunGet(1, nullptr); },
+    };
+    for (const auto &call : kCalls) {
+        PLATCErrSetEx(0, "", 0);
+        EXPECT_EQ(failure(call()), 0x0D00U) << &call - kCalls;
+    }
 }
 
 TEST_F(TaskRecord, EnumerationsAndSelections) {

@@ -561,6 +561,13 @@ TEST_F(CommandLine, ImportsWhatPeopleWrite) {
         EXPECT_EQ(status_, c.status) << c.json;
     }
     EXPECT_THAT(done("list"), HasSubstr("2  Task 2  enabled  Mon, Fri 07:00  "));
+    shell("printf '{\"command\": \"%012285d\"}' 0 > /tmp/in.json"); // the longest
+    done("import --dry-run /tmp/in.json");
+    // A task is not taken for a power schedule.
+    writeFile("/tmp/in.json", R"([{"command": "x", "appArgs": "poweroff", "week": "Mon"},
+        {"backend": -3, "appArgs": "poweroff", "week": "Mon", "type": "weekly"}])");
+    EXPECT_THAT(done("import --dry-run /tmp/in.json"),
+                testing::EndsWith("stored under a new id\n"));
     // What is printed can be edited and goes in again.
     done("show 2 --json | sed 's/\"runHour\": 7/\"runHour\": 8/' > /tmp/two.json");
     done("import --replace /tmp/two.json");

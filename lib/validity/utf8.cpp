@@ -74,6 +74,17 @@ bool sched::isUtf8(std::string_view text) {
     return true;
 }
 
+std::string sched::toUtf8(std::string_view text) {
+    std::string result;
+    while (!text.empty()) {
+        const auto character = firstOf(text);
+        const size_t length = character ? character->length : 1;
+        result += character ? text.substr(0, length) : "\uFFFD";
+        text.remove_prefix(length);
+    }
+    return result;
+}
+
 std::string sched::quoted(std::string_view text) {
     constexpr size_t kMostCharacters = 60;
     std::string result = "\"";

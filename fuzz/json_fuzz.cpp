@@ -1,0 +1,86 @@
+// JSON text through save: what is stored comes back, and what is refused leaves everything as it
+// was.
+#include "fuzz.h"
+#include "json/json.h"
+
+namespace {
+
+// Two tasks; the first has the default schedule, as what is saved over it begins with that.
+constexpr const char *kStored =
+    "[1]\naction=\napp=a\napp name=\ncmd=dHJ1ZQ==\nid=1\nname=n\nrun hour=0\nrun min=0\n"
+    "state=enabled\ntype=daily\n"
+    "[3]\naction=\napp=\napp name=\ncmd=\nid=3\nname=m\nrun hour=23\nrun min=59\n"
+    "state=disabled\ntype=weekly\nweek=0000001\n";
+
+std::string jsonOf(int32_t id) {
+    std::string text(160 * 1024, '\0');
+    REQUIRE(TAVISchedTaskConvertToJsonById(id, text.data(), text.size()) == 0);
+    return text.c_str();
+}
+
+int count() {
+    return fuzz::listTasks([](const TAVI_SCHED_TASK &) {});
+}
+
+// What the text gives a task, when nothing is wrong with it.
+fuzz::Pairs givenBy(const std::string &text) {
+    fuzz::Pairs pairs;
+    Json::Value root;
+    if (tavisched::parseJson(text, false, root) || !root.isObject()) {
+        return {};
+    }
+    for (const std::string &key : root.getMemberNames()) {
+        Json::Value value;
+        if (!root[key].isString() || tavisched::parseJson(root[key].asString(), true, value) ||
+            !value.isString() || value.asString().find('\0') != std::string::npos) {
+            return {};
+        }
+        pairs[key] = value.asString();
+    }
+    const bool isSound = TAVISchedHashCheck(fuzz::hashOf(pairs).get(), nullptr, 0) == 0;
+    return isSound ? pairs : fuzz::Pairs();
+}
+
+void save(const std::string &text, bool create) {
+    const int before = count();
+    const int32_t id = TAVISchedTaskSaveFromJson(text.c_str(), create);
+    if (id == -1) {
+        REQUIRE(count() == before);
+        return;
+    }
+    const fuzz::Task task = fuzz::newTask();
+    REQUIRE(TAVISchedTaskGetByID(id, task.get()) == 0 && task->id == id);
+    REQUIRE(!create || count() == before + 1);
+    const fuzz::Pairs form = fuzz::formOf(*task);
+    for (const auto &[key, value] : givenBy(text)) {
+        REQUIRE(key == "id" || form.at(key) == value);
+    }
+    // Once more, it is the same task, but for U+FFFD, which takes more room than what it stands
+    // for.
+    const std::string stored = jsonOf(id);
+    const int32_t again = TAVISchedTaskSaveFromJson(stored.c_str(), 0);
+    REQUIRE(again != -1);
+    REQUIRE((again == id && jsonOf(id) == stored) || stored.find("\\ufffd") != std::string::npos);
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    fuzz::Input input(data, size);
+    const uint32_t mode = input.number(1);
+    const std::string text = input.text();
+    if (fuzz::readFile(fuzz::kWorking) != kStored) {
+        fuzz::storeTasks(kStored);
+    }
+    // Mostly within a batch that comes to nothing, as that writes no file.
+    const bool isBatch = mode % 16 != 0;
+    REQUIRE(!isBatch || TAVISchedChangeBegin() == 0);
+    save(text, (mode & 0x80) != 0);
+    REQUIRE(!isBatch || TAVISchedChangeRollback() == 0);
+    REQUIRE(!isBatch || fuzz::readFile(fuzz::kWorking) == kStored);
+    const fuzz::Task task = fuzz::newTask();
+    REQUIRE(!isBatch || (TAVISchedTaskGetByID(1, task.get()) == 0 && task->runHour == 0));
+    REQUIRE(!isBatch || TAVISchedTaskGetByID(2, task.get()) == -1);
+    REQUIRE(fuzz::readFile(fuzz::kPersistent) == fuzz::readFile(fuzz::kWorking));
+    return 0;
+}

@@ -128,6 +128,9 @@ TEST_F(Store, TheStartOfTheMachineFillsAnEmptyWorkingCopy) {
         // Without tasks the lines stay, as the last trace of them.
         EXPECT_THAT(readFile(kCrontab), HasSubstr(filled.empty() ? kLast : "--run id=1\n")) << what;
     }
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    EXPECT_EQ(failure(TAVISchedStart()), 0x0D00U);
+    EXPECT_EQ(TAVISchedChangeRollback(), 0);
 }
 
 TEST_F(Store, ChangesOfATask) {

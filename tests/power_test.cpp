@@ -129,7 +129,8 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     // 263 must not become 7, a gap must not hide what is behind it.
     for (const char *entry : {"000=1 2 3", "000=1 127 263 30", "000=-1 127 7 30", "000=1  2 3 4",
                               "000=1 2 3 4 ", "001=1 2 3 4"}) {
-        writeFile(kConfiguration, std::string("[power off]\n") + entry + "\n");
+        writeFile(kConfiguration, "[power off]\n000=1 1 1 1\n001=1 1 1 2\n[power on]\n" +
+                                      std::string(entry) + "\n");
         EXPECT_EQ(failure(row_.list_get(&list, nullptr)), 0x4000U) << entry;
     }
 }

@@ -105,24 +105,32 @@ TEST_F(Store, TheStartOfTheMachineFillsAnEmptyWorkingCopy) {
     } cases[] = {{"missing", {}, tasks, 0600, 0, tasks},
                  {"empty", "", tasks, 0600, 0, tasks},
                  {"made by hand", tasks, "[9]\n", 0600, 0, tasks},
-                 {"no tasks", {}, {}, 0, 0, ""},
-                 {"anybody's", {}, tasks, 0666, 0x0900, ""}};
+                 {"anybody's", {}, tasks, 0666, 0x0900, ""},
+                 {"no folder", {}, {}, 0, 0, ""}};
     for (const auto &[what, working, stored, mode, error, filled] : cases) {
-        shell("rm -rf /tmp/lock /tmp/scheduled_tasks /usr/tavi/etc/*");
+        shell("rm -rf /tmp/lock /tmp/scheduled_tasks /usr/tavi/etc");
         if (working) {
             writeFile(kWorking, *working);
         }
         if (stored) {
+            mkdir("/usr/tavi/etc", 0755);
             writeFile(kPersistent, *stored);
             chmod(kPersistent, mode);
         }
         writeFile(kCrontab, kLast);
+        logs();
         EXPECT_EQ(failure(TAVISchedStart()), error) << what;
+        EXPECT_EQ(testing::PrintToString(logs()).find("is refused: ") != std::string::npos,
+                  error > 0);
+        EXPECT_EQ(statusOf("/usr/tavi/etc").st_mode, S_IFDIR | 0755U) << what;
         EXPECT_EQ(shell("[ -f /tmp/scheduled_tasks ] && [ -d /tmp/lock ]"), 0) << what;
         EXPECT_EQ(readFile(kWorking), filled) << what;
         // Without tasks the lines stay, as the last trace of them.
         EXPECT_THAT(readFile(kCrontab), HasSubstr(filled.empty() ? kLast : "--run id=1\n")) << what;
     }
+    ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    EXPECT_EQ(failure(TAVISchedStart()), 0x0D00U);
+    EXPECT_EQ(TAVISchedChangeRollback(), 0);
 }
 
 TEST_F(Store, ChangesOfATask) {

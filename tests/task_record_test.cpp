@@ -51,7 +51,9 @@ TEST_F(TaskRecord, TextsAreCutToTheirOwnField) {
 }
 
 TEST_F(TaskRecord, BadArgumentsAreNamed) {
-    char text[4] = "";
+    static char text[4] = "";
+    static int number = 0;
+    static const Task someTask = newTask();
     EXPECT_EQ(failure(TAVISchedCTaskSetName(nullptr, nullptr)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedCTaskGetName(text, 0, nullptr)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedDateComp(nullptr, nullptr)), 0x0D00U);
@@ -71,6 +73,9 @@ TEST_F(TaskRecord, BadArgumentsAreNamed) {
         [] { return TAVISchedDBGetStatusByTaskID(nullptr, 1, nullptr, nullptr, nullptr, 0); },
         [] { return TAVISchedDBListStatus(nullptr, 1, nullptr, nullptr); },
         [] { return TAVISchedRunGet(1, nullptr); },
+        [] { return SchedBackends[0].run(someTask.get(), &number, nullptr, 1); },
+        [] { return SchedBackends[1].run(someTask.get(), &number, nullptr, 1); },
+        [] { return SchedBackends[1].run(someTask.get(), nullptr, text, 1); },
     };
     for (const auto &call : kCalls) {
         PLATCErrSetEx(0, "", 0);

@@ -1,7 +1,6 @@
 // Several processes at once: writers and readers through the library, the tool and the runner,
 // plug-in handlers that use the library themselves, and another user who interferes in /tmp.
 #include "machine.h"
-#include "tracer.h"
 
 #include <array>
 #include <atomic>
@@ -162,50 +161,6 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
     EXPECT_EQ(linesOf(kCrontab, "--run id=").size(), ids.size());
     EXPECT_GT(shared().looks, kReaders);
     EXPECT_EQ(shared().fewer + shared().errors + shared().missing, 0);
-}
-
-// A copy that dies in the middle leaves the working copy torn until the change has taken it back:
-// at every step of that somebody begins to read.
-TEST_F(Concurrency, ReadersBesideACopyThatIsKilled) {
-    for (const char *const name : {"one", "two", "three"}) {
-        ASSERT_EQ(created(name), 0);
-    }
-    const auto create = [] { return created("four"); };
-    size_t torn = 0;
-    size_t point = 0;
-    tracer::run(create, {}, [&](const tracer::Call &call) {
-        ++point;
-        const bool fills = call.isPrograms && call.isWrite && call.path == kWorking;
-        torn = torn == 0 && fills ? point : torn; // it is open, and empty
-    });
-    ASSERT_EQ(TAVISchedTaskRemove(4), 0);
-    const auto look = [] {
-        TAVI_SCHED_TASK *list = nullptr;
-        const int count = TAVISchedTaskListGet(&list, nullptr);
-        shared().fewer += count >= 0 && count < 3 ? 1 : 0;
-        shared().errors += count < 0 ? 1 : 0;
-        ++shared().looks;
-        return 0;
-    };
-    point = 0;
-    long started = 0;
-    const auto run = tracer::run(create, {.point = torn, .act = tracer::Act::KillProgram},
-                                 [&](const tracer::Call &) {
-                                     if (++point > torn) {
-                                         start(look);
-                                         ++started;
-                                         const timespec moment{.tv_sec = 0, .tv_nsec = 3'000'000};
-                                         nanosleep(&moment, nullptr);
-                                     }
-                                 });
-    EXPECT_TRUE(run.acted);
-    waitForChildren();
-    std::printf("concurrency: a copy killed: %ld looks meanwhile: %ld saw fewer, %ld errors\n",
-                shared().looks.load(), shared().fewer.load(), shared().errors.load());
-    EXPECT_GT(started, 5);
-    EXPECT_EQ(shared().looks, started);
-    EXPECT_EQ(shared().fewer + shared().errors, 0);
-    EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
 }
 
 // ---- Plug-in handlers ----

@@ -66,19 +66,6 @@ TEST_F(Crontab, LinesOfTasks) {
     EXPECT_THAT(readFile(kCrontab), HasSubstr("0\t0\t*\t*\t0,1,2,3,4,5,6\troot"));
 }
 
-TEST_F(Crontab, ALineNeedsRoomForItsEnd) {
-    const Task task = newTask();
-    task->id = 1;
-    char line[sizeof "0\t0\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1"];
-    EXPECT_EQ(TAVISchedCrontabLine(task.get(), line, sizeof line), 0);
-    EXPECT_EQ(line + "\n"s, kOwnLine);
-    line[0] = 'x';
-    EXPECT_EQ(failure(TAVISchedCrontabLine(task.get(), line, sizeof line - 1)), 0x0D00U);
-    EXPECT_EQ(line[0], 'x');
-    EXPECT_EQ(failure(TAVISchedCrontabLine(nullptr, line, sizeof line)), 0x0D00U);
-    EXPECT_EQ(failure(TAVISchedCrontabLine(task.get(), nullptr, 0)), 0x0D00U);
-}
-
 TEST_F(Crontab, ForeignLinesOwnerAndModeStay) {
     storedTask();
     const std::string foreign = "A=b\n\n\xff bytes \0 here\n# /tmp/other\n@daily root x"s;

@@ -277,32 +277,6 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
                 HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1\n"));
 }
 
-TEST_F(CommandLine, ChangesFollowOneAnother) {
-    done("add --command x");
-    done("add --command x");
-    shell(
-        "mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
-        "printf '#!/bin/sh\n/usr/tavi/bin/tavisched disable 2 >> /tmp/inner 2>&1\n"
-        "/usr/tavi/bin/tavisched run 3 --wait >> /tmp/inner\nuntil [ -e /tmp/sent ]; do sleep 0.01; done\n' > nest; "
-        "chmod 755 nest");
-    done("add --command '/usr/tavi/bin/tavisched list >> /tmp/inner'");
-    // A handler may read; its own change is refused at once. What a signal ends is whole.
-    shell("touch /tmp/sent");
-    done("edit 1 --at 05:00");
-    EXPECT_THAT(readFile("/tmp/inner"),
-                AllOf(HasSubstr("a change is going on in process"), HasSubstr("daily 0")));
-    EXPECT_EQ(
-        shell(
-            "rm /tmp/sent /tmp/inner; /usr/tavi/bin/tavisched edit 1 --at 06:00 > /tmp/out & "
-            "until [ -s /tmp/inner ]; do sleep 0.01; done; kill -TERM $!; touch /tmp/sent; wait $!"),
-        128 + SIGTERM);
-    EXPECT_THAT(done("list"), HasSubstr("daily 05:00"));
-    // A reader that goes away ends nothing half done.
-    shell("rm -r /usr/tavi/etc/plugins; /usr/tavi/bin/tavisched disable 1 2 | true");
-    EXPECT_THAT(done("list"), testing::ContainsRegex("Task 1  disabled.*\n.*Task 2  disabled"));
-    EXPECT_THAT(done("check"), HasSubstr("All is well."));
-}
-
 // The crontab becomes unwritable while two tasks are changed.
 TEST_F(CommandLine, TakesBackAChangeOfSeveralTasks) {
     done("add --command x");

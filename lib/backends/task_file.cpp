@@ -106,7 +106,7 @@ class Pass {
     }
     // What is handed over may change what is staged.
     bool takeStaged() {
-        const std::vector<std::string> names = staged.order();
+        const std::vector<std::string> names(staged.order().begin(), staged.order().end());
         return std::all_of(names.begin(), names.end(), [&](const std::string &name) {
             PLATCSZHASH *const form = staged.find(name);
             return !form || stored_.contains(name) || take(name.c_str(), form);

@@ -154,7 +154,7 @@ void printTasks(const std::vector<Listed> &tasks) {
                 {"NEXT RUN"},
                 {"OWNER", false, true, 1},
                 {"LAST RUN", false, true, 3}},
-               std::move(rows));
+               rows);
 }
 
 void printAsJson(const std::vector<Listed> &shown, const TaskPointers &all,

@@ -75,7 +75,7 @@ void printStarts(const std::vector<Start> &starts) {
                         {printable(ownerName(task->owner))}});
     }
     printTable({{"START"}, {"ID", true}, {"NAME", false, true}, {"OWNER", false, true, 1}},
-               std::move(rows));
+               rows);
 }
 
 } // namespace

@@ -301,10 +301,25 @@ int fsync(int fd) {
 
 } // extern "C"
 
+// All forms, as a sanitizer has its own of those that are left out.
+void *operator new(size_t size, const std::nothrow_t &) noexcept {
+    return ++fakes.allocations == fakes.failingAllocation ? nullptr : std::malloc(size);
+}
 void *operator new(size_t size) {
-    void *const memory =
-        ++fakes.allocations == fakes.failingAllocation ? nullptr : std::malloc(size);
+    void *const memory = operator new(size, std::nothrow);
     return memory ? memory : throw std::bad_alloc();
+}
+void *operator new[](size_t size) {
+    return operator new(size);
+}
+void *operator new[](size_t size, const std::nothrow_t &) noexcept {
+    return operator new(size, std::nothrow);
+}
+void operator delete[](void *memory) noexcept {
+    std::free(memory);
+}
+void operator delete[](void *memory, size_t) noexcept {
+    std::free(memory);
 }
 void operator delete(void *memory) noexcept {
     std::free(memory);

@@ -291,7 +291,8 @@ class Following {
             kill({pid});
             break;
         case Act::HalfThenKillAll:
-            run_.acted = setArgument(pid, kind.length, halfOf(kind, pid, info));
+            run_.acted =
+                kind.length != kNone && setArgument(pid, kind.length, halfOf(kind, pid, info));
             cut_ = run_.acted ? pid : 0;
             break;
         case Act::Fail:

@@ -74,8 +74,7 @@ void printStarts(const std::vector<Start> &starts) {
                         {printable(task->name)},
                         {printable(ownerName(task->owner))}});
     }
-    printTable({{"START"}, {"ID", true}, {"NAME", false, true}, {"OWNER", false, true, 1}},
-               rows);
+    printTable({{"START"}, {"ID", true}, {"NAME", false, true}, {"OWNER", false, true, 1}}, rows);
 }
 
 } // namespace

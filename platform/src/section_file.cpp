@@ -283,27 +283,39 @@ std::vector<std::string> faultsOf(std::string_view text) {
     return faults;
 }
 
-} // namespace
+// ---- Listing ----
 
-int PLATCFileEnumSection(const char *szPath, PLATCSZLIST **ppList) {
-    if (!szPath || !ppList || !*ppList) {
+std::vector<std::string> namesOf(std::string_view text) {
+    std::vector<std::string> names;
+    forEachFirst(text, [&](const Section &section) {
+        names.emplace_back(section.name);
+        return true;
+    });
+    return names;
+}
+
+// Fills the list with what is found in the file: the number of texts, or -1.
+int listTexts(const char *path, PLATCSZLIST **list,
+              std::vector<std::string> (*textsOf)(std::string_view text)) {
+    if (!path || !list || !*list) {
         return PLATFORM_FAIL(platform::kInvalidArgument);
     }
     return guarded(
         [&] {
-            const auto content = platform::readFile(szPath);
+            const auto content = platform::readFile(path);
             if (!content) {
                 return -1;
             }
-            std::vector<std::string> names;
-            forEachFirst(content->text, [&](const Section &section) {
-                names.emplace_back(section.name);
-                return true;
-            });
-            (*ppList)->texts = std::move(names);
-            return static_cast<int>((*ppList)->texts.size());
+            (*list)->texts = textsOf(content->text);
+            return static_cast<int>((*list)->texts.size());
         },
         -1);
+}
+
+} // namespace
+
+int PLATCFileEnumSection(const char *szPath, PLATCSZLIST **ppList) {
+    return listTexts(szPath, ppList, namesOf);
 }
 
 int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH **ppHash) {
@@ -396,17 +408,5 @@ int PLATCFileEditSections(const char *szPath, int count, const char *const *rgsz
 }
 
 int PLATCFileCheckSections(const char *szPath, PLATCSZLIST **ppFaults) {
-    if (!szPath || !ppFaults || !*ppFaults) {
-        return PLATFORM_FAIL(platform::kInvalidArgument);
-    }
-    return guarded(
-        [&] {
-            const auto content = platform::readFile(szPath);
-            if (!content) {
-                return -1;
-            }
-            (*ppFaults)->texts = faultsOf(content->text);
-            return static_cast<int>((*ppFaults)->texts.size());
-        },
-        -1);
+    return listTexts(szPath, ppFaults, faultsOf);
 }

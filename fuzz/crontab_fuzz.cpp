@@ -2,7 +2,9 @@
 // tasks.
 #include "fuzz.h"
 
+#include <algorithm>
 #include <array>
+#include <sstream>
 
 namespace {
 
@@ -42,35 +44,41 @@ bool isOfTheUnreadable(const std::string &line) {
             std::string_view(" \t\n").find(line[at + 11]) != std::string_view::npos);
 }
 
-void requireSynced(const std::string &content) {
-    fuzz::writeFile(fuzz::kCrontab, content);
+void requireSynced(const std::string &content, bool twice) {
+    fuzz::contentOf(fuzz::kCrontab) = content;
     REQUIRE(TAVISchedTaskSync() == 0);
     // There is no power schedule either.
     const auto isOurs = [](const std::string &line) {
         return (holds(line, fuzz::kRunner) && !isOfTheUnreadable(line)) || holds(line, kProgram);
     };
     const std::string expected = ended(without(content, isOurs)) + kLine;
-    REQUIRE(fuzz::readFile(fuzz::kCrontab) == expected);
-    REQUIRE(content.size() % 4 != 0 || TAVISchedTaskSync() == 0);
-    REQUIRE(fuzz::readFile(fuzz::kCrontab) == expected);
+    REQUIRE(fuzz::contentOf(fuzz::kCrontab) == expected);
+    REQUIRE(!twice || TAVISchedTaskSync() == 0);
+    REQUIRE(fuzz::contentOf(fuzz::kCrontab) == expected);
 }
 
-// One line is replaced or goes, all of a program's lines go, and one is added.
-void requireLines(const std::string &content) {
-    fuzz::writeFile(fuzz::kCrontab, content);
-    const auto first = PLATCFileSetLine(fuzz::kCrontab, kProgram, "# another");
+// One line is replaced or goes, or all of a program's lines go.
+void requireSetLine(const std::string &content) {
+    fuzz::contentOf(fuzz::kCrontab) = content;
+    const char *const line = content.size() % 8 == 2 ? "# another" : nullptr;
+    const auto set = PLATCFileSetLine(fuzz::kCrontab, kProgram, line);
     bool isFirst = true;
     std::string expected;
-    for (const std::string &line : fuzz::linesOf(content)) {
-        const bool isReplaced = isFirst && holds(line, kProgram);
-        expected += isReplaced ? "# another\n" : line;
+    for (const std::string &each : fuzz::linesOf(content)) {
+        const bool isReplaced = isFirst && holds(each, kProgram);
+        expected += !isReplaced ? each : line ? std::string(line) + "\n" : "";
         isFirst = isFirst && !isReplaced;
     }
-    REQUIRE(first == (isFirst ? 0 : 1) && fuzz::readFile(fuzz::kCrontab) == expected);
+    REQUIRE(set == (isFirst ? 0 : 1) && fuzz::contentOf(fuzz::kCrontab) == expected);
+    expected = without(expected, [](const std::string &each) { return holds(each, kProgram); });
+    REQUIRE(TAVIUpdateCrontab(kProgram, 0, 1) == 0 && fuzz::contentOf(fuzz::kCrontab) == expected);
+}
 
-    expected = without(expected, [](const std::string &line) { return holds(line, kProgram); });
-    REQUIRE(TAVIUpdateCrontab(kProgram, 0, 1) == 0 && fuzz::readFile(fuzz::kCrontab) == expected);
-
+// A line is added and goes again, with those that are the same.
+void requireSchedule(const std::string &content) {
+    constexpr std::string_view kAdded =
+        "5\t22\t*\t*\t0,1\troot\t/usr/tavi/bin/tavi_poweroff_feasible_check\n";
+    fuzz::contentOf(fuzz::kCrontab) = content;
     TAVISCHEDULE schedule{.weekBits = 3,
                           .hour = 22,
                           .reserved1 = 0,
@@ -79,10 +87,81 @@ void requireLines(const std::string &content) {
                           .reserved2 = 0,
                           .szCommand = "/usr/tavi/bin/tavi_poweroff_feasible_check"};
     REQUIRE(TAVIScheduleSet(&schedule, 1) == 0);
-    REQUIRE(fuzz::readFile(fuzz::kCrontab) ==
-            ended(expected) + "5\t22\t*\t*\t0,1\troot\t" + kProgram + "\n");
+    REQUIRE(fuzz::contentOf(fuzz::kCrontab) == ended(content).append(kAdded));
     REQUIRE(TAVIScheduleSet(&schedule, 0) == 0);
-    REQUIRE(fuzz::readFile(fuzz::kCrontab) == ended(expected));
+    REQUIRE(fuzz::contentOf(fuzz::kCrontab) ==
+            without(ended(content), [&](const std::string &each) { return each == kAdded; }));
+}
+
+// A list of "*", "5" and "5-9", with a step behind the first and the last: "*/2".
+struct Field {
+    bool isPlain = true; // nothing else stands there
+    bool isValid = true;
+    uint64_t values = 0;
+};
+
+bool takeNumber(std::string_view &text, unsigned int &number) {
+    const size_t digits = std::min(text.find_first_not_of("0123456789"), text.size());
+    const bool isNumber = digits >= 1 && digits <= 4;
+    number = isNumber ? std::stoul(std::string(text.substr(0, digits))) : 0;
+    text.remove_prefix(digits);
+    return isNumber;
+}
+
+bool takeSign(std::string_view &text, char sign) {
+    const bool isThere = text.starts_with(sign);
+    text.remove_prefix(isThere ? 1 : 0);
+    return isThere;
+}
+
+Field fieldOf(std::string_view text, unsigned int low, unsigned int high) {
+    Field field;
+    do {
+        unsigned int first = low;
+        unsigned int last = high;
+        unsigned int step = 1;
+        bool isRange = takeSign(text, '*');
+        if (!isRange) {
+            field.isPlain = field.isPlain && takeNumber(text, first);
+            last = first;
+            isRange = takeSign(text, '-');
+            field.isPlain = field.isPlain && (!isRange || takeNumber(text, last));
+        }
+        if (takeSign(text, '/')) {
+            field.isPlain = field.isPlain && takeNumber(text, step);
+            field.isValid = field.isValid && isRange;
+        }
+        field.isValid = field.isValid && first >= low && first <= high && last >= low &&
+                        last <= high && step > 0;
+        for (unsigned int value = first; field.isValid && value <= last; value += step) {
+            field.values |= uint64_t{1} << value;
+        }
+    } while (field.isPlain && takeSign(text, ','));
+    field.isPlain = field.isPlain && text.empty();
+    return field;
+}
+
+// Of a line with plain fields, its times and whether it is taken.
+void requireTimes(const std::string &line, int judged, const TAVI_SCHED_CRON_TIMES &times) {
+    std::istringstream words(line);
+    std::string word;
+    std::array<Field, 5> fields;
+    constexpr unsigned int kRanges[5][2] = {{0, 59}, {0, 23}, {1, 31}, {1, 12}, {0, 7}};
+    for (size_t i = 0; i < fields.size(); ++i) {
+        words >> word;
+        fields[i] = fieldOf(words ? word : "", kRanges[i][0], kRanges[i][1]);
+        if (!fields[i].isPlain) {
+            return;
+        }
+    }
+    const bool isValid =
+        std::all_of(fields.begin(), fields.end(), [](const Field &field) { return field.isValid; });
+    std::getline(words >> std::ws, word);
+    REQUIRE(judged == (isValid && word.starts_with("root ") ? 0 : isValid ? judged : 1));
+    REQUIRE(judged != 0 ||
+            (times.minutes == fields[0].values && times.hours == fields[1].values &&
+             times.monthDays == fields[2].values && times.months == fields[3].values &&
+             times.weekDays == ((fields[4].values | fields[4].values >> 7) & 0x7f)));
 }
 
 void requireVerdict(const std::string &line) {
@@ -93,19 +172,28 @@ void requireVerdict(const std::string &line) {
     REQUIRE(judged == (reason[0] == '\0' ? 0 : 1));
     REQUIRE(times.minutes >> 60 == 0 && times.hours >> 24 == 0 && times.weekDays >> 7 == 0 &&
             times.months >> 13 == 0 && (times.months & 1) == 0 && (times.monthDays & 1) == 0);
+    if (line.find_first_not_of("0123456789*/,- \t") == line.find("root")) {
+        requireTimes(line.c_str(), judged, times);
+    }
 }
 
 } // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+void fuzz::test(Input input) {
     static const bool isStored = (fuzz::storeTasks(kTasks), true);
     static_cast<void>(isStored);
-    fuzz::Input input(data, size);
     const std::string content = input.rest();
     for (std::string line : fuzz::linesOf(content)) {
         requireVerdict(line.substr(0, line.find('\n')));
     }
-    requireSynced(content);
-    requireLines(content);
-    return 0;
+    switch (content.size() % 4) {
+    case 2:
+        requireSetLine(content);
+        break;
+    case 3:
+        requireSchedule(content);
+        break;
+    default:
+        requireSynced(content, content.size() % 4 == 0);
+    }
 }

@@ -88,8 +88,7 @@ void requireDays(const std::string &text) {
 
 } // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-    fuzz::Input input(data, size);
+void fuzz::test(Input input) {
     const std::string text = input.text();
     requireDate(text);
     requireTime(text);
@@ -105,5 +104,4 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     other.month = input.number(1) % 2 == 0 ? date.month : input.number(4);
     other.day = input.number(4);
     REQUIRE(TAVISchedDateComp(&date, &other) == -TAVISchedDateComp(&other, &date));
-    return 0;
 }

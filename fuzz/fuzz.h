@@ -2,6 +2,7 @@
 // which no program is started, nothing is logged and nobody waits; and what must hold.
 #pragma once
 
+#include "files.h"
 #include "platc.h"
 #include "tavischeduler.h"
 #include "tavisdk.h"
@@ -34,8 +35,6 @@ extern time_t now;
 // How many bytes a read gives at most; 0 = as many as there are.
 extern size_t readStep;
 
-std::string readFile(const char *path);
-void writeFile(const char *path, std::string_view content);
 // Both task files.
 void storeTasks(std::string_view content);
 
@@ -56,6 +55,9 @@ class Input {
 // Every line with its line feed; the last may have none.
 std::vector<std::string> linesOf(std::string_view text);
 
+// A target's own: what must hold of this input.
+void test(Input input);
+
 using Pairs = std::map<std::string, std::string>;
 using Hash = std::unique_ptr<PLATCSZHASH, decltype(&PLATCSzHashFree)>;
 using List = std::unique_ptr<PLATCSZLIST, decltype(&PLATCSzListFree)>;
@@ -69,6 +71,8 @@ std::vector<std::string> textsOf(const PLATCSZLIST *list);
 Task newTask();
 // The stored form.
 Pairs formOf(const TAVI_SCHED_TASK &task);
+// The task's line of the crontab is made, and that of a sound one is taken by cron.
+void requireLine(const TAVI_SCHED_TASK &task, bool isSound);
 // Calls the function with each task and answers how many the library has told of.
 int listTasks(const std::function<void(const TAVI_SCHED_TASK &)> &onTask);
 

@@ -4,13 +4,107 @@
 #include "fuzz.h"
 #include "text/utf8.h"
 #include "json/import.h"
+#include "json/json.h"
 #include "json/web.h"
 
+#include <algorithm>
 #include <json/writer.h>
 
 namespace {
 
 using tavisched::Imported;
+
+// ---- What the members say ----
+
+constexpr struct {
+    const char *name;
+    uint32_t TAVI_SCHED_TASK::*field;
+} kNumbers[] = {
+    {"runHour", &TAVI_SCHED_TASK::runHour},       {"runMinute", &TAVI_SCHED_TASK::runMin},
+    {"repeatHour", &TAVI_SCHED_TASK::repeatHour}, {"lastWorkHour", &TAVI_SCHED_TASK::lastWorkHour},
+    {"startYear", &TAVI_SCHED_TASK::startYear},   {"startMonth", &TAVI_SCHED_TASK::startMonth},
+    {"startDay", &TAVI_SCHED_TASK::startDay}};
+constexpr struct {
+    const char *name;
+    int32_t TAVI_SCHED_TASK::*field;
+} kFlags[] = {{"canRunTaskSameTime", &TAVI_SCHED_TASK::canRunTaskSameTime},
+              {"canRunAppSameTime", &TAVI_SCHED_TASK::canRunAppSameTime},
+              {"listable", &TAVI_SCHED_TASK::listable},
+              {"canEditName", &TAVI_SCHED_TASK::canEditName},
+              {"canEditOwner", &TAVI_SCHED_TASK::canEditOwner},
+              {"canRunFromUI", &TAVI_SCHED_TASK::canRunFromUI},
+              {"canDeleteFromUI", &TAVI_SCHED_TASK::canDeleteFromUI},
+              {"canEditFromUI", &TAVI_SCHED_TASK::canEditFromUI},
+              {"simpleEditForm", &TAVI_SCHED_TASK::simpleEditForm}};
+
+std::string weekOf(const Json::Value &days) {
+    std::string week = "0000000";
+    for (const Json::Value &day : days) {
+        for (size_t i = 0; i < week.size(); ++i) {
+            week[i] = day == TAVISchedWeekDayNames[i] ? '1' : week[i];
+        }
+    }
+    return week;
+}
+
+bool isOfNames(const Json::Value &days) {
+    return days.isArray() && std::all_of(days.begin(), days.end(), [](const Json::Value &day) {
+               return std::any_of(std::begin(TAVISchedWeekDayNames),
+                                  std::end(TAVISchedWeekDayNames),
+                                  [&day](const char *name) { return day == name; });
+           });
+}
+
+void requirePlain(const Json::Value &element, const TAVI_SCHED_TASK &task) {
+    for (const auto &[name, field] : kNumbers) {
+        REQUIRE(!element.isMember(name) || element[name].asUInt() == task.*field);
+    }
+    for (const auto &[name, field] : kFlags) {
+        REQUIRE(!element.isMember(name) || element[name].asBool() == (task.*field == 1));
+    }
+    const std::pair<const char *, const char *> texts[] = {
+        {"name", task.name},
+        {"command", task.command},
+        {"app", task.app},
+        {"appName", task.appName},
+        {"appArgs", task.appArgs},
+        {"action", task.action},
+        {"editDialog", task.editDialog},
+        {"editForm", task.editForm},
+        {"state", TAVISchedEnumToName(TAVISchedStateTable, task.state)},
+        {"type", TAVISchedEnumToName(TAVISchedTypeTable, task.type)}};
+    for (const auto &[name, text] : texts) {
+        REQUIRE(!element.isMember(name) || element[name] == text);
+    }
+    const bool isEveryDay =
+        task.backend == TAVI_SCHED_BACKEND_AUTOPOWER && task.type == TAVI_SCHED_TYPE_DAILY;
+    REQUIRE(isEveryDay || !isOfNames(element["week"]) || weekOf(element["week"]) == task.week);
+}
+
+void requireMembers(const Json::Value &element, const TAVI_SCHED_TASK &task) {
+    if (!tavisched::isWebTask(element)) {
+        requirePlain(element, task);
+        return;
+    }
+    const fuzz::Pairs form = fuzz::formOf(task);
+    for (const std::string &key : element.getMemberNames()) {
+        Json::Value value;
+        const bool isRead = !tavisched::parseJson(element[key].asString(), true, value);
+        const bool differs = key == "owner" || key == "week"; // by the owner's name, and the type
+        REQUIRE(isRead && (!form.contains(key) || differs || value == form.at(key)));
+    }
+}
+
+void requireMembers(const std::string &text, const std::vector<Imported> &tasks) {
+    Json::Value root;
+    REQUIRE(!tavisched::parseJson(text, false, root));
+    REQUIRE(tasks.size() == (root.isObject() ? 1 : root.size()));
+    for (Json::ArrayIndex i = 0; i < tasks.size(); ++i) {
+        requireMembers(root.isObject() ? root : root[i], *tasks[i].task);
+    }
+}
+
+// ---- Another import ----
 
 Json::Value exported(const TAVI_SCHED_TASK &task, bool web) {
     return web ? tavisched::webTask(task) : tavisched::plainStored(task);
@@ -35,20 +129,21 @@ void requireSame(const std::vector<Imported> &tasks, bool web) {
 
 } // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+void fuzz::test(Input input) {
+    const std::string text = input.rest();
     std::vector<Imported> tasks;
     try {
-        tasks = tavisched::parseImport(fuzz::Input(data, size).rest());
+        tasks = tavisched::parseImport(text);
     } catch (const tavisched::Refusal &refusal) {
         REQUIRE(refusal.what() == tavisched::printableLines(refusal.what()));
-        return 0;
+        return;
     }
     for (const Imported &each : tasks) {
         TAVI_SCHED_FAULT fault{};
         REQUIRE(TAVISchedTaskCheck(each.task.get(), &fault) == 0);
         tavisched::requireExchangeable(*each.task);
     }
+    requireMembers(text, tasks);
     requireSame(tasks, false);
     requireSame(tasks, true);
-    return 0;
 }

@@ -149,7 +149,7 @@ void requireChange(const std::string &content) {
     const fuzz::Hash hash = fuzz::hashOf(pairs);
     const PLATCSZHASH *const forms[] = {hash.get()};
     REQUIRE(PLATCFileEditSections(fuzz::kWorking, 1, &name, forms) == 0);
-    const std::string changed = fuzz::readFile(fuzz::kWorking);
+    const std::string changed = fuzz::contentOf(fuzz::kWorking);
     std::string expected = without(content, name);
     std::string rest = without(changed, name);
     if (rest.size() == expected.size() + 1 && rest.back() == '\n') {
@@ -160,17 +160,16 @@ void requireChange(const std::string &content) {
     REQUIRE(find(sections, name) && find(sections, name)->pairs == pairs);
     requireSection(sections, name);
     REQUIRE(PLATCFileRemoveSection(fuzz::kWorking, name) == 1);
-    REQUIRE(fuzz::readFile(fuzz::kWorking) == rest);
+    REQUIRE(fuzz::contentOf(fuzz::kWorking) == rest);
 }
 
 } // namespace
 
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-    fuzz::Input input(data, size);
+void fuzz::test(Input input) {
     fuzz::readStep = input.step();
     const std::string content = input.rest();
     const auto sections = parse(content);
-    fuzz::writeFile(fuzz::kWorking, content);
+    fuzz::contentOf(fuzz::kWorking) = content;
     for (const char *const name : {"1", "2"}) { // nothing is remembered yet
         requireSection(sections, name);
     }
@@ -180,11 +179,18 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     std::vector<std::string> expected = namesOf(sections);
     std::transform(expected.begin(), expected.end(), expected.begin(), cut);
     REQUIRE(fuzz::textsOf(names) == expected);
-    for (const std::string &name : expected) {
-        requireSection(sections, name);
+    constexpr size_t kMost = 8; // each reads the file
+    for (size_t i = 0; i < std::min(kMost, expected.size()); ++i) {
+        requireSection(sections, expected[i]);
     }
-    requireTasks(sections);
-    requireFaults(sections);
-    requireChange(content);
-    return 0;
+    switch (content.size() % 3) {
+    case 0:
+        requireTasks(sections);
+        break;
+    case 1:
+        requireChange(content);
+        break;
+    default:
+        requireFaults(sections);
+    }
 }

@@ -1,21 +1,22 @@
 // The machine of the fuzz targets: this program's own versions of what the library calls.
+#include "files.h"
 #include "fuzz.h"
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <fcntl.h>
+#include <dlfcn.h>
 #include <filesystem>
 #include <pwd.h>
+#include <sanitizer/asan_interface.h>
 #include <spawn.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
-#include <utility>
 
 namespace fuzz {
 
@@ -27,38 +28,16 @@ namespace {
 // Of the "processes" that posix_spawn answers.
 constexpr pid_t kDone = 0x3fffffff;
 
-ssize_t writeAll(int fd, std::string_view content) {
-    return fd == -1 ? -1 : write(fd, content.data(), content.size());
-}
-
 } // namespace
 
 void fail(const char *condition, const char *file, int line) {
-    std::fprintf(stderr, "%s:%d: does not hold: %s\n", file, line, condition);
+    dprintf(STDERR_FILENO, "%s:%d: does not hold: %s\n", file, line, condition);
     std::abort();
 }
 
-std::string readFile(const char *path) {
-    const size_t step = std::exchange(readStep, 0);
-    const int fd = open(path, O_RDONLY | O_CLOEXEC);
-    struct stat status {};
-    fstat(fd, &status);
-    std::string content(static_cast<size_t>(status.st_size), '\0');
-    REQUIRE(fd != -1 && read(fd, content.data(), content.size()) == status.st_size);
-    close(fd);
-    readStep = step;
-    return content;
-}
-
-void writeFile(const char *path, std::string_view content) {
-    const int fd = open(path, O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
-    REQUIRE(writeAll(fd, content) == static_cast<ssize_t>(content.size()));
-    close(fd);
-}
-
 void storeTasks(std::string_view content) {
-    writeFile(kWorking, content);
-    writeFile(kPersistent, content);
+    contentOf(kWorking) = content;
+    contentOf(kPersistent) = content;
 }
 
 uint32_t Input::number(size_t bytes) {
@@ -136,6 +115,34 @@ int listTasks(const std::function<void(const TAVI_SCHED_TASK &)> &onTask) {
     return count;
 }
 
+// At the task's own times.
+void requireLine(const TAVI_SCHED_TASK &task, bool isSound) {
+    std::array<char, 512> line{};
+    std::array<char, 512> reason{};
+    TAVI_SCHED_CRON_TIMES times{};
+    REQUIRE(TAVISchedCrontabLine(&task, line.data(), line.size()) == 0);
+    const int judged = TAVISchedCrontabLineCheck(line.data(), &times, reason.data(), reason.size());
+    REQUIRE(judged == 0 || (judged == 1 && reason[0] != '\0'));
+    if (!isSound) {
+        return;
+    }
+    uint32_t hours = 0;
+    uint32_t weekDays = 0;
+    for (uint32_t hour = task.runHour; hour <= std::max(task.runHour, task.lastWorkHour);
+         hour += std::max(task.repeatHour, 1U)) {
+        hours |= hours == 0 || task.repeatHour > 0 ? 1U << hour : 0U;
+    }
+    for (unsigned int day = 0; day < TAVI_SCHED_WEEK_DAYS; ++day) {
+        weekDays |= task.week[day] == '0' ? 0U : 1U << day;
+    }
+    const bool isOnDate = task.type == TAVI_SCHED_TYPE_ONCE || task.type == TAVI_SCHED_TYPE_YEARLY;
+    REQUIRE(judged == 0 && times.minutes == uint64_t{1} << task.runMin && times.hours == hours);
+    REQUIRE(times.weekDays == (task.type == TAVI_SCHED_TYPE_WEEKLY ? weekDays : 0x7fU));
+    REQUIRE(times.months == (isOnDate ? 1U << task.startMonth : 0x1ffeU));
+    REQUIRE(times.monthDays ==
+            (isOnDate || task.type == TAVI_SCHED_TYPE_MONTHLY ? 1U << task.startDay : 0xfffffffeU));
+}
+
 } // namespace fuzz
 
 extern "C" {
@@ -156,9 +163,21 @@ int LLVMFuzzerInitialize(int *, char ***argv) {
         std::_Exit(1);
     }
     setenv("TZ", "UTC", 1);
-    REQUIRE(symlink("/bin/true", fuzz::kRunner) == 0);
-    fuzz::writeFile(fuzz::kCrontab, "");
+    fuzz::makeFolders();
+    fuzz::contentOf(fuzz::kCrontab) = "";
     fuzz::storeTasks("");
+    return 0;
+}
+
+int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+    fuzz::readStep = 0;
+    fuzz::test(fuzz::Input(data, size));
+    fuzz::requireTidy();
+    return 0;
+}
+
+// What the process changes is not the machine's time zone.
+int unsetenv(const char *) noexcept {
     return 0;
 }
 
@@ -180,11 +199,15 @@ void syslog(int priority, const char *format, ...) {
 
 void openlog(const char *, int, int) {}
 
-ssize_t __interceptor_read(int fd, void *buffer, size_t size);
-
-ssize_t read(int fd, void *buffer, size_t size) {
-    return __interceptor_read(fd, buffer,
-                              fuzz::readStep > 0 ? std::min(fuzz::readStep, size) : size);
+// In the place of the sanitizer's own, as the fuzzer takes note of each comparison there.
+int memcmp(const void *one, const void *other, size_t size) noexcept {
+    static const auto compare = reinterpret_cast<decltype(&memcmp)>(dlsym(RTLD_NEXT, "memcmp"));
+    for (const void *const bytes : {one, other}) {
+        const auto *const begin = static_cast<const char *>(bytes);
+        REQUIRE(size == 0 || (!__asan_address_is_poisoned(begin) &&
+                              !__asan_address_is_poisoned(begin + size - 1)));
+    }
+    return compare(one, other, size);
 }
 
 // The machine's users, without a look at its files.
@@ -210,9 +233,7 @@ passwd *getpwnam(const char *name) {
 int posix_spawn(pid_t *pid, const char *path, const posix_spawn_file_actions_t *,
                 const posix_spawnattr_t *, char *const argv[], char *const[]) {
     REQUIRE(std::strcmp(path, "/bin/cp") == 0 && argv[1] && argv[2] && argv[3]);
-    const size_t step = std::exchange(fuzz::readStep, 0);
-    fuzz::writeFile(argv[3], fuzz::readFile(argv[2]));
-    fuzz::readStep = step;
+    fuzz::contentOf(argv[3]) = std::string(fuzz::contentOf(argv[2]));
     *pid = fuzz::kDone;
     return 0;
 }
@@ -229,10 +250,6 @@ pid_t waitpid(pid_t pid, int *status, int options) {
 
 int system(const char *) {
     fuzz::fail("no shell is started", __FILE__, __LINE__);
-}
-
-int fsync(int) {
-    return 0;
 }
 
 } // extern "C"

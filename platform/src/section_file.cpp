@@ -167,8 +167,9 @@ template <typename Function> void forEachFirst(std::string_view text, Function &
 
 // The text of the first section of that name, empty when there is none; nothing when the file
 // cannot be read to its end.
-std::optional<std::string> readSectionText(int fd, std::string_view name) {
-    constexpr size_t kStep = 65536;
+std::optional<std::string> readSectionText(const base::Opened &opened, std::string_view name) {
+    constexpr size_t kLongest = 65536;
+    const size_t step = std::min(kLongest, static_cast<size_t>(opened.status.st_size) + 1);
     std::string window; // begins where a line begins
     for (bool atEnd = false;;) {
         const auto section = findFirst(window, name);
@@ -180,7 +181,7 @@ std::optional<std::string> readSectionText(int fd, std::string_view name) {
         }
         window.erase(0, section ? section->header : window.rfind('\n') + 1);
         // A section larger than the window is looked at again as often as the window doubles.
-        auto more = base::readSome(fd, std::max(kStep, window.size()));
+        auto more = base::readSome(opened.file.get(), std::max(step, window.size()));
         if (!more) {
             return std::nullopt;
         }
@@ -190,8 +191,8 @@ std::optional<std::string> readSectionText(int fd, std::string_view name) {
 }
 
 // 1 found and read into the hash, 0 no such section, -1.
-int readSection(int fd, std::string_view name, PLATCSZHASH &hash) {
-    const auto text = readSectionText(fd, name);
+int readSection(const base::Opened &opened, std::string_view name, PLATCSZHASH &hash) {
+    const auto text = readSectionText(opened, name);
     if (!text) {
         return PLATFORM_FAIL(platform::kReadWriteFailed);
     }
@@ -325,7 +326,7 @@ int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH *
     return guarded(
         [&] {
             const auto opened = platform::openFile(szPath);
-            return opened ? readSection(opened->file.get(), szSection, **ppHash) : -1;
+            return opened ? readSection(*opened, szSection, **ppHash) : -1;
         },
         -1);
 }

@@ -305,34 +305,37 @@ void addMachineCommands(CLI::App &app, Settings &given, Command &command) {
 
 // Letters that must be added, left out, changed or exchanged with the next one.
 size_t distance(const std::string &one, const std::string &other) {
-    std::vector<std::vector<size_t>> steps(one.size() + 1, std::vector<size_t>(other.size() + 1));
+    const size_t width = other.size() + 1;
+    std::vector<size_t> steps((one.size() + 1) * width);
+    const auto at = [&](size_t i, size_t j) -> size_t & { return steps[i * width + j]; };
     for (size_t i = 0; i <= one.size(); ++i) {
         for (size_t j = 0; j <= other.size(); ++j) {
             if (i == 0 || j == 0) {
-                steps[i][j] = i + j;
+                at(i, j) = i + j;
                 continue;
             }
             const bool isSame = one[i - 1] == other[j - 1];
-            steps[i][j] = std::min(
-                {steps[i - 1][j] + 1, steps[i][j - 1] + 1, steps[i - 1][j - 1] + (isSame ? 0 : 1)});
+            at(i, j) =
+                std::min({at(i - 1, j) + 1, at(i, j - 1) + 1, at(i - 1, j - 1) + (isSame ? 0 : 1)});
             if (i > 1 && j > 1 && one[i - 1] == other[j - 2] && one[i - 2] == other[j - 1]) {
-                steps[i][j] = std::min(steps[i][j], steps[i - 2][j - 2] + 1);
+                at(i, j) = std::min(at(i, j), at(i - 2, j - 2) + 1);
             }
         }
     }
-    return steps[one.size()][other.size()];
+    return at(one.size(), other.size());
 }
 
 // "; did you mean ...?", or "" when nothing is near.
 std::string suggest(const std::string &typed, const std::vector<std::string> &known) {
-    const auto nearest =
-        std::min_element(known.begin(), known.end(), [&](const auto &one, const auto &other) {
-            return distance(typed, one) < distance(typed, other);
-        });
-    const size_t most = std::max<size_t>(1, typed.size() / 3);
-    return nearest == known.end() || distance(typed, *nearest) > most
-               ? ""
-               : "; did you mean \"" + *nearest + "\"?";
+    const std::string *nearest = nullptr;
+    size_t least = std::max<size_t>(1, typed.size() / 3) + 1;
+    for (const std::string &name : known) {
+        if (const size_t steps = distance(typed, name); steps < least) {
+            nearest = &name;
+            least = steps;
+        }
+    }
+    return nearest ? "; did you mean \"" + *nearest + "\"?" : "";
 }
 
 std::vector<std::string> optionsOf(const CLI::App &app) {
@@ -450,43 +453,51 @@ int execute(const Command &command, const Failing &fail) {
     }
 }
 
-// Parses the command line and executes what it asks for.
-int tavischedMain(int argc, char **argv) {
-    CLI::App app("Scheduled tasks: list, change and run them, and check the machine.", "tavisched");
+// The options and subcommands, and what was typed of them.
+struct CommandLine {
+    CLI::App app{"Scheduled tasks: list, change and run them, and check the machine.", "tavisched"};
     Settings given;
     Command command;
     bool verbose = false;
-    app.set_version_flag("--version", kVersion);
-    app.add_flag("-v,--verbose", verbose, "show the library's log lines on standard error");
-    app.footer("\"ls\" and \"rm\" stand for list and remove.\n"
-               "\"tavisched COMMAND --help\" shows a command's options and an example.");
-    app.require_subcommand(0, 1);
-    addReadingCommands(app, given, command);
-    addChangingCommands(app, given, command);
-    addMachineCommands(app, given, command);
+
+    CommandLine() {
+        app.set_version_flag("--version", kVersion);
+        app.add_flag("-v,--verbose", verbose, "show the library's log lines on standard error");
+        app.footer("\"ls\" and \"rm\" stand for list and remove.\n"
+                   "\"tavisched COMMAND --help\" shows a command's options and an example.");
+        app.require_subcommand(0, 1);
+        addReadingCommands(app, given, command);
+        addChangingCommands(app, given, command);
+        addMachineCommands(app, given, command);
+    }
+};
+
+// Parses the command line and executes what it asks for.
+int tavischedMain(CommandLine &line, int argc, char **argv) {
     std::vector<std::string> arguments = argumentsOf(argc, argv);
     const Failing fail(std::find(arguments.begin(), arguments.end(), "--json") != arguments.end());
     try {
-        app.parse(std::move(arguments));
+        line.app.parse(std::move(arguments));
     } catch (const CLI::ParseError &error) {
         return error.get_exit_code() == 0
-                   ? app.exit(error)
-                   : fail.with(Refusal(explain(app, error), optionNamed(error.what())));
+                   ? line.app.exit(error)
+                   : fail.with(Refusal(explain(line.app, error), optionNamed(error.what())));
     }
-    if (!command) {
+    if (!line.command) {
         return fail.with(Refusal("a command is needed; \"tavisched --help\" lists them"));
     }
     unsetenv("TZ"); // times are the machine's, as cron takes them
     umask(022);
-    openlog("tavisched", LOG_PID | (verbose ? LOG_PERROR : 0), LOG_USER);
-    return execute(command, fail);
+    openlog("tavisched", LOG_PID | (line.verbose ? LOG_PERROR : 0), LOG_USER);
+    return execute(line.command, fail);
 }
 
 } // namespace
 
 int main(int argc, char **argv) {
     try {
-        return tavischedMain(argc, argv);
+        CommandLine line;
+        return tavischedMain(line, argc, argv);
     } catch (const std::bad_alloc &) {
         std::fputs("tavisched: out of memory\n", stderr);
     } catch (const std::exception &error) {

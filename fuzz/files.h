@@ -1,0 +1,17 @@
+// The files of the fuzz targets' machine, in memory.
+#pragma once
+
+#include <string>
+
+namespace fuzz {
+
+// The machine's folders, and the runner's link.
+void makeFolders();
+
+// The file's bytes, to be read and written. It is made when it is not there.
+std::string &contentOf(const char *path);
+
+// Nothing is open, and no temporary file is left.
+void requireTidy();
+
+} // namespace fuzz

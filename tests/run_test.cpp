@@ -46,10 +46,12 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
         setenv(name, "C", 1);
     }
     setenv("TZ", "UTC", 1);
-    // What takes the shell's place has its mask; what the shell starts has a cleared one.
+    // What takes the shell's place has its mask; what the shell starts has a cleared one. Of ours
+    // it has the pipe that is its output, and nothing else.
     Task task = newTask("{ (exec grep -E '^(Uid|Gid|Groups|CapPrm|SigBlk|SigIgn):' "
                         "/proc/self/status); readlink /proc/$$/exe; pwd; "
-                        "env | grep -v ^_= | sort; } > /tmp/home/seen");
+                        "env | grep -v ^_= | sort; } > /tmp/home/seen; readlink /proc/$$/fd/*; "
+                        "echo named > /dev/stderr; ! ls /var/lib/tavischeduler");
     task->owner = 4242;
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     std::array<char, 32> ignored{}; // by this program, so by the command too
@@ -65,6 +67,12 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
                   "HOME=/tmp/home\nLANG=C\nLC_TIME=C\nLOGNAME=tavitest\n"
                   "PATH=/usr/local/bin:/usr/bin:/bin\nPWD=/tmp/home\nSHELL=/bin/false\n"
                   "TAVI_RUN_ID=1\nTAVI_TASK_ID=1\nTAVI_TASK_NAME=Task 1\nTZ=UTC\nUSER=tavitest\n");
+    EXPECT_THAT(readFile("/var/lib/tavischeduler/output/1"),
+                testing::MatchesRegex("/dev/null\n(pipe:.[0-9]+.)\n(pipe:.[0-9]+.)\nnamed\n"
+                                      "ls: cannot open directory .*"));
+    EXPECT_EQ(shell("find /var/lib/tavischeduler ! -user root -o ! -group root -o -type f -perm "
+                    "/077 ! -name 'runs.sqlite*' | grep ."),
+              1);
     EXPECT_EQ(rows(), "1:3: ");
     EXPECT_EQ(statusOf("/tmp/sched_status.sqlite").st_uid, 0U);
     EXPECT_THAT(logs(), IsEmpty());
@@ -84,7 +92,7 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
     unlink("/tmp/home/seen");
     EXPECT_EQ(run(1), 0);
     EXPECT_EQ(readFile("/tmp/home/seen"), "");
-    EXPECT_EQ(rows(), "1:3: 1:3: 1:2: ");
+    EXPECT_EQ(rows(), "1:3: 1:7:1 1:2: ");
     EXPECT_THAT(logs(), ElementsAre(HasSubstr("Get uid [4999] failed. [0x0B00 user.cpp:*]"),
                                     HasSubstr("Failed to set user context. uid:[4999] [0x2A00 ")));
 }

@@ -58,8 +58,7 @@ int resultOf(pid_t pid) {
 }
 
 int addByTool() {
-    return shell("'" TAVISCHED "' add --name \"root's\" --command true --at 03:00 >> /run/output "
-                 "2>&1");
+    return shell("'" TAVISCHED "' add --name \"root's\" --command x --at 3:00 >> /run/output 2>&1");
 }
 
 size_t linesWith(const char *text, const char *path) {
@@ -267,8 +266,7 @@ class LocalUser : public Concurrency {
             EXPECT_TRUE(holds(tried++)) << testing::PrintToString(logs());
             logs();
         }
-        std::printf("local user: %s: %ld tries of root, %ld of the user\n", what, tried,
-                    shared().looks.load());
+        std::printf("%s: %ld tries of root, %ld of the user\n", what, tried, shared().looks.load());
         EXPECT_GT(shared().looks, 0);
     }
 

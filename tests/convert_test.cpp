@@ -60,8 +60,7 @@ TEST_F(Convert, HashHoldsEveryPersistentFieldOnOneLine) {
 
 TEST_F(Convert, TaskTakesDefaultsClampsNumbersAndIgnoresStrangers) {
     setRequired();
-    set("backend=-3;next trigger time=soon;can edit name=2x;type=hourly;start month=;"
-        "id=99999999999;");
+    set("backend=-3;next trigger time=now;can edit name=2x;type=hour;start month=;id=99999999999;");
     TAVI_SCHED_TASK task{};
     task.backend = -2;
     task.type = Monthly;

@@ -211,9 +211,8 @@ TEST_F(Cron, TakesTheLinesThatTheLibraryTakes) {
     };
     for (const auto &[line, taken] : cases) {
         char reason[512] = "x";
-        EXPECT_EQ(TAVISchedCrontabLineCheck(line.c_str(), nullptr, reason, sizeof reason),
-                  taken ? 0 : 1)
-            << line;
+        const int result = TAVISchedCrontabLineCheck(line.c_str(), nullptr, reason, sizeof reason);
+        EXPECT_EQ(result, taken ? 0 : 1) << line;
         EXPECT_EQ(reason[0] == '\0', taken) << reason;
     }
     if (!hasCron()) {

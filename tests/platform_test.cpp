@@ -299,9 +299,8 @@ TEST_F(Platform, DetachedChildren) {
     const int child = std::stoi(readFile("/tmp/detached"));
     EXPECT_EQ(PLATCProcAlive(child), 1);
     EXPECT_NE(getsid(child), getsid(0));
-    EXPECT_EQ(shell("test \"$(readlink /proc/" + std::to_string(child) +
-                    "/fd/[012] | sort -u)\" = /dev/null"),
-              0);
+    const std::string files = "/proc/" + std::to_string(child) + "/fd/[012]";
+    EXPECT_EQ(shell("test \"$(readlink " + files + " | sort -u)\" = /dev/null"), 0);
     kill(child, SIGKILL);
     waitForChildren();
 }

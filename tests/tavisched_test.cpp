@@ -228,8 +228,7 @@ TEST_F(CommandLine, PowerSchedulesAreEditedAndRefused) {
     EXPECT_THAT(done("remove 80022330 --yes"), HasSubstr("removed"));
     const std::string before = machine();
     for (const char *const add : {"add --power on --at 06:00", "add --power on --dry-run"}) {
-        EXPECT_THAT(failed(add),
-                    HasSubstr("this machine has no clock that can switch it on: /sys"));
+        EXPECT_THAT(failed(add), HasSubstr("machine has no clock that can switch it on: /sys"));
         EXPECT_EQ(machine(), before);
     }
     EXPECT_THAT(done("check"), HasSubstr("note: this machine has no clock that can wake it (/sys"));
@@ -270,7 +269,7 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
     EXPECT_THAT(readFile("/tmp/seen"), AllOf(HasSubstr("SHELL"), Not(HasSubstr("99"))));
     done("edit 1 --at 9:00 --enabled");
     EXPECT_THAT(readFile(kCrontab),
-                HasSubstr("0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1"));
+                HasSubstr("\n0\t9\t*\t*\t*\troot\t/tmp/tavischedtask --run id=1"));
 }
 
 // What was shown must still be true when the answer comes.
@@ -344,8 +343,7 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     for (const char *const how : {" --dry-run", ""}) {
         EXPECT_THAT(done(std::string("edit 1 --daily --at 05:00") + how), HasSubstr(off)) << how;
     }
-    EXPECT_THAT(done("add --command x --at 05:00 --app a"),
-                AllOf(HasSubstr(off), HasSubstr(meets)));
+    EXPECT_THAT(done("add --command x --at 5:00 --app a"), AllOf(HasSubstr(off), HasSubstr(meets)));
     const std::string dry = done("edit 3 --at 05:01 --dry-run --json");
     EXPECT_THAT(dry, AllOf(HasSubstr("\"runMinute\": 1,"), HasSubstr("machine off")));
     EXPECT_THAT(dry, Not(HasSubstr("same")));
@@ -493,8 +491,7 @@ TEST_F(CommandLine, ImportsWhatPeopleWrite) {
     // A task is not taken for a power schedule.
     writeFile("/tmp/in.json", R"([{"command": "x", "appArgs": "poweroff", "week": "Mon"},
         {"backend": -3, "appArgs": "poweroff", "week": "Mon", "type": "weekly"}])");
-    EXPECT_THAT(done("import --dry-run /tmp/in.json"),
-                testing::EndsWith("stored under a new id\n"));
+    EXPECT_THAT(done("import --dry-run /tmp/in.json"), ContainsRegex("stored under a new id\n$"));
     // What is printed can be edited and goes in again.
     done("show 2 --json | sed 's/\"runHour\": 7/\"runHour\": 8/' > /tmp/two.json");
     done("import --replace /tmp/two.json");
@@ -598,9 +595,8 @@ TEST_F(CommandLine, TellsHowRunsEnded) {
                          {"--failed --limit 3", "missed|exit 127|not started: no such user|"},
                          {"1 --failed", "There are no such runs of task 1 (Task 1) on record.|"}};
     for (const auto &[options, results] : cases) {
-        EXPECT_EQ(
-            done(std::string("history ") + options + " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'"),
-            results);
+        const std::string filter = " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'";
+        EXPECT_EQ(done("history " + (options + filter)), results);
     }
 }
 
@@ -655,8 +651,7 @@ TEST_F(CommandLine, DoesWithoutRecords) {
     done("add --command 'exit 3'");
     shell("rm -rf $RUNS/*; mkdir $RUNS/runs.sqlite");
     EXPECT_THAT(ended(3, "run 1 --wait"), HasSubstr("(Task 1): exit 3, and not recorded; "));
-    EXPECT_THAT(run("list"),
-                AllOf(HasSubstr("records of runs cannot be read"), HasSubstr("Task 1")));
+    EXPECT_THAT(run("list"), ContainsRegex("records of runs cannot be read.*Task 1"));
     EXPECT_THAT(run("check"), HasSubstr("runs.sqlite is no file"));
     for (const char *const command : {"history", "log 1", "stop 1", "run --missed"}) {
         EXPECT_THAT(failed(command), HasSubstr("; see \"tavisched check\"")) << command;
@@ -845,10 +840,8 @@ TEST_F(CommandLine, FiltersAndSortsLists) {
                          {"--sort next", "2 1 3 "},
                          {"--sort next --reverse", "1 2 3 "}};
     for (const auto &[options, ids] : cases) {
-        EXPECT_EQ(done(std::string("list ") + options +
-                       " | awk 'NR > 1 && $1 != \"-\" { printf $1 \" \" }'"),
-                  ids)
-            << options;
+        const std::string filter = " | awk 'NR > 1 && $1 != \"-\" { printf $1 \" \" }'";
+        EXPECT_EQ(done("list " + (options + filter)), ids) << options;
     }
     EXPECT_THAT(done("ls --sort last --reverse"), ContainsRegex("\n[12]  .*\n[12]  .*\n3  Old"));
 }
@@ -890,8 +883,7 @@ TEST_F(CommandLine, SaysWhatStandsInItsWay) {
     EXPECT_THAT(run("check"), HasSubstr("All is well."));
     shell("umount -n /usr/tavi/etc");
     for (const char *const command : {"list", "add --command z", "check", "run 1", "export"}) {
-        EXPECT_THAT(ended(1, command, "setpriv --reuid=1 --clear-groups "),
-                    HasSubstr("run by root"));
+        EXPECT_THAT(ended(1, command, "setpriv --reuid=1 "), HasSubstr("run by root"));
     }
 }
 

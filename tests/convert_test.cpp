@@ -87,14 +87,6 @@ TEST_F(Convert, BadValuesAreReported) {
     set("start year=2013x;");
     EXPECT_EQ(failure(TAVISchedInitTaskFromHash(hash_, &task)), 0x4000U);
     EXPECT_THAT(logs(), ElementsAre(HasSubstr("cpp:* parm_table[12].fnFromHashStr failed.")));
-    set("start year=2013;");
-    // Cut at the field's end a text must fail: a shortened command must never run.
-    for (const std::string &bad :
-         std::vector<std::string>{"dHJ1ZQ=", "dHJ1 ZQ==", std::string(16384, 'A')}) {
-        set("cmd=" + bad + ";");
-        EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, &task), -1);
-        EXPECT_THAT(logs(), ElementsAre(HasSubstr("Base64 decoding failed. [" + bad.substr(0, 4))));
-    }
 }
 
 // The conversion itself is the judge: a form without a fault comes back as it was, one that cannot
@@ -134,6 +126,7 @@ TEST_F(Convert, ChecksForeseeWhatComesBack) {
          "\"eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4eHh4…\" is not the base64 text "
          "of a command of at most 12285 bytes"},
         {"cmd=dHJ1ZQ=;", Unreadable, "cmd", "\"dHJ1ZQ=\" is not the base64"},
+        {"cmd=dHJ1 ZQ==;", Unreadable, "cmd", "is not the base64"},
         {"cmd=YQBi;", Value, "cmd", "\"YQBi\" is not the base64"},
         {"typ=x;", TAVI_SCHED_FAULT_UNKNOWN_KEY, "typ", "no task has it; accepted: id, can edit"},
         {"backend=x;", TAVI_SCHED_FAULT_UNKNOWN_KEY, "backend", "no task has it"},
@@ -161,7 +154,9 @@ TEST_F(Convert, ChecksForeseeWhatComesBack) {
         EXPECT_EQ(TAVISchedInitTaskFromHash(hash_, task.get()), c.kind == Unreadable ? -1 : 0);
         EXPECT_EQ(TAVISchedInitHashFromTask(&hash_, task.get()), 0);
         EXPECT_TRUE((values({key.c_str()}) == value) == (c.kind == 0) || key.empty());
-        logs();
+        // Cut at the field's end a text must fail: a shortened command must never run.
+        const std::string failed = "Base64 decoding failed. [" + value.substr(0, 4);
+        EXPECT_THAT(lastLog(), HasSubstr(c.kind == Unreadable && key == "cmd" ? failed : ""));
     }
     PLATCHashRemoveAll(hash_);
     set("id=x;zz=;aa=;");

@@ -32,7 +32,7 @@ class CommandLine : public SchedTest {
     }
     // One process stands for a cron that is running and takes its signals.
     static void SetUpTestSuite() {
-        setenv("PATH", ("/usr/tavi/bin:" + std::string(getenv("PATH"))).c_str(), 1);
+        setenv("PATH", "/usr/tavi/bin:/usr/sbin:/usr/bin:/sbin:/bin", 1);
         setenv("BOTH", "/tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks", 1);
         setenv("RUNS", "/var/lib/tavischeduler", 1);
         setenv("HANDLERS", "/usr/tavi/etc/plugins/task_scheduler", 1);
@@ -121,20 +121,15 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"disable 1 9", "there is no task 9"},
         {"remove 1 9 --yes", "there is no task 9"},
         {"remove 1", "--yes removes without a question"},
-        {"show 9", "there is no task 9"},
         {"list --next 24", "--next: \"24\" is not accepted; accepted: a time such as 30m"},
         {"run 9", "there is no task 9"},
-        {"history 9", "there is no task 9"},
         {"list --sort colour", "--sort: colour not in"},
         {"edit 4 --at 08:00", "task 4 (Task 4) is kept under another number"},
         {"remove 01x --yes", "\"01x\" is no id; accepted"},
         {"history --limit 0", "--limit: Value 0 not in range"},
         {"history --since 2026-02-30", "--since: \"2026-02-30\" is not accepted; accepted: a time"},
-        {"log 9", "there is no task 9"},
         {"log 1 --run 7", "task 1 has no run 7; \"tavisched history 1\" lists its runs"},
-        {"log 1 --run=-1", "task 1 has no run -1"},
         {"log 1 --run 1x", "\"1x\" is no run"},
-        {"stop 1", "task 1 (Task 1) is not running"},
         {"stop 1 --after -1", "--after: Value -1 not in range"},
         {"frobnicate", "there is no command \"frobnicate\"\n\"tavisched --help\""},
         {"lsit 3", "there is no command \"lsit\"; did you mean \"list\"?"},

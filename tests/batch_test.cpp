@@ -14,18 +14,14 @@ class Batch : public SchedTest {
     void SetUp() override {
         SchedTest::SetUp();
         storedTask();
-        before_ = machine();
+        before_ = stateNow();
     }
     void TearDown() override {
         TAVISchedChangeRollback();
         SchedTest::TearDown();
     }
-    static std::string machine() {
-        return readFile(kWorking) + "|" + readFile(kPersistent) + "|" + readFile(kCrontab) + "|" +
-               readFile(kPower);
-    }
 
-    std::string before_;
+    State before_;
 };
 
 TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
@@ -42,7 +38,7 @@ TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
     EXPECT_EQ(TAVISchedTaskGetByID(3, &back), 0);
     EXPECT_STREQ(back.name, "third");
     EXPECT_STREQ(newTask()->name, "Task 2");
-    EXPECT_EQ(machine(), before_);
+    EXPECT_EQ(stateNow(), before_);
     EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; ");
     ASSERT_EQ(TAVISchedChangeCommit(), 0);
     EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; 3 third echo 3; 91272230 PowerOff task 0 ; ");
@@ -75,7 +71,7 @@ TEST_F(Batch, EndsWithoutATrace) {
         EXPECT_EQ(TAVISchedTaskRemove(1), 0);
         EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 1, 2).get()), 0);
         EXPECT_TRUE(end());
-        EXPECT_EQ(machine(), before_);
+        EXPECT_EQ(stateNow(), before_);
         EXPECT_THAT(listedIds(), ElementsAre(1));
     }
 }
@@ -86,7 +82,7 @@ TEST_F(Batch, MisuseIsRefused) {
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
     EXPECT_EQ(failure(TAVISchedChangeBegin()), 0x0D00U);
     EXPECT_EQ(TAVISchedChangeCommit(), 0); // of nothing
-    EXPECT_EQ(machine(), before_);
+    EXPECT_EQ(stateNow(), before_);
 }
 
 // Neither a section that nobody can read nor ids below 1 stand in the way.
@@ -176,7 +172,7 @@ TEST_F(Batch, NewTasksUnderGivenIds) {
         task->id = id;
         EXPECT_EQ(failure(TAVISchedTaskCreateWithId(task.get())), 0x0D00U) << id;
     }
-    EXPECT_EQ(machine(), before_);
+    EXPECT_EQ(stateNow(), before_);
     task->id = 40;
     EXPECT_EQ(TAVISchedTaskCreateWithId(task.get()), 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 40));

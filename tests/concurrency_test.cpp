@@ -1,5 +1,4 @@
-// Several processes at once: writers and readers through the library, the tool and the runner,
-// plug-in handlers that use the library themselves, and another user who interferes in /tmp.
+// Several processes at once: writers, readers, plug-in handlers, and another user in /tmp.
 #include "arrange.h"
 #include "machine.h"
 

@@ -89,8 +89,7 @@ TEST_F(Convert, BadValuesAreReported) {
     EXPECT_THAT(logs(), ElementsAre(HasSubstr("cpp:* parm_table[12].fnFromHashStr failed.")));
 }
 
-// The conversion itself is the judge: a form without a fault comes back as it was, one that cannot
-// be read has a fault that says so.
+// The conversion is the judge: what has no fault comes back as it was, and nothing else does.
 TEST_F(Convert, ChecksForeseeWhatComesBack) {
     const auto repeated = [](const char *text, int count) {
         std::string result = "cmd=";

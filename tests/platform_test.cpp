@@ -183,8 +183,7 @@ TEST_F(Platform, WhatAHandSpoiltInASectionFileIsTold) {
     PLATCSzListFree(faults);
 }
 
-// A change that is answered with success outlives a loss of power; what a restart empties needs no
-// flush.
+// What is answered with success outlives a loss of power, but for what a restart empties.
 TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
     TAVIAUTOPOWER entry{};
     TAVISCHEDULE schedule{};

@@ -171,8 +171,7 @@ TEST_F(Records, LongOutputsKeepTheirEnds) {
     }
 }
 
-// An endless printer is followed while it prints, fills no disk, and its result is not waited for
-// by those whom it does not concern.
+// An endless printer is followed while it prints, and fills no disk.
 TEST_F(Records, EndlessOutputIsFollowedAndStopped) {
     storedTask("seq -f %015.0f 0 inf");
     const int64_t run = started(1).run;

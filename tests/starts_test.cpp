@@ -85,8 +85,7 @@ TEST_F(Starts, WhereTheClockIsChanged) {
         const When when{row.from, Daily, {}, {row.run[0], row.run[1]}, row.every, row.last, ""};
         EXPECT_EQ(of(*taskOf(when), row.from, row.days), row.starts) << row.zone;
     }
-    // What cron catches up after a skipped hour is not due any more, but nothing asks a power-off
-    // for that; and the wake alarm is set by the clock before.
+    // Nothing asks a power-off whether it is due; the wake alarm is set by the clock before.
     setZone("Europe/Berlin");
     EXPECT_EQ(of(*powerTask("poweroff", 2, 30), "2024-03-31 00:00", 1), "03-31 03:00s");
     EXPECT_EQ(of(*powerTask("poweron", 2, 30), "2024-03-31 00:00", 1), "03-31 03:30s");
@@ -135,9 +134,7 @@ TEST_F(Starts, NextOneIsFoundHoweverFarAway) {
     }
 }
 
-// The machine is off from 23:30 to 01:00; task 7 of the same application starts on Sundays at
-// 05:00.
-// Each is to make one remark, that is so.
+// The machine is off from 23:30 to 01:00; task 7 of the same application starts on Sundays at 5.
 TEST_F(Starts, RemarksOnSchedules) {
     const struct {
         When when;

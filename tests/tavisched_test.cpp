@@ -841,8 +841,7 @@ TEST_F(CommandLine, FiltersAndSortsLists) {
     EXPECT_THAT(done("ls --sort last --reverse"), ContainsRegex("\n[12]  .*\n[12]  .*\n3  Old"));
 }
 
-// The first one is started by people, the second one waits for it; the handler ends when both have
-// told.
+// The handler ends when both have told.
 TEST_F(CommandLine, SaysForWhatItWaits) {
     done("add --command x");
     addHandler("slow", "touch /tmp/slow; [ $2 = post ] || timeout 60 sh -c 'until grep -q waiting "

@@ -16,13 +16,13 @@ inline void addHandler(const std::string &name, const std::string &script, mode_
 }
 
 // A new power schedule of every day: "poweron" or "poweroff".
-inline Task powerTask(const char *kind, uint32_t hour = 0, uint32_t minute = 0) {
+inline Task powerTask(const char *kind, int hour = 0, int minute = 0) {
     Task task = newTask();
     task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
     EXPECT_EQ(TAVISchedTaskGetDefault(task.get()), 0);
     TAVISchedCTaskSetAppArgs(task.get(), kind);
-    task->runHour = hour;
-    task->runMin = minute;
+    TAVISchedCTaskSetRunHour(task.get(), hour);
+    TAVISchedCTaskSetRunMin(task.get(), minute);
     return task;
 }
 

@@ -106,7 +106,7 @@ TEST_F(Batch, OfMorePowerSchedulesThanAreRead) {
     shell("{ echo '[power off]'; for i in $(seq 0 99); do printf '%03d=0 1 %d %d\n' $i "
           "$((i / 60)) $((i % 60)); done; } > /usr/tavi/etc/auto_power");
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
-    for (uint32_t minute = 0; minute < 3; ++minute) {
+    for (int minute = 0; minute < 3; ++minute) {
         EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 20, minute).get()), 0);
     }
     EXPECT_EQ(TAVISchedChangeCommit(), 0);

@@ -21,7 +21,7 @@ class Power : public SchedTest {
                   0);
     }
     // Stores one; its id, or -1.
-    static int32_t store(const char *what, const char *week, uint32_t hour, uint32_t minute,
+    static int32_t store(const char *what, const char *week, int hour, int minute,
                          int enabled = 1) {
         const Task task = powerTask(what, hour, minute);
         TAVISchedCTaskSetWeek(task.get(), week);
@@ -107,7 +107,7 @@ TEST_F(Power, IdsAtTheEdges) {
 TEST_F(Power, WhatDoesNotFitIsRefused) {
     EXPECT_EQ(store("PowerOn", "1111111", 1, 1), -1);
     EXPECT_THAT(logs(), Contains(HasSubstr("Invalid app args for power [PowerOn]")));
-    for (const auto &[hour, minute] : {std::pair{300U, 1U}, std::pair{1U, 60U}}) {
+    for (const auto &[hour, minute] : {std::pair{300, 1}, std::pair{1, 60}}) {
         EXPECT_EQ(failure(store("poweron", "1111111", hour, minute)), 0x0D00U);
     }
     EXPECT_THAT(listedIds(), IsEmpty());

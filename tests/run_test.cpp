@@ -70,8 +70,8 @@ TEST_F(Run, CommandHasItsOwnersIdentityAndNothingElse) {
     EXPECT_THAT(readFile("/var/lib/tavischeduler/output/1"),
                 testing::MatchesRegex("/dev/null\n(pipe:.[0-9]+.)\n(pipe:.[0-9]+.)\nnamed\n"
                                       "ls: cannot open directory .*"));
-    EXPECT_EQ(shell("find /var/lib/tavischeduler ! -user root -o ! -group root -o -type f -perm "
-                    "/077 ! -name 'runs.sqlite*' | grep ."),
+    EXPECT_EQ(shell("find /var/lib/tavischeduler ! -user root -o ! -group root -o -perm /077 ! "
+                    "-name 'runs.sqlite*' | grep ."),
               1);
     EXPECT_EQ(rows(), "1:3: ");
     EXPECT_EQ(statusOf("/tmp/sched_status.sqlite").st_uid, 0U);

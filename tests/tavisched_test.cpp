@@ -557,7 +557,7 @@ TEST_F(CommandLine, TellsHowRunsEnded) {
     for (int i = 0; i < 5; ++i) {
         done("add --command x");
     }
-    shell("echo ghost:x:4242:4242::/:/bin/sh >> /etc/passwd");
+    shell("echo ghost:x:4646:4646::/:/bin/sh >> /etc/passwd");
     done("add --command x --owner ghost");
     shell("sed -i /^ghost:/d /etc/passwd");
     done("add --command x --once 2099-01-01");
@@ -580,7 +580,8 @@ TEST_F(CommandLine, TellsHowRunsEnded) {
     for (const char *const words :
          {" 1 .* ok 2 h ago\n", " 2 .* failed: exit 2 3 min ago\n", " 3 .*  missed just now\n",
           " 4 .* failed: interrupted 6 min ago\n", " 5 .* killed by signal 9 [23] days ago\n",
-          "6 .* not started: no such user just now\n", "7  Task 7  done  once on 2020"}) {
+          "6 .* 4646  failed: not started: no such user just now\n",
+          "7  Task 7  done  once on 2020"}) {
         EXPECT_THAT(list, ContainsRegex(words));
     }
     EXPECT_THAT(done("list --sort last"), ContainsRegex("missed.*\n.*exit 2.*\n.*interr"));
@@ -709,6 +710,8 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"chown -h bin /tmp/tavischedtask", "belongs to another user", true},
         {"cd ..; mkdir -m 775 g; chgrp bin g; cp bin/tavischedtask g; ln -sf $PWD/g/tavischedtask "
          "/tmp",
+         "others than root can replace", true},
+        {"cp ../bin/tavischedtask /run; chown bin /run/tavischedtask; ln -sf /run/tavischedtask /tmp",
          "others than root can replace", true},
         {"rm -r /tmp/lock", "/tmp/lock is missing", true},
         {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},

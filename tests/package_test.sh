@@ -127,6 +127,10 @@ quietly cmake --build $own/example
 
 step "tasks"
 id=$(tavisched add -q --name Nightly --command 'id -un > /tmp/ran' --daily --at 03:00 --owner nobody)
+tavisched export --web "$id" | sed '1d; $d; s/Nightly/Weekly/' > $own/task.json
+quietly $own/task save $own/task.json
+expect "a program built over the package does not save a task" grep -q Weekly <(tavisched list)
+quietly tavisched remove --yes 2
 quietly tavisched add --power off --weekly Mon --at 04:00
 expect "the task is not listed" grep -q Nightly <(tavisched list)
 expect "a program built over the package does not find the task" grep -q Nightly <($own/task show "$id")
@@ -135,11 +139,6 @@ expect "the task did not run as its owner" grep -qx nobody /tmp/ran
 rm /tmp/ran
 expect "$crontab lacks the task's line" grep -q "/tmp/tavischedtask --run id=$id$" $crontab
 expect "$crontab lacks the power-off line" grep -q "$check" $crontab
-
-tavisched export --web "$id" | sed '1d; $d; s/Nightly/Weekly/' > $own/task.json
-quietly $own/task save $own/task.json
-expect "a program built over the package does not save a task" grep -q Weekly <(tavisched list)
-quietly tavisched remove --yes 2
 
 step "power-off check at boot"
 rm $check

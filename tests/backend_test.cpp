@@ -1,11 +1,10 @@
 // The registry of backends, the task operations that dispatch to them, and the plug-in hooks.
-#include "support.h"
+#include "arrange.h"
 
 namespace {
 
 using namespace support;
 
-constexpr const char *kHandlers = "/usr/tavi/etc/plugins/task_scheduler/";
 constexpr const char *kSeen = "/tmp/hooks"; // what the handlers saw
 
 // The registry's rows with operations replaced, put back after each test.
@@ -16,16 +15,15 @@ class Backend : public SchedTest {
         cBackend = count_;
         SchedTest::TearDown();
     }
-    // Registers a handler that notes its phase and some arguments.
-    static void addHandler(const std::string &name, const std::string &end, mode_t mode = 0755) {
-        const std::string path = kHandlers + name;
-        shell(std::string("mkdir -p ") + kHandlers);
-        writeFile(path, "#!/bin/sh\necho ${0##*/} $1 $2 $RESULT ORG $ORG_TASK_ID $ORG_BACKEND "
-                        "$ORG_OWNER $ORG_NAME $ORG_TYPE $ORG_APP $ORG_YEAR $ORG_MONTH "
-                        "$ORG_DAY $ORG_HOUR $ORG_MIN $ORG_REPEAT_HOUR $ORG_LAST_WORK_HOUR "
-                        "$ORG_WEEK NEW $NEW_TASK_ID $NEW_BACKEND $NEW_STATE >> " +
-                            (kSeen + ("\n" + end)));
-        chmod(path.c_str(), mode);
+    // One that notes its phase and some arguments.
+    static void addNote(const char *name, const char *end = "", mode_t mode = 0755) {
+        addHandler(name,
+                   "echo ${0##*/} $1 $2 $RESULT ORG $ORG_TASK_ID $ORG_BACKEND $ORG_OWNER "
+                   "$ORG_NAME $ORG_TYPE $ORG_APP $ORG_YEAR $ORG_MONTH $ORG_DAY $ORG_HOUR $ORG_MIN "
+                   "$ORG_REPEAT_HOUR $ORG_LAST_WORK_HOUR $ORG_WEEK "
+                   "NEW $NEW_TASK_ID $NEW_BACKEND $NEW_STATE >> /tmp/hooks\n" +
+                       std::string(end),
+                   mode);
     }
 
     TAVI_SCHED_BACKEND_RECORD &row_ = SchedBackends[0];
@@ -123,22 +121,20 @@ TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
     for (const char *const callers : {"ORG_NAME", "NEW_STATE"}) {
         setenv(callers, "not the change's", 1);
     }
-    addHandler("20-ok", "");
-    addHandler("10-fails", "exit 3");
-    addHandler("30-writable", "", 0775);
-    addHandler("40-not-executable", "", 0644);
+    addNote("20-ok");
+    addNote("10-fails", "exit 3");
+    addNote("30-writable", "", 0775);
+    addNote("40-not-executable", "", 0644);
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     EXPECT_EQ(readFile(kSeen), ""); // a creation that a backend served has no hook
     TAVISchedCTaskSetState(task.get(), 0);
     EXPECT_EQ(TAVISchedTaskEdit(task.get()), 0);
     const std::string old =
         " 0 ORG 1 -2 8 " + std::string(31, 'n') + " 4 a.b 2031 2 3 4 5 6 7 1000001 NEW";
-    std::string edited;
-    for (const char *call : {"10-fails task_edit pre", "20-ok task_edit pre",
-                             "10-fails task_edit post", "20-ok task_edit post"}) {
-        edited += call + old + " 1 -2 0\n";
-    }
-    EXPECT_EQ(readFile(kSeen), edited);
+    const std::string edited = old + " 1 -2 0\n";
+    EXPECT_EQ(readFile(kSeen), "10-fails task_edit pre" + edited + "20-ok task_edit pre" + edited +
+                                   "10-fails task_edit post" + edited + "20-ok task_edit post" +
+                                   edited);
     const auto lines = logs();
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (PRE)"));
     EXPECT_THAT(lines, Contains("sched_task_edit.cpp:* Fail to execute task plugin (POST)"));

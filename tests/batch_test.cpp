@@ -1,8 +1,9 @@
 // Several changes as one.
-#include "support.h"
+#include "arrange.h"
+#include "machine.h"
 
 #include <array>
-#include <sstream>
+#include <functional>
 
 namespace {
 
@@ -13,49 +14,14 @@ class Batch : public SchedTest {
     void SetUp() override {
         SchedTest::SetUp();
         storedTask();
-        before_ = machine();
+        before_ = stateNow();
     }
     void TearDown() override {
         TAVISchedChangeRollback();
         SchedTest::TearDown();
     }
-    static std::string machine() {
-        return readFile(kWorking) + "|" + readFile(kPersistent) + "|" + readFile(kCrontab) + "|" +
-               readFile("/usr/tavi/etc/auto_power");
-    }
-    static Task powerOff(uint32_t hour, uint32_t minute) {
-        Task task(static_cast<TAVI_SCHED_TASK *>(calloc(1, sizeof(TAVI_SCHED_TASK))),
-                  TAVISchedTaskFree);
-        task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-        EXPECT_EQ(TAVISchedTaskGetDefault(task.get()), 0);
-        TAVISchedCTaskSetAppArgs(task.get(), "poweroff");
-        task->runHour = hour;
-        task->runMin = minute;
-        return task;
-    }
-    // What another process lists.
-    static std::vector<int> othersIds() {
-        if (const pid_t child = fork(); child != 0) {
-            int status = 0;
-            waitpid(child, &status, 0);
-        } else {
-            std::string text;
-            for (const int id : listedIds()) {
-                text += std::to_string(id) + " ";
-            }
-            writeFile("/tmp/ids", text);
-            _exit(0);
-        }
-        std::vector<int> ids;
-        std::istringstream text(readFile("/tmp/ids"));
-        for (int id = 0; text >> id;) {
-            ids.push_back(id);
-        }
-        unlink("/tmp/ids");
-        return ids;
-    }
 
-    std::string before_;
+    State before_;
 };
 
 TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
@@ -65,17 +31,17 @@ TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
     EXPECT_EQ(TAVISchedTaskRemove(2), 0);
     TAVISchedCTaskSetName(third.get(), "third");
     EXPECT_EQ(TAVISchedTaskEdit(third.get()), 0);
-    EXPECT_EQ(TAVISchedTaskCreate(powerOff(22, 30).get()), 0);
+    EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 22, 30).get()), 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 3, 91272230));
     TAVI_SCHED_TASK back{};
     EXPECT_EQ(TAVISchedTaskGetByID(2, &back), -1);
     EXPECT_EQ(TAVISchedTaskGetByID(3, &back), 0);
     EXPECT_STREQ(back.name, "third");
     EXPECT_STREQ(newTask()->name, "Task 2");
-    EXPECT_EQ(machine(), before_);
-    EXPECT_THAT(othersIds(), ElementsAre(1));
+    EXPECT_EQ(stateNow(), before_);
+    EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; ");
     ASSERT_EQ(TAVISchedChangeCommit(), 0);
-    EXPECT_THAT(othersIds(), ElementsAre(1, 3, 91272230));
+    EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; 3 third echo 3; 91272230 PowerOff task 0 ; ");
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
     EXPECT_THAT(readFile(kCrontab), HasSubstr("--run id=3\n"));
     EXPECT_THAT(readFile(kCrontab), HasSubstr("tavi_poweroff_feasible_check"));
@@ -84,29 +50,29 @@ TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
 TEST_F(Batch, EndsWithoutATrace) {
     const struct {
         const char *what;
-        int (*end)();
-    } cases[] = {{"rolled back", TAVISchedChangeRollback},
+        std::function<bool()> end;
+    } cases[] = {{"rolled back", [] { return TAVISchedChangeRollback() == 0; }},
                  {"without room for the files",
                   [] {
                       shell("mount -t tmpfs -o size=4k,nr_inodes=3 full /usr/tavi/etc");
-                      const int result = TAVISchedChangeCommit() == -1 ? 0 : 1;
-                      shell("umount /usr/tavi/etc");
-                      return result;
+                      const bool isRefused = TAVISchedChangeCommit() == -1;
+                      return shell("umount /usr/tavi/etc") == 0 && isRefused;
                   }},
                  {"with a crontab that cannot be written", [] {
                       fakes.renameFails = true;
-                      const int result = TAVISchedChangeCommit() == -1 ? 0 : 1;
+                      const bool isRefused = TAVISchedChangeCommit() == -1;
                       fakes.renameFails = false;
-                      return result;
+                      return isRefused;
                   }}};
-    for (const auto &c : cases) {
-        ASSERT_EQ(TAVISchedChangeBegin(), 0) << c.what;
+    for (const auto &[what, end] : cases) {
+        SCOPED_TRACE(what);
+        ASSERT_EQ(TAVISchedChangeBegin(), 0);
         storedTask();
         EXPECT_EQ(TAVISchedTaskRemove(1), 0);
-        EXPECT_EQ(TAVISchedTaskCreate(powerOff(1, 2).get()), 0);
-        EXPECT_EQ(c.end(), 0) << c.what;
-        EXPECT_EQ(machine(), before_) << c.what;
-        EXPECT_THAT(listedIds(), ElementsAre(1)) << c.what;
+        EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 1, 2).get()), 0);
+        EXPECT_TRUE(end());
+        EXPECT_EQ(stateNow(), before_);
+        EXPECT_THAT(listedIds(), ElementsAre(1));
     }
 }
 
@@ -116,7 +82,7 @@ TEST_F(Batch, MisuseIsRefused) {
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
     EXPECT_EQ(failure(TAVISchedChangeBegin()), 0x0D00U);
     EXPECT_EQ(TAVISchedChangeCommit(), 0); // of nothing
-    EXPECT_EQ(machine(), before_);
+    EXPECT_EQ(stateNow(), before_);
 }
 
 // Neither a section that nobody can read nor ids below 1 stand in the way.
@@ -137,26 +103,19 @@ TEST_F(Batch, BesideDamagedSections) {
 }
 
 TEST_F(Batch, OfMorePowerSchedulesThanAreRead) {
-    std::string entries = "[power off]\n";
-    for (int i = 0; i < 100; ++i) {
-        char line[32];
-        snprintf(line, sizeof line, "%03d=0 1 %d %d\n", i, i / 60, i % 60);
-        entries += line;
-    }
-    writeFile("/usr/tavi/etc/auto_power", entries);
+    shell("{ echo '[power off]'; for i in $(seq 0 99); do printf '%03d=0 1 %d %d\n' $i "
+          "$((i / 60)) $((i % 60)); done; } > /usr/tavi/etc/auto_power");
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
-    for (uint32_t minute = 0; minute < 3; ++minute) {
-        EXPECT_EQ(TAVISchedTaskCreate(powerOff(20, minute).get()), 0);
+    for (int minute = 0; minute < 3; ++minute) {
+        EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 20, minute).get()), 0);
     }
     EXPECT_EQ(TAVISchedChangeCommit(), 0);
-    EXPECT_THAT(readFile("/usr/tavi/etc/auto_power"), HasSubstr("099=0 1 1 39\n100=1 127 20 2\n"));
+    EXPECT_THAT(readFile(kPower), HasSubstr("099=0 1 1 39\n100=1 127 20 2\n"));
 }
 
 // A handler's PRE phase runs with each change, its POST phase at the end, with the batch's result.
 TEST_F(Batch, HandlersAreToldAtTheEnd) {
-    shell("mkdir -p /usr/tavi/etc/plugins/task_scheduler; cd /usr/tavi/etc/plugins/task_scheduler;"
-          "printf '#!/bin/sh\necho $1 $2 $RESULT $ORG_TASK_ID >> /tmp/told\n' > note;"
-          "chmod 755 note");
+    addHandler("note", "echo $1 $2 $RESULT $ORG_TASK_ID >> /tmp/told");
     for (const bool stored : {false, true}) {
         ASSERT_EQ(TAVISchedChangeBegin(), 0);
         EXPECT_EQ(TAVISchedTaskRemove(1), 0);
@@ -166,21 +125,13 @@ TEST_F(Batch, HandlersAreToldAtTheEnd) {
                                              (stored ? "0" : "-1") + " 1\n");
         unlink("/tmp/told");
     }
-    shell("rm -r /usr/tavi/etc/plugins");
 }
 
 // What the process starts would wait for it, and it for them.
 TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
     const Task second = storedTask();
-    const pid_t child = fork();
-    if (child == 0) {
-        const Task task = newTask();
-        _exit(failure(TAVISchedTaskCreate(task.get())) == 0x0400 ? 0 : 1);
-    }
-    int status = -1;
-    waitpid(child, &status, 0);
-    EXPECT_EQ(status, 0);
+    EXPECT_EQ(inChild([] { return failure(TAVISchedTaskCreate(newTask().get())) != 0x0400; }), 0);
     EXPECT_THAT(logs(), Contains(HasSubstr("a change waits for this process")));
     // One that waits for the end of the batch changes tasks like any other process.
     std::array<int, 2> ends{};
@@ -193,6 +144,7 @@ TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     }
     EXPECT_EQ(TAVISchedChangeCommit(), 0);
     EXPECT_EQ(write(ends[1], "x", 1), 1);
+    int status = -1;
     waitpid(later, &status, 0);
     EXPECT_EQ(status, 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
@@ -220,7 +172,7 @@ TEST_F(Batch, NewTasksUnderGivenIds) {
         task->id = id;
         EXPECT_EQ(failure(TAVISchedTaskCreateWithId(task.get())), 0x0D00U) << id;
     }
-    EXPECT_EQ(machine(), before_);
+    EXPECT_EQ(stateNow(), before_);
     task->id = 40;
     EXPECT_EQ(TAVISchedTaskCreateWithId(task.get()), 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 40));
@@ -229,7 +181,7 @@ TEST_F(Batch, NewTasksUnderGivenIds) {
     EXPECT_EQ(next, 2);
     TAVI_SCHED_TASK *list = nullptr;
     EXPECT_EQ(TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_AUTOPOWER, &list, nullptr), 0);
-    writeFile("/usr/tavi/etc/auto_power", "[power on]\n000=damaged\n");
+    writeFile(kPower, "[power on]\n000=damaged\n");
     EXPECT_EQ(TAVISchedTaskListGetOf(TAVI_SCHED_BACKEND_AUTOPOWER, &list, nullptr), -1);
     EXPECT_EQ(failure(TAVISchedTaskListGetOf(-7, &list, nullptr)), 0x2000U);
 }

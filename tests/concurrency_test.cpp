@@ -1,5 +1,5 @@
-// Several processes at once: writers and readers through the library, the tool and the runner,
-// plug-in handlers that use the library themselves, and another user who interferes in /tmp.
+// Several processes at once: writers, readers, plug-in handlers, and another user in /tmp.
+#include "arrange.h"
 #include "machine.h"
 
 #include <array>
@@ -14,12 +14,14 @@
 #include <functional>
 #include <grp.h>
 #include <set>
+#include <sstream>
 #include <sys/mman.h>
 
 namespace {
 
 using namespace support;
 namespace fs = std::filesystem;
+using std::chrono::steady_clock;
 
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 constexpr int kWriters = 10; // each is a fork of a large process
@@ -55,30 +57,17 @@ int resultOf(pid_t pid) {
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-int runProgram(std::vector<const char *> arguments) {
-    arguments.push_back(nullptr);
-    const int output = open("/run/output", O_WRONLY | O_CREAT | O_APPEND, 0600);
-    dup2(output, 1);
-    dup2(output, 2);
-    execv(arguments[0], const_cast<char *const *>(arguments.data()));
-    return 127;
-}
-
 int addByTool() {
-    return runProgram({TAVISCHED, "add", "--name", "root's", "--command", "true", "--at", "03:00"});
+    return shell("'" TAVISCHED "' add --name \"root's\" --command x --at 3:00 >> /run/output 2>&1");
 }
 
-std::vector<std::string> linesOf(const std::string &path, const char *text) {
-    std::vector<std::string> lines;
-    const std::string content = readFile(path);
-    for (size_t begin = 0; begin < content.size();) {
-        const size_t end = std::min(content.find('\n', begin), content.size());
-        if (content.substr(begin, end - begin).find(text) != std::string::npos) {
-            lines.push_back(content.substr(begin, end - begin));
-        }
-        begin = end + 1;
+size_t linesWith(const char *text, const char *path) {
+    std::istringstream content(readFile(path));
+    size_t count = 0;
+    for (std::string line; std::getline(content, line);) {
+        count += line.find(text) != std::string::npos ? 1 : 0;
     }
-    return lines;
+    return count;
 }
 
 class Concurrency : public SchedTest {
@@ -109,15 +98,13 @@ int readInALoop() {
 // It is not due: the runner reads it and ends with 0.
 int runInALoop() {
     while (!shared().stop) {
-        const pid_t runner = start([] { return runProgram({RUNNER, "--run", "id=1"}); });
-        shared().missing += resultOf(runner) != 0 ? 1 : 0;
+        shared().missing += shell("'" RUNNER "' --run id=1 >> /run/output 2>&1") != 0 ? 1 : 0;
         ++shared().looks;
     }
     return 0;
 }
 
 TEST_F(Concurrency, WritersReadersAndRunners) {
-    fakes.now.reset();
     Task first = newTask();
     first->runHour = static_cast<uint32_t>((::time(nullptr) / 3600 + 12) % 24);
     ASSERT_EQ(TAVISchedTaskCreate(first.get()), 0);
@@ -126,66 +113,46 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
         watchers.push_back(start(readInALoop));
     }
     std::vector<pid_t> writers;
-    std::vector<pid_t> toolWriters;
     for (int i = 0; i < kWriters; ++i) {
         writers.push_back(start([] { return created("by the library"); }));
-        toolWriters.push_back(start(addByTool));
+        writers.push_back(start(addByTool));
     }
-    int failed = 0;
-    for (const pid_t writer : writers) {
-        failed += resultOf(writer) != 0 ? 1 : 0;
-    }
-    size_t added = 0;
-    for (const pid_t tool : toolWriters) {
-        added += resultOf(tool) == 0 ? 1 : 0;
-    }
+    const auto areDone = [](const std::vector<pid_t> &processes) {
+        return std::count_if(processes.begin(), processes.end(),
+                             [](pid_t process) { return resultOf(process) == 0; });
+    };
+    EXPECT_EQ(areDone(writers), 2 * kWriters)
+        << testing::PrintToString(logs()) << readFile("/run/output");
     shared().stop = true;
-    for (const pid_t watcher : watchers) {
-        EXPECT_EQ(resultOf(watcher), 0);
-    }
+    EXPECT_EQ(areDone(watchers), kReaders + 1);
     const auto ids = listedIds();
-    const auto ours = linesOf(kPersistent, "name=by the library").size();
-    const auto tools = linesOf(kPersistent, "name=root's").size();
-    std::printf(
-        "concurrency: %d writers of each kind: %zu tasks by the library (%d failed), %zu by "
-        "the tool (it told of %zu); %ld looks by readers and runners: %ld saw fewer, %ld "
-        "errors, %ld missed a task\n",
-        kWriters, ours, failed, tools, added, shared().looks.load(), shared().fewer.load(),
-        shared().errors.load(), shared().missing.load());
-    EXPECT_EQ(failed, 0) << testing::PrintToString(logs());
-    EXPECT_EQ(ours, kWriters);
-    EXPECT_EQ(tools, kWriters) << readFile("/run/output");
-    EXPECT_EQ(tools, added);
-    EXPECT_EQ(std::set<int>(ids.begin(), ids.end()).size(), ours + tools + 1);
+    EXPECT_EQ(linesWith("name=by the library", kPersistent), kWriters);
+    EXPECT_EQ(linesWith("name=root's", kPersistent), kWriters);
+    EXPECT_EQ(std::set<int>(ids.begin(), ids.end()).size(), 2 * kWriters + 1);
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
-    EXPECT_EQ(linesOf(kCrontab, "--run id=").size(), ids.size());
+    EXPECT_EQ(linesWith("--run id=", kCrontab), ids.size());
     EXPECT_GT(shared().looks, kReaders);
-    EXPECT_EQ(shared().fewer + shared().errors + shared().missing, 0);
+    EXPECT_EQ(shared().fewer + shared().errors + shared().missing, 0)
+        << shared().fewer << " saw fewer, " << shared().errors << " errors of " << shared().looks;
 }
 
 // ---- Plug-in handlers ----
 
-class Handlers : public Concurrency {
+class Handlers : public SchedTest {
   protected:
     void SetUp() override {
-        Concurrency::SetUp();
-        storedTask();
-        const std::string folder = "/usr/tavi/etc/plugins/task_scheduler";
-        fs::create_directories(folder);
-        writeFile(folder + "/handler",
-                  std::string("#!/bin/sh\n'") + TAVISCHED + "' list > /run/$2.list && '" +
-                      TAVISCHED +
-                      "' add --command true --at 03:00 > /run/$2.add 2>&1; echo $? > /run/$2\n");
-        chmod((folder + "/handler").c_str(), 0755);
+        SchedTest::SetUp();
+        task_ = storedTask();
+        addHandler("handler",
+                   "t='" TAVISCHED "'; \"$t\" list > /run/$2.list && \"$t\" add --command "
+                   "true --at 03:00 > /run/$2.add 2>&1; echo $? > /run/$2");
     }
-    static int edit() {
-        TAVI_SCHED_TASK task{};
-        return TAVISchedTaskGetByID(1, &task) == 0 && TAVISchedTaskEdit(&task) == 0 ? 0 : 1;
-    }
+
+    Task task_{nullptr, TAVISchedTaskFree};
 };
 
 TEST_F(Handlers, ReadAndChangeTasksAroundAChange) {
-    EXPECT_EQ(edit(), 0);
+    EXPECT_EQ(TAVISchedTaskEdit(task_.get()), 0);
     EXPECT_EQ(readFile("/run/pre") + readFile("/run/post"), "0\n0\n") << readFile("/run/pre.add");
     EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
     EXPECT_THAT(readFile("/run/post.list"), HasSubstr("Task 2"));
@@ -193,10 +160,10 @@ TEST_F(Handlers, ReadAndChangeTasksAroundAChange) {
 
 // The batch has the lock: a change of the handler would wait for the process that waits for it.
 TEST_F(Handlers, AreRefusedAtOnceInABatch) {
-    const auto begin = std::chrono::steady_clock::now();
+    const auto begin = steady_clock::now();
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
-    EXPECT_EQ(edit(), 0);
-    EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(15));
+    EXPECT_EQ(TAVISchedTaskEdit(task_.get()), 0);
+    EXPECT_LT(steady_clock::now() - begin, std::chrono::seconds(15));
     EXPECT_EQ(readFile("/run/pre"), "1\n") << readFile("/run/pre.add");
     EXPECT_THAT(readFile("/run/pre.list"), HasSubstr("Task 1"));
     EXPECT_FALSE(fs::exists("/run/post"));
@@ -219,26 +186,24 @@ void putAndTakeAway() {
 }
 
 void moveIn() {
-    const std::string mine = "/tmp/mine";
-    writeFile(mine, plantedTask());
-    rename(mine.c_str(), kWorking);
+    writeFile("/tmp/mine", plantedTask());
+    rename("/tmp/mine", kWorking);
     unlink(kWorking);
 }
 
 // Also at the name that a change's scratch file will have, for as long as it knows none better.
 void fillAndFree() {
-    const std::string filler = "/tmp/filler";
-    const int file = open(filler.c_str(), O_WRONLY | O_CREAT, 0600);
+    const int file = open("/tmp/filler", O_WRONLY | O_CREAT, 0600);
     const std::string block(16384, 'x');
     while (write(file, block.data(), block.size()) > 0) {
     }
     close(file);
-    unlink(filler.c_str());
+    unlink("/tmp/filler");
 }
 
 void plantRunner() {
-    writeFile("/tmp/tavischedtask", "#!/bin/sh\ntouch /evil\n");
-    chmod("/tmp/tavischedtask", 0755);
+    writeFile(kRunner, "#!/bin/sh\ntouch /evil\n");
+    chmod(kRunner, 0755);
 }
 
 // The user's own file may be there for a moment: what was opened is looked at.
@@ -268,76 +233,64 @@ class LocalUser : public Concurrency {
         }
     }
     void TearDown() override {
-        if (stranger_ > 0) {
-            kill(stranger_, SIGKILL);
-            resultOf(stranger_);
-        }
+        endAttack();
         Concurrency::TearDown();
     }
+    void endAttack() {
+        if (stranger_ > 0) {
+            kill(stranger_, SIGKILL);
+            resultOf(std::exchange(stranger_, 0));
+        }
+    }
     void attackInALoop(void (*attack)()) {
+        endAttack();
+        shared().looks = 0;
         stranger_ = start([&]() -> int {
             umask(022);
-            if (becomeStranger() != 0) {
-                return 1;
-            }
-            while (true) {
+            while (geteuid() == kStranger || becomeStranger() == 0) {
                 attack();
                 ++shared().looks;
             }
+            return 1;
         });
     }
     // Goes on for some seconds, or for as many tries as TAVI_TEST_TRIES says.
     static void tryOften(const char *what, const std::function<bool(long)> &holds) {
         const char *const wanted = std::getenv("TAVI_TEST_TRIES");
         const long most = wanted ? std::atol(wanted) : 1000;
-        const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(3);
+        const auto end = steady_clock::now() + std::chrono::seconds(3);
         long tried = 0;
-        long held = 0;
-        while (tried < most && (wanted || std::chrono::steady_clock::now() < end)) {
-            held += holds(tried) ? 1 : 0;
-            ++tried;
-        }
-        std::printf("local user: %s: %ld tries of root, %ld of the user, %ld held\n", what, tried,
-                    shared().looks.load(), held);
-        EXPECT_EQ(tried, held);
-        EXPECT_GT(shared().looks, 0);
-    }
-
-    // Root stores a machine's first task while the user is at it.
-    void storeFirstTasks(const char *what) {
-        long stored = 0;
-        tryOften(what, [&](long number) {
-            for (const char *const path : {kWorking, kPersistent}) {
-                unlink(path);
-            }
-            writeFile(kCrontab, kForeignCrontab);
-            const bool byTool = number % 4 == 3;
-            const int result = byTool ? resultOf(start(addByTool)) : created("root's");
-            const bool done = result == 0;
-            stored += done ? 1 : 0;
-            bool isRight = linesOf(kCrontab, "id=7").empty();
-            isRight = isRight && !isRootsAndPlanted(kWorking) && !isRootsAndPlanted(kPersistent);
-            isRight = isRight && (!done || (linesOf(kPersistent, "name=root's").size() == 1 &&
-                                            linesOf(kCrontab, "id=1").size() == 1));
-            EXPECT_TRUE(isRight) << done << readFile(kPersistent) << readFile(kCrontab)
-                                 << testing::PrintToString(logs());
+        while (tried < most && (wanted || shared().looks == 0 || steady_clock::now() < end)) {
+            EXPECT_TRUE(holds(tried++)) << testing::PrintToString(logs());
             logs();
-            return isRight;
-        });
-        std::printf("local user: %s: %ld of root's tasks were stored\n", what, stored);
+        }
+        std::printf("%s: %ld tries of root, %ld of the user\n", what, tried, shared().looks.load());
+        EXPECT_GT(shared().looks, 0);
     }
 
     pid_t stranger_ = 0;
 };
 
-TEST_F(LocalUser, PutsTaskFileAndTakesItAway) {
-    attackInALoop(putAndTakeAway);
-    storeFirstTasks("a task file put and taken away");
-}
-
-TEST_F(LocalUser, MovesTaskFileIn) {
-    attackInALoop(moveIn);
-    storeFirstTasks("a task file moved in");
+// Root stores a machine's first task while the user is at it.
+TEST_F(LocalUser, NeverGivesRootATask) {
+    const struct {
+        const char *what;
+        void (*attack)();
+    } cases[] = {{"a task file put and taken away", putAndTakeAway},
+                 {"a task file moved in", moveIn}};
+    for (const auto &row : cases) {
+        attackInALoop(row.attack);
+        tryOften(row.what, [](long number) {
+            unlink(kWorking);
+            unlink(kPersistent);
+            writeFile(kCrontab, kForeignCrontab);
+            const bool done = (number % 4 == 3 ? addByTool() : created("root's")) == 0;
+            return linesWith("id=7", kCrontab) == 0 && !isRootsAndPlanted(kWorking) &&
+                   !isRootsAndPlanted(kPersistent) &&
+                   (!done || (linesWith("name=root's", kPersistent) == 1 &&
+                              linesWith("id=1", kCrontab) == 1));
+        });
+    }
 }
 
 TEST_F(LocalUser, FillsAndFreesTmp) {
@@ -347,39 +300,29 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
     }
     attackInALoop(fillAndFree);
     std::set<std::string> wanted = {"one", "two", "three"};
-    long changes = 0;
     tryOften("/tmp filled and freed", [&](long number) {
         const std::string name = "task " + std::to_string(number);
         if (created(name.c_str()) == 0) {
             wanted.insert(name);
-            ++changes;
         }
         TAVI_SCHED_TASK *list = nullptr;
         const int count = TAVISchedTaskListGet(&list, nullptr);
         std::set<std::string> listed;
-        int32_t toRemove = 0;
-        std::string removed;
+        std::pair<int32_t, std::string> last;
         for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
             listed.insert(task->name);
-            if (std::strncmp(task->name, "task ", 5) == 0 && count > 6) {
-                toRemove = task->id;
-                removed = task->name;
+            if (std::strncmp(task->name, "task ", 5) == 0) {
+                last = {task->id, task->name};
             }
         }
         TAVISchedTaskListFree(&list);
         const bool isRight = count >= 0 && listed == wanted;
-        EXPECT_TRUE(isRight) << count << " " << testing::PrintToString(listed) << " for "
-                             << testing::PrintToString(wanted) << testing::PrintToString(logs());
-        logs();
-        if (toRemove > 0 && TAVISchedTaskRemove(toRemove) == 0) {
-            wanted.erase(removed);
-            ++changes;
+        if (count > 6 && TAVISchedTaskRemove(last.first) == 0) {
+            wanted.erase(last.second);
         }
         return isRight;
     });
-    std::printf("local user: /tmp filled and freed: %ld changes of root's were stored\n", changes);
-    kill(stranger_, SIGKILL);
-    resultOf(std::exchange(stranger_, 0));
+    endAttack();
     unlink("/tmp/filler");
     EXPECT_EQ(listedIds().size(), wanted.size());
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
@@ -390,15 +333,11 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
 TEST_F(LocalUser, PlantsARunner) {
     attackInALoop(plantRunner);
     tryOften("a runner planted", [&](long) {
-        fs::remove("/tmp/tavischedtask");
+        fs::remove(kRunner);
         logs();
         const bool stored = created("root's") == 0;
-        const bool isRoots = statusOf("/tmp/tavischedtask").st_uid == 0;
-        const auto lines = logs();
-        const bool isTold = std::any_of(lines.begin(), lines.end(), [](const std::string &line) {
-            return line.find("/tmp/tavischedtask") != std::string::npos;
-        });
-        EXPECT_TRUE(stored && (isRoots || isTold)) << testing::PrintToString(lines);
+        const bool isRoots = statusOf(kRunner).st_uid == 0;
+        const bool isTold = testing::PrintToString(logs()).find(kRunner) != std::string::npos;
         TAVISchedTaskRemove(1);
         return stored && (isRoots || isTold);
     });

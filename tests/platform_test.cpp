@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <csignal>
 #include <fcntl.h>
-#include <filesystem>
 #include <regex>
 
 namespace {
@@ -20,6 +19,17 @@ std::string sectionOf(const char *path, const std::string &name) {
     const std::string result = std::to_string(found) + ":" + (value ? value : "");
     PLATCSzHashFree(hash);
     return result;
+}
+
+// A process that has ended and was not waited for: it writes no more.
+pid_t startZombie() {
+    const pid_t child = fork();
+    if (child == 0) {
+        _exit(0);
+    }
+    siginfo_t info{};
+    waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT);
+    return child;
 }
 
 TEST_F(Platform, SectionFilesKeepWhatTheyDoNotChange) {
@@ -75,26 +85,22 @@ TEST_F(Platform, SectionsAreFoundWhereverTheyLie) {
 TEST_F(Platform, APassOverAllSections) {
     writeFile("/etc/f", "k=0\n[1]\na=1\nb=2\n[2] \na=3\nb=4\n[3\n[4]\na=5\n[1]\na=6\n[5]\n"
                         "b=7\na=8\nno pair\n[6]\na=1\nb=2\nc=3\nc=4\n[7]\n");
-    struct Pass {
-        int left;
-        std::string seen;
-    };
-    const auto take = [](void *context, const char *name, PLATCSZHASH *pairs) {
-        auto &pass = *static_cast<Pass *>(context);
-        pass.seen += std::string(name) + ":";
+    std::string seen;
+    const auto take = [](void *text, const char *name, PLATCSZHASH *pairs) {
+        auto &told = *static_cast<std::string *>(text);
+        told += std::string(name) + ":";
         for (const char *const key : {"a", "b", "c"}) {
             const char *const value = PLATCSzHashGetValue(pairs, key);
-            pass.seen += value ? value : "-";
+            told += value ? value : "-";
         }
-        pass.seen += " ";
-        return --pass.left == 0 ? 1 : 0;
+        told += " ";
+        return told.ends_with("stop 1:12- 2:34- ") ? 1 : 0;
     };
-    Pass all{-1, ""};
-    EXPECT_EQ(PLATCFileForEachSection("/etc/f", take, &all), 6);
-    EXPECT_EQ(all.seen, "1:12- 2:34- 4:5-- 5:87- 6:124 7:--- ");
-    Pass two{2, ""};
-    EXPECT_EQ(PLATCFileForEachSection("/etc/f", take, &two), 2);
-    EXPECT_EQ(failure(PLATCFileForEachSection("/etc/g", take, &two)), 0x0900U);
+    EXPECT_EQ(PLATCFileForEachSection("/etc/f", take, &seen), 6);
+    EXPECT_EQ(seen, "1:12- 2:34- 4:5-- 5:87- 6:124 7:--- ");
+    seen = "stop ";
+    EXPECT_EQ(PLATCFileForEachSection("/etc/f", take, &seen), 2);
+    EXPECT_EQ(failure(PLATCFileForEachSection("/etc/g", take, &seen)), 0x0900U);
 }
 
 TEST_F(Platform, SeveralSectionsChangeInOneWrite) {
@@ -102,14 +108,12 @@ TEST_F(Platform, SeveralSectionsChangeInOneWrite) {
     PLATCSzHashSetValue(&hash, "k", "new");
     using Changes = std::vector<std::pair<const char *, const PLATCSZHASH *>>;
     const auto edit = [](const char *path, const Changes &changes) {
-        std::vector<const char *> names;
-        std::vector<const PLATCSZHASH *> hashes;
-        for (const auto &[name, pairs] : changes) {
-            names.push_back(name);
-            hashes.push_back(pairs);
+        const char *names[4];
+        const PLATCSZHASH *hashes[4];
+        for (size_t i = 0; i < changes.size(); ++i) {
+            std::tie(names[i], hashes[i]) = changes[i];
         }
-        return PLATCFileEditSections(path, static_cast<int>(changes.size()), names.data(),
-                                     hashes.data());
+        return PLATCFileEditSections(path, static_cast<int>(changes.size()), names, hashes);
     };
     const std::string old = "head\n[a]\nk=1\n[b]\nk=2\n[x\nk=3\n[a]\nk=4\n[c]\nk=5";
     const struct {
@@ -179,19 +183,7 @@ TEST_F(Platform, WhatAHandSpoiltInASectionFileIsTold) {
     PLATCSzListFree(faults);
 }
 
-// The names of what lies beside a file, with its temporary files.
-std::string beside(const std::string &path) {
-    std::string names;
-    const std::filesystem::path file(path);
-    for (const auto &entry : std::filesystem::directory_iterator(file.parent_path())) {
-        const std::string name = entry.path().filename();
-        names += name.starts_with(file.filename().string() + ".") ? name + " " : "";
-    }
-    return names;
-}
-
-// A change that is answered with success outlives a loss of power; what a restart empties needs no
-// flush.
+// What is answered with success outlives a loss of power, but for what a restart empties.
 TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
     TAVIAUTOPOWER entry{};
     TAVISCHEDULE schedule{};
@@ -203,36 +195,29 @@ TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
                    ? TAVIAutoPowerConfSet(0, 1, &entry)
                    : PLATCFileEditSections(path.c_str(), 0, nullptr, nullptr);
     };
-    const std::string own = "." + std::to_string(getpid()) + "\\.\\w{6}";
+    const std::regex own("\\." + std::to_string(getpid()) + "\\.\\w{6}");
     const auto calls = [&] {
         std::string all;
         for (const std::string &call : fileCalls()) {
-            all += std::regex_replace(call, std::regex("\\" + own), ".TMP") + "|";
+            all += std::regex_replace(call, own, ".TMP") + "|";
         }
         return all;
     };
     for (const std::string path : {"/etc/crontab", "/usr/tavi/etc/auto_power"}) {
-        const std::string folder = path.substr(0, path.rfind('/'));
         calls();
         EXPECT_EQ(write(path), 0);
         EXPECT_EQ(calls(), "fsync " + path + ".TMP|rename " + path + ".TMP " + path + "|fsync " +
-                               folder + "|");
-        const struct {
-            bool Fakes::*fails;
-            unsigned int code;
-            bool isOld;
-        } cases[] = {{&Fakes::fsyncFails, 0x0B00, true},
-                     {&Fakes::renameFails, 0x2800, true},
-                     {&Fakes::folderFsyncFails, 0x0B00, false}};
-        for (const auto &row : cases) {
+                               path.substr(0, path.rfind('/')) + "|");
+        for (bool Fakes::*const fails :
+             {&Fakes::fsyncFails, &Fakes::renameFails, &Fakes::folderFsyncFails}) {
             const std::string old = readFile(path);
             entry.minute++;
             schedule.minute++;
-            fakes.*row.fails = true;
-            EXPECT_EQ(failure(write(path)), row.code);
+            fakes.*fails = true;
+            EXPECT_EQ(failure(write(path)), fails == &Fakes::renameFails ? 0x2800 : 0x0B00);
             fakes = {};
-            EXPECT_EQ(readFile(path) == old, row.isOld) << row.code;
-            EXPECT_EQ(beside(path), "");
+            EXPECT_EQ(readFile(path) == old, fails != &Fakes::folderFsyncFails);
+            EXPECT_EQ(shell("ls " + path + ".* 2> /dev/null"), 2);
         }
     }
     calls();
@@ -241,27 +226,20 @@ TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
 }
 
 TEST_F(Platform, WritersRemoveWhatDeadOnesLeft) {
-    const pid_t child = fork();
-    if (child == 0) {
-        _exit(0);
-    }
-    siginfo_t info{};
-    waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT); // a zombie writes no more
+    const pid_t child = startZombie();
     const std::string dead = "." + std::to_string(child);
-    for (const char *const path : {"/etc/left", "/tmp/left"}) {
+    const std::string left = dead + ".aB3dEf";
+    for (const std::string path : {"/etc/left", "/tmp/left"}) {
         for (const std::string &name :
-             {dead + ".aB3dEf", dead + ".five5", dead + ".seven77", dead + ".a-b-c-", dead,
+             {left, dead + ".five5", dead + ".seven77", dead + ".a-b-c-", dead,
               "." + std::to_string(getpid()) + ".mine11", std::string(".1.init11"),
-              std::string(".bak.savedd"), "h" + dead + ".aB3dEf"}) {
+              std::string(".bak.savedd"), "h" + left}) {
             writeFile(path + name, "");
         }
-        EXPECT_EQ(PLATCFileEditSections(path, 0, nullptr, nullptr), 0);
-        const bool wentThere = access((path + dead + ".aB3dEf").c_str(), F_OK) != 0;
-        EXPECT_EQ(wentThere, std::string("/etc/left") == path);
-        EXPECT_EQ(shell("test $(ls -d " + std::string(path) + ".* " + path +
-                        "h.* | wc -l) = " + (wentThere ? "8" : "9")),
-                  0);
-        shell(std::string("rm -f ") + path + "*");
+        EXPECT_EQ(PLATCFileEditSections(path.c_str(), 0, nullptr, nullptr), 0);
+        EXPECT_EQ(access((path + left).c_str(), F_OK), path == "/etc/left" ? -1 : 0);
+        EXPECT_EQ(shell("rm -f " + path + left + "; test $(ls -d " + path + "?* | wc -l) = 8"), 0);
+        shell("rm -f " + path + "*");
     }
     waitpid(child, nullptr, 0);
 }
@@ -275,27 +253,17 @@ TEST_F(Platform, ProgramsAndProcesses) {
         EXPECT_EQ(failure(PLATCExec("/no/such/program", arguments + 2)), 0x2A00U);
     }
     // Nothing that the caller is sent is eaten.
-    int input[2];
-    ASSERT_EQ(pipe2(input, O_NONBLOCK), 0);
+    writeFile("/tmp/input", "line\n");
     const int own = dup(0);
-    dup2(input[0], 0);
-    EXPECT_EQ(::write(input[1], "line\n", 5), 5);
+    close(0);
+    EXPECT_EQ(open("/tmp/input", O_RDONLY), 0);
     const char *const reads[] = {"-c", "read line && exit 4; exit 5", nullptr};
     EXPECT_EQ(PLATCExec("/bin/sh", reads), 5);
+    EXPECT_EQ(lseek(0, 0, SEEK_CUR), 0);
     dup2(own, 0);
-    char line[8];
-    EXPECT_EQ(::read(input[0], line, sizeof line), 5);
-    for (const int end : {input[0], input[1], own}) {
-        close(end);
-    }
-
-    const pid_t child = fork();
-    if (child == 0) {
-        _exit(0);
-    }
-    siginfo_t info{};
-    waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT);
-    EXPECT_EQ(PLATCProcAlive(child), 0); // a zombie
+    close(own);
+    const pid_t child = startZombie();
+    EXPECT_EQ(PLATCProcAlive(child), 0);
     waitpid(child, nullptr, 0);
     EXPECT_EQ(PLATCProcAlive(child), 0);
     EXPECT_EQ(PLATCProcAlive(getpid()), 1);
@@ -326,14 +294,12 @@ TEST_F(Platform, DetachedChildren) {
     EXPECT_EQ(read(output[0], text, sizeof text), 0);
     close(output[0]);
     waitpid(caller, nullptr, 0);
-    while (readFile("/tmp/detached").find('\n') == std::string::npos) {
-    }
+    EXPECT_TRUE(waitFor("grep -qs . /tmp/detached"));
     const int child = std::stoi(readFile("/tmp/detached"));
     EXPECT_EQ(PLATCProcAlive(child), 1);
     EXPECT_NE(getsid(child), getsid(0));
-    EXPECT_EQ(shell("test \"$(readlink /proc/" + std::to_string(child) +
-                    "/fd/[012] | sort -u)\" = /dev/null"),
-              0);
+    const std::string files = "/proc/" + std::to_string(child) + "/fd/[012]";
+    EXPECT_EQ(shell("test \"$(readlink " + files + " | sort -u)\" = /dev/null"), 0);
     kill(child, SIGKILL);
     waitForChildren();
 }

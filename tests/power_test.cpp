@@ -1,5 +1,5 @@
 // Power-on and power-off schedules as tasks, next to ordinary tasks.
-#include "support.h"
+#include "arrange.h"
 #include "tavisdk.h"
 
 namespace {
@@ -21,15 +21,10 @@ class Power : public SchedTest {
                   0);
     }
     // Stores one; its id, or -1.
-    static int32_t store(const char *what, const char *week, uint32_t hour, uint32_t minute,
+    static int32_t store(const char *what, const char *week, int hour, int minute,
                          int enabled = 1) {
-        Task task = newTask();
-        task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-        TAVISchedTaskGetDefault(task.get());
-        TAVISchedCTaskSetAppArgs(task.get(), what);
+        const Task task = powerTask(what, hour, minute);
         TAVISchedCTaskSetWeek(task.get(), week);
-        task->runHour = hour;
-        task->runMin = minute;
         TAVISchedCTaskSetState(task.get(), enabled);
         return TAVISchedTaskCreate(task.get()) == 0 ? task->id : -1;
     }
@@ -57,11 +52,11 @@ TEST_F(Power, BothKindsLiveNextToOrdinaryTasks) {
     TAVI_SCHED_TASK *list = nullptr;
     ASSERT_EQ(TAVISchedTaskListGet(&list, nullptr), 6);
     std::string seen;
-    for (const TAVI_SCHED_TASK *task = list->next; task; task = TAVISchedTaskNext(task)) {
+    for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
         seen += std::to_string(task->id) + " " + task->name + " " + task->nextTriggerTime + "; ";
     }
-    EXPECT_EQ(list->id, 1);
-    EXPECT_EQ(seen, "90650304 PowerOff task 3 2024-05-11 03:04; "
+    EXPECT_EQ(seen, "1 Task 1 2024-05-09 00:00; "
+                    "90650304 PowerOff task 3 2024-05-11 03:04; "
                     "90000200 PowerOff task 2 2024-05-16 02:00; "
                     "80650100 PowerOff task 1 2024-05-11 01:00; "
                     "91272305 PowerOff task 0 2024-05-08 23:05; "
@@ -112,7 +107,7 @@ TEST_F(Power, IdsAtTheEdges) {
 TEST_F(Power, WhatDoesNotFitIsRefused) {
     EXPECT_EQ(store("PowerOn", "1111111", 1, 1), -1);
     EXPECT_THAT(logs(), Contains(HasSubstr("Invalid app args for power [PowerOn]")));
-    for (const auto &[hour, minute] : {std::pair{300U, 1U}, std::pair{1U, 60U}}) {
+    for (const auto &[hour, minute] : {std::pair{300, 1}, std::pair{1, 60}}) {
         EXPECT_EQ(failure(store("poweron", "1111111", hour, minute)), 0x0D00U);
     }
     EXPECT_THAT(listedIds(), IsEmpty());
@@ -127,10 +122,9 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     EXPECT_EQ(row_.remove(90010203), -1);           // removed, but not applied
     EXPECT_THAT(logs().front(), HasSubstr("TAVIScheduleSet Error 3328"));
     // 263 must not become 7, a gap must not hide what is behind it.
-    for (const char *entry : {"000=1 2 3", "000=1 127 263 30", "000=-1 127 7 30", "000=1  2 3 4",
-                              "000=1 2 3 4 ", "001=1 2 3 4"}) {
-        writeFile(kConfiguration, "[power off]\n000=1 1 1 1\n001=1 1 1 2\n[power on]\n" +
-                                      std::string(entry) + "\n");
+    for (const std::string entry : {"000=1 2 3", "000=1 127 263 30", "000=-1 127 7 30",
+                                    "000=1  2 3 4", "000=1 2 3 4 ", "001=1 2 3 4"}) {
+        writeFile(kConfiguration, "[power off]\n000=1 1 1 1\n[power on]\n" + entry + "\n");
         EXPECT_EQ(failure(row_.list_get(&list, nullptr)), 0x4000U) << entry;
     }
 }

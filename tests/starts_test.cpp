@@ -1,9 +1,16 @@
 // The minutes at which tasks will really be started.
-#include "support.h"
+#include "arrange.h"
 
 namespace {
 
 using namespace support;
+
+constexpr const char *kNow = "2024-05-08 09:00"; // a Wednesday
+
+void setZone(const char *zone) {
+    setenv("TZ", zone, 1);
+    tzset();
+}
 
 class Starts : public SchedTest {
   protected:
@@ -24,98 +31,64 @@ class Starts : public SchedTest {
         }
         return count < 0 ? "failed" : text;
     }
-    // On all days.
-    static Task powerTask(const char *kind, uint32_t hour, uint32_t minute) {
-        Task task = newTask();
-        task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-        TAVISchedCTaskSetAppArgs(task.get(), kind);
-        task->runHour = hour;
-        task->runMin = minute;
-        return task;
-    }
 };
 
 // Each row's moment is where the search begins.
 TEST_F(Starts, AreWhenCronTakesTheLineAndTheTaskIsDue) {
     const struct {
-        const char *zone;
         When when;
         int days;
     } cases[] = {
         // The minute itself counts, the one at the end does not.
-        {"UTC",
-         {"2024-05-08 09:00", Daily, {2024, 1, 1}, {9, 0}, 0, 0, "", "05-08 09:00, 05-09 09:00"},
-         2},
+        {{kNow, Daily, {}, {9, 0}, 0, 0, "", "05-08 09:00, 05-09 09:00"}, 2},
         // A start date that lies ahead.
-        {"UTC", {"2024-05-08 00:00", Daily, {2024, 5, 10}, {9, 0}, 0, 0, "", "05-10 09:00"}, 3},
-        {"UTC",
-         {"2024-05-06 00:00",
-          Weekly,
-          {2024, 5, 8},
-          {9, 0},
-          0,
-          0,
-          "0111110",
-          "05-08 09:00, 05-09 09:00"},
-         4},
+        {{kNow, Daily, {2024, 5, 10}, {9, 0}, 0, 0, "", "05-10 09:00"}, 3},
+        {{kNow, Weekly, {2024, 5, 9}, {9, 0}, 0, 0, "0111110", "05-09 09:00, 05-10 09:00"}, 4},
         // cron does not take the line of a weekly task on a start date that is not its day.
-        {"UTC",
-         {"2024-05-05 00:00", Weekly, {2024, 5, 5}, {9, 0}, 0, 0, "0100000", "05-06 09:00"},
-         3},
-        {"UTC", {"2024-05-05 00:00", Weekly, {2024, 5, 1}, {9, 0}, 0, 0, "0000000", ""}, 20},
+        {{kNow, Weekly, {2024, 5, 9}, {9, 0}, 0, 0, "0000010", "05-10 09:00"}, 4},
+        {{kNow, Weekly, {2024, 5, 1}, {9, 0}, 0, 0, "0000000", ""}, 20},
         // Months without the day, and years.
-        {"UTC", {"2024-04-01 00:00", Monthly, {2024, 1, 31}, {1, 5}, 0, 0, "", "05-31 01:05"}, 80},
-        {"UTC", {"2025-01-01 00:00", Yearly, {2024, 2, 29}, {1, 5}, 0, 0, "", ""}, 365},
-        {"UTC", {"2028-01-01 00:00", Yearly, {2024, 2, 29}, {1, 5}, 0, 0, "", "02-29 01:05"}, 365},
-        {"UTC", {"2024-05-01 00:00", Once, {2024, 5, 3}, {1, 5}, 0, 0, "", "05-03 01:05"}, 370},
+        {{"2024-04-01 00:00", Monthly, {2024, 1, 31}, {1, 5}, 0, 0, "", "05-31 01:05"}, 80},
+        {{"2025-01-01 00:00", Yearly, {2024, 2, 29}, {1, 5}, 0, 0, "", ""}, 365},
+        {{"2028-01-01 00:00", Yearly, {2024, 2, 29}, {1, 5}, 0, 0, "", "02-29 01:05"}, 365},
+        {{kNow, Once, {2024, 5, 9}, {1, 5}, 0, 0, "", "05-09 01:05"}, 370},
         // Several a day; the last hour counts.
-        {"UTC",
-         {"2024-05-08 09:00",
-          Daily,
-          {2024, 1, 1},
-          {8, 30},
-          4,
-          16,
-          "",
-          "05-08 12:30, 05-08 16:30, 05-09 08:30"},
-         1},
-        {"UTC", {"2024-05-08 00:00", Daily, {2024, 1, 1}, {22, 0}, 3, 5, "", "05-08 22:00"}, 1},
+        {{kNow, Daily, {}, {8, 30}, 4, 16, "", "05-08 12:30, 05-08 16:30, 05-09 08:30"}, 1},
+        {{kNow, Daily, {}, {22, 0}, 3, 5, "", "05-08 22:00"}, 1},
         // What cron rejects never runs.
-        {"UTC", {"2024-05-08 00:00", Daily, {2024, 1, 1}, {20, 0}, 3, 26, "", ""}, 2},
-        {"UTC", {"2024-05-08 00:00", Daily, {2024, 1, 1}, {8, 60}, 0, 0, "", ""}, 2},
-        // An hour that is skipped, and one that is there twice.
-        {"Europe/Berlin",
-         {"2024-03-30 00:00", Daily, {2024, 1, 1}, {2, 30}, 0, 0, "", "03-30 02:30, 04-01 02:30s"},
-         3},
-        {"Europe/Berlin",
-         {"2024-10-26 12:00", Daily, {2024, 1, 1}, {2, 30}, 1, 3, "", "10-27 02:30s, 10-27 03:30"},
-         1},
-        {"America/Sao_Paulo",
-         {"2018-11-03 12:00", Daily, {2018, 1, 1}, {0, 0}, 1, 1, "", "11-04 01:00s"},
-         1},
-        {"Australia/Lord_Howe",
-         {"2024-10-05 12:00", Daily, {2024, 1, 1}, {2, 15}, 1, 3, "", "10-06 03:15s"},
-         1},
-        {"America/St_Johns", // back over midnight, at 00:01
-         {"2010-11-06 00:00",
-          Daily,
-          {2010, 1, 1},
-          {0, 0},
-          23,
-          23,
-          "",
-          "11-06 00:00s, 11-06 23:00s, 11-07 00:00s"},
-         2},
-        {"Pacific/Apia",
-         {"2011-12-29 00:00", Daily, {2011, 1, 1}, {5, 0}, 0, 0, "", "12-29 05:00s, 12-31 05:00s"},
-         2},
+        {{kNow, Daily, {}, {20, 0}, 3, 26, "", ""}, 2},
+        {{kNow, Daily, {}, {8, 60}, 0, 0, "", ""}, 2},
     };
-    for (const auto &c : cases) {
-        setenv("TZ", c.zone, 1);
-        tzset();
-        const Task task = taskOf(c.when);
-        EXPECT_EQ(of(*task, c.when.now, c.days), c.when.expected) << c.when.now << " " << c.zone;
+    for (const auto &[when, days] : cases) {
+        EXPECT_EQ(of(*taskOf(when), when.now, days), when.expected) << when.now;
     }
+}
+
+// An hour that is skipped, and one that is there twice; of tasks of every day.
+TEST_F(Starts, WhereTheClockIsChanged) {
+    const struct {
+        const char *zone, *from;
+        uint32_t run[2], every, last;
+        int days;
+        const char *starts;
+    } cases[] = {
+        {"Europe/Berlin", "2024-03-30 00:00", {2, 30}, 0, 0, 3, "03-30 02:30, 04-01 02:30s"},
+        {"Europe/Berlin", "2024-10-26 12:00", {2, 30}, 1, 3, 1, "10-27 02:30s, 10-27 03:30"},
+        {"America/Sao_Paulo", "2018-11-03 12:00", {0, 0}, 1, 1, 1, "11-04 01:00s"},
+        {"Australia/Lord_Howe", "2024-10-05 12:00", {2, 15}, 1, 3, 1, "10-06 03:15s"},
+        // Back over midnight, at 00:01.
+        {"America/St_Johns", "2010-11-06 12:00", {0, 0}, 23, 23, 1, "11-06 23:00s, 11-07 00:00s"},
+        {"Pacific/Apia", "2011-12-29 00:00", {5, 0}, 0, 0, 2, "12-29 05:00s, 12-31 05:00s"},
+    };
+    for (const auto &row : cases) {
+        setZone(row.zone);
+        const When when{row.from, Daily, {}, {row.run[0], row.run[1]}, row.every, row.last, ""};
+        EXPECT_EQ(of(*taskOf(when), row.from, row.days), row.starts) << row.zone;
+    }
+    // Nothing asks a power-off whether it is due; the wake alarm is set by the clock before.
+    setZone("Europe/Berlin");
+    EXPECT_EQ(of(*powerTask("poweroff", 2, 30), "2024-03-31 00:00", 1), "03-31 03:00s");
+    EXPECT_EQ(of(*powerTask("poweron", 2, 30), "2024-03-31 00:00", 1), "03-31 03:30s");
 }
 
 TEST_F(Starts, OfPowerSchedulesDisabledTasksAndInPieces) {
@@ -133,34 +106,22 @@ TEST_F(Starts, OfPowerSchedulesDisabledTasksAndInPieces) {
     EXPECT_EQ(of(*task, "2024-05-08 00:00", 3), "");
     task->state = TAVI_SCHED_STATE_ENABLED;
     int64_t starts[2];
-    EXPECT_EQ(
-        TAVISchedTaskStarts(task.get(), at("2024-05-08 00:01"), at("2025-05-08 00:01"), starts, 2),
-        2);
+    const int64_t begin = at("2024-05-08 00:01");
+    EXPECT_EQ(TAVISchedTaskStarts(task.get(), begin, begin + 365 * 86400, starts, 2), 2);
     EXPECT_EQ(starts[1], at("2024-05-10 00:00"));
     EXPECT_EQ(failure(TAVISchedTaskStarts(nullptr, 0, 1, starts, 2)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedTaskStarts(task.get(), 0, 1, nullptr, 2)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedTaskStarts(task.get(), 0, 1, starts, 0)), 0x0D00U);
 }
 
-// What cron catches up after a skipped hour is not due any more, but nothing asks a power-off for
-// that; and the wake alarm is set by the clock before.
-TEST_F(Starts, OfPowerSchedulesInASkippedHour) {
-    setenv("TZ", "Europe/Berlin", 1);
-    tzset();
-    Task task = powerTask("poweroff", 2, 30);
-    EXPECT_EQ(of(*task, "2024-03-31 00:00", 1), "03-31 03:00s");
-    TAVISchedCTaskSetAppArgs(task.get(), "poweron");
-    EXPECT_EQ(of(*task, "2024-03-31 00:00", 1), "03-31 03:30s");
-}
-
 TEST_F(Starts, NextOneIsFoundHoweverFarAway) {
     const When cases[] = {
         {"2024-05-08 09:01", Daily, {}, {9, 0}, 0, 0, "", "2024-05-09 09:00"},
-        {"2024-05-08 09:00", Weekly, {9990, 1, 1}, {9, 0}, 0, 0, "1000000", "9990-01-07 09:00"},
+        {kNow, Weekly, {9990, 1, 1}, {9, 0}, 0, 0, "1000000", "9990-01-07 09:00"},
         {"2097-01-01 00:00", Yearly, {2000, 2, 29}, {9, 0}, 0, 0, "", "2104-02-29 09:00"},
-        {"2024-05-08 09:00", Yearly, {2024, 2, 30}, {9, 0}, 0, 0, "", "never"},
-        {"2024-05-08 09:00", Once, {2024, 5, 7}, {9, 0}, 0, 0, "", "never"},
-        {"2024-05-08 09:00", Daily, {kLargest, 5, 7}, {9, 0}, 0, 0, "", "never"},
+        {kNow, Yearly, {2024, 2, 30}, {9, 0}, 0, 0, "", "never"},
+        {kNow, Once, {2024, 5, 7}, {9, 0}, 0, 0, "", "never"},
+        {kNow, Daily, {kLargest, 5, 7}, {9, 0}, 0, 0, "", "never"},
     };
     for (const When &c : cases) {
         const Task task = taskOf(c);
@@ -173,45 +134,39 @@ TEST_F(Starts, NextOneIsFoundHoweverFarAway) {
     }
 }
 
-// The machine is off from 23:30 to 01:00; task 7 of the same application starts on Sundays at
-// 05:00.
-// Each is to make one remark, that is so.
+// The machine is off from 23:30 to 01:00; task 7 of the same application starts on Sundays at 5.
 TEST_F(Starts, RemarksOnSchedules) {
     const struct {
-        const char *zone;
         When when;
+        const char *zone = "UTC";
     } cases[] = {
-        {"UTC", {"2024-05-08 09:00", Daily, {}, {9, 0}, 0, 0, "", ""}},
-        {"UTC", {"2024-05-08 09:00", Weekly, {}, {9, 0}, 0, 0, "0000000", "will never run"}},
-        {"UTC", {"2024-05-08 09:00", Once, {2024, 5, 7}, {9, 0}, 0, 0, "", ""}},
-        {"UTC", {"2024-05-08 09:00", Once, {2024, 6, 31}, {9, 0}, 0, 0, "", "will never run"}},
-        {"UTC",
-         {"2024-05-08 09:00", Daily, {}, {22, 0}, 4, 23, "", "hours later is after hour 23"}},
-        {"UTC", {"2024-05-08 09:00", Daily, {}, {22, 0}, 1, 23, "", ""}},
-        {"UTC", {"2024-05-08 09:00", Monthly, {0, 0, 28}, {9, 0}, 0, 0, "", ""}},
-        {"UTC", {"2024-05-08 09:00", Monthly, {0, 0, 29}, {9, 0}, 0, 0, "", "but in leap years"}},
-        {"UTC", {"2024-05-08 09:00", Monthly, {0, 0, 31}, {9, 0}, 0, 0, "", "31 are passed over"}},
-        {"UTC", {"2024-05-08 09:00", Yearly, {0, 2, 29}, {9, 0}, 0, 0, "", "in leap years alone"}},
-        {"Europe/Berlin",
-         {"2024-05-08 09:00", Daily, {}, {2, 59}, 0, 0, "", "time skips 02:00 to 03:00"}},
-        {"Europe/Berlin", {"2024-05-08 09:00", Daily, {}, {3, 0}, 0, 0, "", ""}},
-        {"Europe/Berlin", {"2024-05-08 09:00", Weekly, {}, {2, 30}, 0, 0, "0111111", ""}},
-        {"UTC", {"2024-05-08 09:00", Daily, {}, {1, 0}, 0, 0, "", "[|]its runs .* 01:00$"}},
-        {"UTC", {"2024-05-08 09:00", Daily, {}, {1, 1}, 0, 0, "", ""}},
-        {"UTC",
-         {"2024-05-08 09:00", Monthly, {0, 0, 9}, {11, 30}, 12, 23, "", "some of its .* 23:30$"}},
-        {"UTC", {"2024-05-08 09:00", Weekly, {}, {5, 0}, 0, 0, "0111111", ""}},
-        {"UTC", {"2024-05-08 09:00", Monthly, {2099, 5, 12}, {5, 0}, 0, 0, "", ""}},
-        {"UTC", {"2024-05-08 09:00", Once, {2023, 5, 12}, {5, 0}, 0, 0, "", ""}},
-        {"UTC", {"2024-05-12 05:01", Daily, {}, {4, 0}, 1, 6, "", "first on 2024-05-19 05:00"}},
+        {{kNow, Daily, {}, {9, 0}, 0, 0, "", ""}},
+        {{kNow, Weekly, {}, {9, 0}, 0, 0, "0000000", "will never run"}},
+        {{kNow, Once, {2024, 5, 7}, {9, 0}, 0, 0, "", ""}},
+        {{kNow, Once, {2024, 6, 31}, {9, 0}, 0, 0, "", "will never run"}},
+        {{kNow, Daily, {}, {22, 0}, 4, 23, "", "hours later is after hour 23"}},
+        {{kNow, Daily, {}, {22, 0}, 1, 23, "", ""}},
+        {{kNow, Monthly, {0, 0, 28}, {9, 0}, 0, 0, "", ""}},
+        {{kNow, Monthly, {0, 0, 29}, {9, 0}, 0, 0, "", "but in leap years"}},
+        {{kNow, Monthly, {0, 0, 31}, {9, 0}, 0, 0, "", "31 are passed over"}},
+        {{kNow, Yearly, {0, 2, 29}, {9, 0}, 0, 0, "", "in leap years alone"}},
+        {{kNow, Daily, {}, {2, 59}, 0, 0, "", "time skips 02:00 to 03:00"}, "Europe/Berlin"},
+        {{kNow, Daily, {}, {3, 0}, 0, 0, "", ""}, "Europe/Berlin"},
+        {{kNow, Weekly, {}, {2, 30}, 0, 0, "0111111", ""}, "Europe/Berlin"},
+        {{kNow, Daily, {}, {1, 0}, 0, 0, "", "[|]its runs .* 01:00$"}},
+        {{kNow, Daily, {}, {1, 1}, 0, 0, "", ""}},
+        {{kNow, Monthly, {0, 0, 9}, {11, 30}, 12, 23, "", "some of its .* 23:30$"}},
+        {{kNow, Weekly, {}, {5, 0}, 0, 0, "0111111", ""}},
+        {{kNow, Monthly, {2099, 5, 12}, {5, 0}, 0, 0, "", ""}},
+        {{kNow, Once, {2023, 5, 12}, {5, 0}, 0, 0, "", ""}},
+        {{"2024-05-12 05:01", Daily, {}, {4, 0}, 1, 6, "", "first on 2024-05-19 05:00"}},
     };
     const auto tell = [](void *text, const TAVI_SCHED_REMARK *remark) {
         *static_cast<std::string *>(text) += "|" + std::string(remark->text);
         return 0;
     };
     for (const auto &c : cases) {
-        setenv("TZ", c.zone, 1);
-        tzset();
+        setZone(c.zone);
         const Task off = powerTask("poweroff", 23, 30);
         const Task on = powerTask("poweron", 1, 0);
         Task seventh = taskOf({c.when.now, Weekly, {}, {5, 0}, 0, 0, "1000000", ""});
@@ -271,15 +226,15 @@ TEST_F(Starts, OffHours) {
     tasks[2]->week[3] = '0'; // not on Wednesdays
     const TAVI_SCHED_TASK *const all[] = {tasks[0].get(), tasks[1].get(), tasks[2].get()};
     TAVI_SCHED_SPAN spans[4];
-    ASSERT_EQ(TAVISchedOffHours(all, 3, at("2024-05-07 06:00"), at("2024-05-08 12:00"), spans, 4),
-              2);
-    EXPECT_EQ(spans[0].from, at("2024-05-07 06:00"));
+    const int64_t begin = at("2024-05-07 06:00");
+    const int64_t end = at("2024-05-08 12:00");
+    ASSERT_EQ(TAVISchedOffHours(all, 3, begin, end, spans, 4), 2);
+    EXPECT_EQ(spans[0].from, begin);
     EXPECT_EQ(spans[0].until, at("2024-05-07 07:00"));
     EXPECT_EQ(spans[1].from, at("2024-05-07 22:00"));
-    EXPECT_EQ(spans[1].until, at("2024-05-08 12:00"));
+    EXPECT_EQ(spans[1].until, end);
     // Nobody knows for how long.
-    EXPECT_EQ(TAVISchedOffHours(all, 2, at("2024-05-07 06:00"), at("2024-05-08 12:00"), spans, 4),
-              0);
+    EXPECT_EQ(TAVISchedOffHours(all, 2, begin, end, spans, 4), 0);
 }
 
 } // namespace

@@ -10,10 +10,10 @@ using TaskRecord = SchedTest;
 
 TEST_F(TaskRecord, FlagsAreZeroOrOne) {
     TAVI_SCHED_TASK task{};
-    for (const auto &[given, stored] : std::vector<std::pair<int, int>>{{1, 1}, {2, 0}, {-1, 0}}) {
+    for (const int given : {1, 2, -1}) {
         TAVISchedCTaskSetListable(&task, given);
         TAVISchedCTaskSetState(&task, given);
-        EXPECT_EQ(task.listable * 10 + task.state, stored * 11) << given;
+        EXPECT_EQ(task.listable * 10 + task.state, given == 1 ? 11 : 0) << given;
     }
     int value = 1;
     task.listable = 2;
@@ -23,30 +23,29 @@ TEST_F(TaskRecord, FlagsAreZeroOrOne) {
 
 // A row that names another field than its accessor would show here: every text goes into its own.
 TEST_F(TaskRecord, TextsAreCutToTheirOwnField) {
-    struct Row {
+    const struct {
         int (*set)(TAVI_SCHED_TASK *, const char *);
         int (*get)(char *, size_t, const TAVI_SCHED_TASK *);
         size_t size;
-    };
-    const Row rows[] = {{TAVISchedCTaskSetName, TAVISchedCTaskGetName, 4096},
-                        {TAVISchedCTaskSetWeek, TAVISchedCTaskGetWeek, 8},
-                        {TAVISchedCTaskSetEditDialog, TAVISchedCTaskGetEditDialog, 1024},
-                        {TAVISchedCTaskSetEditForm, TAVISchedCTaskGetEditForm, 1024},
-                        {TAVISchedCTaskSetApp, TAVISchedCTaskGetApp, 1024},
-                        {TAVISchedCTaskSetAppName, TAVISchedCTaskGetAppName, 1024},
-                        {TAVISchedCTaskSetAppArgs, TAVISchedCTaskGetAppArgs, 8192},
-                        {TAVISchedCTaskSetAction, TAVISchedCTaskGetAction, 1024},
-                        {TAVISchedCTaskSetCommand, TAVISchedCTaskGetCommand, 16384}};
+    } rows[] = {{TAVISchedCTaskSetName, TAVISchedCTaskGetName, 4096},
+                {TAVISchedCTaskSetWeek, TAVISchedCTaskGetWeek, 8},
+                {TAVISchedCTaskSetEditDialog, TAVISchedCTaskGetEditDialog, 1024},
+                {TAVISchedCTaskSetEditForm, TAVISchedCTaskGetEditForm, 1024},
+                {TAVISchedCTaskSetApp, TAVISchedCTaskGetApp, 1024},
+                {TAVISchedCTaskSetAppName, TAVISchedCTaskGetAppName, 1024},
+                {TAVISchedCTaskSetAppArgs, TAVISchedCTaskGetAppArgs, 8192},
+                {TAVISchedCTaskSetAction, TAVISchedCTaskGetAction, 1024},
+                {TAVISchedCTaskSetCommand, TAVISchedCTaskGetCommand, 16384}};
     TAVI_SCHED_TASK task{};
-    char filler = 'a';
-    for (const Row &row : rows) {
-        EXPECT_EQ(row.set(&task, std::string(20000, filler++).c_str()), 0);
+    for (const auto &row : rows) {
+        const char filler = static_cast<char>('a' + (&row - rows));
+        EXPECT_EQ(row.set(&task, std::string(20000, filler).c_str()), 0);
     }
-    filler = 'a';
-    std::string buffer(20001, '#');
-    for (const Row &row : rows) {
+    for (const auto &row : rows) {
+        const char filler = static_cast<char>('a' + (&row - rows));
+        std::string buffer(20001, '#');
         EXPECT_EQ(row.get(buffer.data(), buffer.size(), &task), 0);
-        EXPECT_EQ(std::string(buffer.c_str()), std::string(row.size - 1, filler++));
+        EXPECT_EQ(buffer.c_str(), std::string(row.size - 1, filler));
     }
 }
 

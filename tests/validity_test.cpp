@@ -1,8 +1,9 @@
 // What is wrong with a task before it is stored.
-#include "support.h"
+#include "arrange.h"
 
 #include <cstring>
 #include <dlfcn.h>
+#include <functional>
 #include <pwd.h>
 
 namespace {
@@ -11,16 +12,32 @@ using namespace support;
 
 bool noUserHasAName = false;
 
-class Validity : public SchedTest {
-  protected:
-    // "key: reason" of the task's first fault, or "".
-    static std::string faultOf(const TAVI_SCHED_TASK &task) {
-        TAVI_SCHED_FAULT fault{};
-        const int found = TAVISchedTaskCheck(&task, &fault);
-        EXPECT_EQ(found, fault.kind == TAVI_SCHED_FAULT_VALUE ? 1 : 0);
-        return found == 1 ? std::string(fault.key) + ": " + fault.reason : "";
-    }
+// "key: reason" of the task's first fault, or "".
+std::string faultOf(const TAVI_SCHED_TASK &task) {
+    TAVI_SCHED_FAULT fault{};
+    const int found = TAVISchedTaskCheck(&task, &fault);
+    EXPECT_EQ(found, fault.kind == TAVI_SCHED_FAULT_VALUE ? 1 : 0);
+    return found == 1 ? std::string(fault.key) + ": " + fault.reason : "";
+}
+
+using Validity = SchedTest;
+using T = TAVI_SCHED_TASK;
+
+// A change of a sound task, and the front of the text of the fault that comes of it; "" for none.
+struct Row {
+    void (*change)(T &);
+    const char *fault;
 };
+
+template <size_t size>
+void expectFaults(const Row (&rows)[size], const std::function<Task()> &make) {
+    for (const Row &row : rows) {
+        const Task task = make();
+        row.change(*task);
+        const std::string fault = faultOf(*task);
+        EXPECT_EQ(*row.fault == '\0' ? fault : fault.substr(0, std::strlen(row.fault)), row.fault);
+    }
+}
 
 void setDate(TAVI_SCHED_TASK &task, int type, uint32_t year, uint32_t month, uint32_t day) {
     task.type = type;
@@ -30,11 +47,7 @@ void setDate(TAVI_SCHED_TASK &task, int type, uint32_t year, uint32_t month, uin
 }
 
 TEST_F(Validity, OfTasks) {
-    using T = TAVI_SCHED_TASK;
-    const struct {
-        void (*change)(T &);
-        const char *fault; // the text's front; "" for none
-    } kCases[] = {
+    const Row cases[] = {
         {[](T &) {}, ""},
         {[](T &t) { t.backend = -1; }, "backend: -1; accepted: -3 or -2"},
         {[](T &t) { t.canEditName = 2; }, "can edit name: 2; accepted: 0 or 1"},
@@ -73,15 +86,7 @@ TEST_F(Validity, OfTasks) {
         {[](T &t) { t.type = 5; }, "type: 5; accepted: once, daily, weekly, monthly, yearly"},
         {[](T &t) { t.type = -1; }, "type: -1;"},
     };
-    for (const auto &c : kCases) {
-        const Task task = newTask();
-        c.change(*task);
-        const std::string fault = faultOf(*task);
-        EXPECT_EQ(fault.substr(0, std::strlen(c.fault)), c.fault);
-        if (*c.fault == '\0') {
-            EXPECT_EQ(fault, "");
-        }
-    }
+    expectFaults(cases, [] { return newTask(); });
     EXPECT_THAT(logs(), IsEmpty());
     TAVI_SCHED_FAULT fault;
     EXPECT_EQ(failure(TAVISchedTaskCheck(nullptr, &fault)), 0x0D00U);
@@ -89,11 +94,7 @@ TEST_F(Validity, OfTasks) {
 }
 
 TEST_F(Validity, OfPowerSchedules) {
-    using T = TAVI_SCHED_TASK;
-    const struct {
-        void (*change)(T &);
-        const char *fault;
-    } kCases[] = {
+    const Row cases[] = {
         {[](T &) {}, ""},
         {[](T &t) { TAVISchedCTaskSetAppArgs(&t, "poweron"); }, ""},
         {[](T &t) { TAVISchedCTaskSetAppArgs(&t, "PowerOn"); },
@@ -106,55 +107,30 @@ TEST_F(Validity, OfPowerSchedules) {
          "week: \"0111110\"; accepted for a daily power schedule: 1111111"},
         {[](T &t) { TAVISchedCTaskSetWeek(&t, "0111110"), t.type = Weekly; }, ""},
     };
-    for (const auto &c : kCases) {
-        TAVI_SCHED_TASK task{};
-        task.backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-        TAVISchedTaskGetDefault(&task);
-        TAVISchedCTaskSetAppArgs(&task, "poweroff");
-        c.change(task);
-        EXPECT_EQ(faultOf(task), c.fault);
-    }
+    expectFaults(cases, [] { return powerTask("poweroff"); });
 }
 
 TEST_F(Validity, OfTextsForJson) {
-    const struct {
-        const char *text;
-        bool good;
-    } kCases[] = {
-        {"\x7f\xc2\x80\xdf\xbf", true},
-        {"\xe0\xa0\x80\xed\x9f\xbf\xee\x80\x80", true},
-        {"\xf0\x90\x80\x80\xf4\x8f\xbf\xbf", true},
-        {"\x80", false},
-        {"\xc1\xbf", false},
-        {"\xe0\x9f\xbf", false},
-        {"\xf0\x8f\xbf\xbf", false},
-        {"\xed\xa0\x80", false},
-        {"\xf4\x90\x80\x80", false},
-        {"\xf8\x88\x80\x80\x80", false},
-        {"\xc3", false},
-        {"\xe2\x82", false},
-        {"\xc3(", false},
-        {"\xf0\x90\x80\xc0", false},
-        {"\xff", false},
-    };
-    for (const auto &c : kCases) {
-        const Task task = newTask();
-        TAVISchedCTaskSetEditForm(task.get(), c.text);
-        EXPECT_EQ(faultOf(*task), c.good ? ""
-                                         : "edit form: it is not valid UTF-8; accepted: one "
-                                           "line of UTF-8")
-            << testing::PrintToString(c.text);
+    const Task task = newTask();
+    for (const char *const good : {"\x7f\xc2\x80\xdf\xbf", "\xe0\xa0\x80\xed\x9f\xbf\xee\x80\x80",
+                                   "\xf0\x90\x80\x80\xf4\x8f\xbf\xbf"}) {
+        TAVISchedCTaskSetEditForm(task.get(), good);
+        EXPECT_EQ(faultOf(*task), "");
+    }
+    for (const char *const bad : {"\x80", "\xc1\xbf", "\xe0\x9f\xbf", "\xf0\x8f\xbf\xbf",
+                                  "\xed\xa0\x80", "\xf4\x90\x80\x80", "\xf8\x88\x80\x80\x80",
+                                  "\xc3", "\xe2\x82", "\xc3(", "\xf0\x90\x80\xc0", "\xff"}) {
+        TAVISchedCTaskSetEditForm(task.get(), bad);
+        EXPECT_EQ(faultOf(*task), "edit form: it is not valid UTF-8; accepted: one line of UTF-8")
+            << testing::PrintToString(bad);
     }
 }
 
 // Every task that is sound has a line that cron takes, which needs root to be a user.
 TEST_F(Validity, OfLinesForCron) {
-    const Task task = newTask();
     noUserHasAName = true;
-    EXPECT_EQ(faultOf(*task), ": cron would reject its line: there is no user \"root\"");
-    task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-    TAVISchedCTaskSetAppArgs(task.get(), "poweron");
-    EXPECT_EQ(faultOf(*task), "");
+    EXPECT_EQ(faultOf(*newTask()), ": cron would reject its line: there is no user \"root\"");
+    EXPECT_EQ(faultOf(*powerTask("poweron")), "");
     noUserHasAName = false;
 }
 

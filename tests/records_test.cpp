@@ -585,7 +585,7 @@ TEST_F(Records, ManyAtOnce) {
 // The examples, with stand-ins for the programs that they call; nothing in a name is obeyed.
 TEST_F(Records, HandlersThatAreShipped) {
     const std::string folder = "/usr/tavi/etc/plugins/task_scheduler_run";
-    shell("mkdir -p /tmp/bin " + folder + "; cp " EXAMPLES "/* " + folder);
+    shell("mkdir -p /tmp/bin " + folder + "; cp '" EXAMPLES "'/* " + folder);
     writeFile("/tmp/bin/sendmail", "#!/bin/sh\ncat > /tmp/mail\n");
     writeFile("/tmp/bin/curl", "#!/bin/sh\nfor word; do echo \"$word\"; done > /tmp/post\n");
     shell("chmod 755 /tmp/bin/*");

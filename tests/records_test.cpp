@@ -557,6 +557,21 @@ TEST_F(Records, ALockedDatabaseIsNotWaitedForLong) {
     EXPECT_EQ(results(ofTask(-1)), "3:0 3:0 ");
 }
 
+TEST_F(Records, ANewDatabaseIsMadeBesideOthers) {
+    storedTask("sleep 0.2"); // it is recorded when it begins, too
+    const pid_t other = fork();
+    if (other == 0) {
+        recorded("BEGIN IMMEDIATE", "/tmp/locked");
+    }
+    awaitThat([] { return access("/tmp/locked", F_OK) == 0; });
+    ASSERT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
+    awaitThat([] { return query("SELECT status_code FROM task_status") == "3 "; });
+    kill(other, SIGKILL);
+    waitForChildren();
+    EXPECT_THAT(logs(), IsEmpty());
+    EXPECT_EQ(results(ofTask(-1)), "3:0 ");
+}
+
 TEST_F(Records, ManyAtOnce) {
 #ifdef __SANITIZE_ADDRESS__
     constexpr int kMany = 30;

@@ -366,8 +366,18 @@ bool sched::RunRecords::openOnce(Mode mode) {
            execute("PRAGMA wal_autocheckpoint=100");
 }
 
+// SQLite does not wait by itself for another that makes the new database just now.
+bool sched::RunRecords::keepLog() {
+    while (!execute("PRAGMA journal_mode=WAL")) {
+        if (sqlite3_errcode(database_.get()) != SQLITE_BUSY || onBusy(this, 0) == 0) {
+            return false;
+        }
+    }
+    return true;
+}
+
 bool sched::RunRecords::upgrade() {
-    if (!execute("PRAGMA journal_mode=WAL") || !execute("BEGIN IMMEDIATE")) {
+    if (!keepLog() || !execute("BEGIN IMMEDIATE")) {
         return false;
     }
     auto version = number("PRAGMA user_version", {}); // another process may have been faster

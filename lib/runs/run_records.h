@@ -94,6 +94,7 @@ class RunRecords {
     bool open(Mode mode);
     bool openOnce(Mode mode);
     bool isDamaged() const;
+    bool keepLog();
     bool upgrade();
     bool execute(const char *sql);
     Statement prepare(const std::string &sql);

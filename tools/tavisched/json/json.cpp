@@ -3,10 +3,12 @@
 #include "text/utf8.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdio>
 #include <json/reader.h>
 #include <json/writer.h>
 #include <memory>
+#include <new>
 
 namespace tavisched {
 
@@ -16,11 +18,15 @@ std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json
     builder["strictRoot"] = !anyRoot;
     const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
     std::string errors;
+    errno = 0;
     try {
         if (reader->parse(text.data(), text.data() + text.size(), &value, &errors)) {
             return std::nullopt;
         }
-    } catch (const Json::Exception &refusal) { // of deep nesting
+    } catch (const Json::Exception &refusal) { // of deep nesting, or for lack of memory
+        if (errno == ENOMEM) {
+            throw std::bad_alloc();
+        }
         errors = refusal.what();
     }
     std::replace(errors.begin(), errors.end(), '\n', ' ');

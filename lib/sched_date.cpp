@@ -156,7 +156,15 @@ int TAVISchedDateNormalize(TAVI_SCHED_DATE *pDate) {
     broken.tm_mday = static_cast<int>(pDate->day);
     broken.tm_hour = static_cast<int>(pDate->hour);
     broken.tm_min = static_cast<int>(pDate->minute);
-    return sched::toLocalDate(std::mktime(&broken), *pDate, SCHED_SITE);
+    constexpr int kNoDay = -1; // set only when it fails, unlike the time
+    broken.tm_wday = kNoDay;
+    const time_t time = std::mktime(&broken);
+    if (broken.tm_wday == kNoDay) {
+        SCHED_LOG("mktime failed. %m");
+        SCHED_SET_ERROR(sched::kSystemCallFailed);
+        return -1;
+    }
+    return sched::toLocalDate(time, *pDate, SCHED_SITE);
 }
 
 int TAVISchedNextTriggerTime(TAVI_SCHED_TASK *pTask) {

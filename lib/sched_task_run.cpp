@@ -353,8 +353,9 @@ class TaskRun {
         return true;
     }
 
+    // A row that is left as it is tells of a run that was interrupted.
     void storeResult() {
-        if (!openDatabase()) {
+        if (run_.isLost() || !openDatabase()) {
             return;
         }
         if (TAVISchedDBSetStatus(database_.get(), statusId_, SCHED_STATUS_CODE_RUNNING, statusCode_,

@@ -83,7 +83,7 @@ TEST_F(Backend, ResultsAndMessagesOfTheDispatchRules) {
     row_.get_default = [](TAVI_SCHED_TASK *) { return -1; };
     EXPECT_EQ(TAVISchedTaskAlloc(), nullptr);
     EXPECT_THAT(lastLog(), HasSubstr("sched_task_alloc.cpp:* Init task to default failed. ["));
-    fakes.callocFails = sizeof(TAVI_SCHED_TASK);
+    faults().callocFails = sizeof(TAVI_SCHED_TASK);
     EXPECT_EQ(TAVISchedTaskAlloc(), nullptr);
     EXPECT_EQ(PLATCErrGet(), 0x0200U);
 }

@@ -203,7 +203,7 @@ TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
 }
 
 TEST_F(Sort, OutOfMemoryLeavesTheListAlone) {
-    fakes.callocFails = 3 * sizeof(void *);
+    faults().callocFails = 3 * sizeof(void *);
     EXPECT_EQ(sorted("name", 1), "8b 9B 10b ");
     EXPECT_EQ(failure(result_), 0x0100U);
     EXPECT_EQ(PLATCErrorGetLine(), 67);

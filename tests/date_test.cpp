@@ -68,7 +68,7 @@ TEST_F(Dates, NormalizeCarries) {
     // Standard time: in summer the result is an hour later.
     setenv("TZ", kSummerTime, 1);
     EXPECT_EQ(normalized({2024, 7, 1, 0, 23, 30}), "2024-7-2 0:30 w2");
-    fakes.localtimeFails = true;
+    fail(Fault::Time, 2);
     EXPECT_EQ(normalized({2024, 7, 2, 3, 4, 5}), "failed, 2024-7-2 4:5 w3");
     EXPECT_EQ(PLATCErrGet(), 0x2A00U);
     EXPECT_THAT(logs(), ElementsAre(HasSubstr("sched_date.cpp:* localtime failed. Value too ")));
@@ -120,7 +120,7 @@ TEST_F(Dates, NextTriggerTime) {
     Task task = taskOf({"2024-07-01 23:30", Daily, {}, {}, 0, 0, "", "2024-07-03 00:00"});
     task->id = 7;
     for (const int result : {0, -1}) {
-        fakes.localtimeFails = result != 0;
+        fail(result != 0 ? Fault::Time : Fault::None);
         EXPECT_EQ(TAVISchedNextTriggerTime(task.get()), result);
         EXPECT_STREQ(task->nextTriggerTime, "2024-07-03 00:00");
     }

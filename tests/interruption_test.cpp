@@ -1,6 +1,7 @@
-// Changes that are cut off, or meet a call that fails: at every system call that changes a file all
-// processes, the caller alone or a started program alone are killed, a write is cut short, or the
-// call fails. Afterwards the tasks are as they were or as they are to be, in every file.
+// Operations that are cut off, or meet calls that fail: at every system call that changes a file
+// all processes, the caller alone or a started program alone are killed, or a write is cut short;
+// or a call of some kind fails. Afterwards the tasks are as they were or as they are to be, in
+// every file, and runs are told of as they were.
 #include "machine.h"
 #include "tracer.h"
 
@@ -8,7 +9,6 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstdio>
 #include <cstring>
 #include <fcntl.h>
 #include <functional>
@@ -22,18 +22,15 @@ using namespace support;
 
 // ---- Operations ----
 
-// What an operation may fail with; also what the platform's functions set.
-bool isDocumented(unsigned int code) {
-    constexpr std::array<unsigned int, 12> kCodes = {0x0100, 0x0200, 0x0400, 0x0500,
-                                                     0x0900, 0x0B00, 0x0D00, 0x2000,
-                                                     0x2700, 0x2800, 0x2A00, 0x4000};
-    return std::find(kCodes.begin(), kCodes.end(), code) != kCodes.end();
-}
+constexpr int kInstead = 4;
 
 struct Operation {
     const char *name;
-    std::function<int()> run;              // 0 or 1
-    std::function<void()> prepare = [] {}; // on top of three tasks and a power schedule
+    const char *suites;                               // 'k'illed, 't'aken back, 'f'ailing
+    std::function<int()> run;                         // 0, 1, or kInstead
+    std::function<void()> prepare = [] {};            // on top of three tasks and a power schedule
+    std::function<std::string(int)> faults = nullptr; // what else is wrong after an answer
+    std::function<int()> instead = nullptr;           // does what it may do instead
     bool isBatch = false;
     bool isPower = false;
 };
@@ -42,18 +39,15 @@ int editedHere() {
     return edited("a name of quite another length than the one it had");
 }
 
-int saved() {
-    TAVI_SCHED_TASK task{};
-    static std::array<char, 160 << 10> json;
-    if (TAVISchedTaskGetByID(3, &task) != 0) {
-        return 1;
+std::array<char, 160 << 10> json; // of task 3, changed
+
+// What is no JSON sets no code. Where the stored task cannot be read, a new one is made.
+int saved(int create = 0) {
+    const int id = TAVISchedTaskSaveFromJson(json.data(), create);
+    if (id == -1 && PLATCErrGet() == 0) {
+        PLATCErrSetEx(TAVI_SCHED_ERR_BAD_FORMAT, "", 0);
     }
-    task.runMin = 17;
-    {
-        const OwnAllocations own;
-        TAVISchedTaskConvertToJson(&task, json.data(), json.size());
-    }
-    return TAVISchedTaskSaveFromJson(json.data(), 0) == 3 ? 0 : 1;
+    return id == -1 ? 1 : id == 3 ? 0 : kInstead;
 }
 
 int batchDone() {
@@ -63,45 +57,145 @@ int batchDone() {
     return changed && TAVISchedChangeCommit() == 0 ? 0 : 1;
 }
 
-int tool(std::vector<const char *> arguments) {
-    const int null = open("/dev/null", O_RDWR);
-    for (const int stream : {0, 1, 2}) {
-        dup2(null, stream);
-    }
-    arguments.insert(arguments.begin(), TAVISCHED);
-    arguments.push_back(nullptr);
-    setenv("ASAN_OPTIONS", "detect_leaks=0", 1); // which cannot be had under a tracer
-    execv(TAVISCHED, const_cast<char *const *>(arguments.data()));
-    return 1;
+bool isWhole(const TAVI_SCHED_TASK &task) {
+    return task.name[0] != '\0' && task.nextTriggerTime[0] == '2';
 }
 
-// Those of these names, or all.
-std::vector<Operation> operations(const std::vector<std::string> &names = {}) {
-    std::vector<Operation> all = {
-        {"create", [] { return created("new"); }},
-        {"edit", editedHere},
-        {"remove", [] { return TAVISchedTaskRemove(2) == 0 ? 0 : 1; }},
-        {"save", saved},
-        {.name = "batch", .run = batchDone, .isBatch = true},
-        {.name = "power", .run = [] { return powerCreated(); }, .isPower = true},
-        {"sync", [] { return TAVISchedTaskSync() == 0 ? 0 : 1; }},
-        {"first_create", [] { return created("new"); },
-         [] { shell("rm -r /tmp/* /usr/tavi/etc/*; sed -i /tavi/d /etc/crontab"); }},
-        {"create_with_differing_files", [] { return created("new"); },
-         [] { writeFile(kPersistent, readFile(kPersistent) + "[9]\nname=of the file alone\n"); }},
-        {"tool_add",
-         [] {
-             return tool({"add", "--command", "true", "--at", "03:00"});
-         }},
-        {"tool_disable",
-         [] {
-             return tool({"disable", "1", "3"});
-         }},
+// What is missing in a list has been logged.
+int listed() {
+    TAVI_SCHED_TASK *list = nullptr;
+    int whole = 0;
+    const int count = TAVISchedTaskListGet(&list, nullptr);
+    for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
+        whole += isWhole(*task) ? 1 : 0;
+    }
+    TAVISchedTaskListFree(&list);
+    const OwnAllocations own;
+    return whole == 4 ? 0 : count <= whole && !logs().empty() ? 1 : 2;
+}
+
+int readById() {
+    TAVI_SCHED_TASK task{};
+    const int result = TAVISchedTaskGetByID(2, &task);
+    return result != 0 ? 1 : isWhole(task) ? 0 : 2;
+}
+
+// ---- Programs ----
+
+constexpr const char *kSaid = "/home/said"; // not among the files whose calls fail
+
+template <typename... Arguments> int tool(Arguments... arguments) {
+    const int null = open("/dev/null", O_RDWR);
+    dup2(null, 0);
+    dup2(null, 1);
+    dup2(open(kSaid, O_WRONLY | O_CREAT | O_TRUNC, 0600), 2);
+    if (faults().kind != Fault::None) {
+        letProgramFail(FAULTS);
+    }
+    return execl(TAVISCHED, TAVISCHED, arguments..., nullptr);
+}
+
+// Two tasks with another command, one as a new one.
+void exportTasks() {
+    shell(TAVISCHED " export | sed 's/\"true\"/\"false\"/; s/\"one\"/\"uno\"/' "
+                    "> /run/tasks.json");
+}
+
+std::string faultsOfTool(int answer) {
+    return answer == 0 || readFile(kSaid).find("tavisched: ") != std::string::npos
+               ? ""
+               : " it said nothing";
+}
+
+// ---- Runs ----
+
+constexpr const char *kRan = "/home/ran";
+
+int ran(int32_t id) {
+    return TAVISchedTaskRun(id, 0, 0) == 0 ? 0 : 1;
+}
+
+void runOther() {
+    ran(1);
+    waitForChildren();
+}
+
+std::string recordsOf(int32_t id) {
+    std::string text;
+    TAVI_SCHED_RUN_FILTER filter{};
+    filter.taskId = id;
+    const auto take = [](void *to, const TAVI_SCHED_RUN *run) {
+        *static_cast<std::string *>(to) += std::to_string(run->taskId) + ":" +
+                                           std::to_string(run->due) + ":" +
+                                           std::to_string(run->result) + " ";
+        return 0;
     };
-    std::erase_if(all, [&](const Operation &operation) {
-        return !names.empty() &&
-               std::find(names.begin(), names.end(), operation.name) == names.end();
-    });
+    EXPECT_GE(TAVISchedRunList(&filter, take, &text), 0);
+    return text;
+}
+
+// What row and record tell, if there are any, is what became of the command; the lock is free.
+std::string faultsOfRun(int answer) {
+    const std::string row = query("SELECT status_code FROM task_status WHERE task_id=3");
+    const std::string marks = readFile(kRan);
+    const std::string record = recordsOf(3);
+    const bool isRight =
+        marks.empty()
+            ? row.empty() || (answer == 0 && (row == "2 " || row == "4 ") && record != "3:0:3 ")
+            : answer == 0 && marks == "x" && (row == "3 " || row == "2 ") &&
+                  (record.empty() || record == "3:0:3 " || record == "3:0:1 ");
+    const bool isLocked = shell("cd /tmp/lock && ! flock -n lock_sched_run true") == 0;
+    return isRight && !isLocked ? "" : row + "| " + marks + "| " + record + (isLocked ? "|" : "");
+}
+
+std::string missedRuns; // as they are to be found
+
+std::string findMissed() {
+    TAVISchedMissedRunsFind();
+    return recordsOf(-1);
+}
+
+// Two days later, and one of the runs is known.
+void missRuns() {
+    *fakes.now += 2 * 86400;
+    query("INSERT INTO task_status (pid, timestamp, task_id, status_code) VALUES (1, " +
+          std::to_string(*fakes.now / 86400 * 86400 - 86400) + ", 2, 3)");
+    const Snapshot before;
+    missedRuns = findMissed();
+    before.restore();
+}
+
+// What could not be found is found next time.
+std::string faultsOfMissed(int) {
+    const std::string found = findMissed();
+    return found == missedRuns ? "" : " not " + missedRuns + "but " + found;
+}
+
+std::vector<Operation> operations(char suite) {
+    std::vector<Operation> all = {
+        {"create", "kf", [] { return created("new"); }},
+        {"edit", "kf", editedHere},
+        {"remove", "kf", [] { return TAVISchedTaskRemove(2) == 0 ? 0 : 1; }},
+        {"save", "kf", [] { return saved(); }, [] {}, nullptr, [] { return saved(1); }},
+        {.name = "batch", .suites = "ktf", .run = batchDone, .isBatch = true},
+        {.name = "power", .suites = "kf", .run = [] { return powerCreated(); }, .isPower = true},
+        {"sync", "ktf", [] { return TAVISchedTaskSync() == 0 ? 0 : 1; }},
+        {"first_create", "ktf", [] { return created("new"); },
+         [] { shell("rm -r /tmp/* /usr/tavi/etc/*; sed -i /tavi/d /etc/crontab"); }},
+        {"create_with_differing_files", "kt", [] { return created("new"); },
+         [] { writeFile(kPersistent, readFile(kPersistent) + "[9]\nname=of the file alone\n"); }},
+        {"tool_add", "k", [] { return tool("add", "--command", "true", "--at", "03:00"); }},
+        {"tool_disable", "k", [] { return tool("disable", "1", "3"); }},
+        {"tool_import", "f", [] { return tool("import", "--replace", "/run/tasks.json"); },
+         exportTasks, faultsOfTool, nullptr, true},
+        {"list", "f", listed},
+        {"get", "f", readById},
+        {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
+        {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
+        {"missed", "f", [] { return TAVISchedMissedRunsFind() == 0 ? 0 : 1; }, missRuns,
+         faultsOfMissed}};
+    std::erase_if(
+        all, [&](const Operation &operation) { return !std::strchr(operation.suites, suite); });
     return all;
 }
 
@@ -111,353 +205,296 @@ std::string nameOf(const testing::TestParamInfo<Operation> &operation) {
 
 // ---- The test ----
 
+// How an operation meets its end, and so what may be found afterwards. Outside of a batch a task is
+// stored also when the crontab cannot be written, and power schedules when they cannot be applied.
+// Without memory nothing can be taken back: whoever comes next does that, as after a cut.
+enum class End { Cut, Failure, Exhaustion };
+
+// What became of an operation: what it answered, unless it was killed.
+struct Try {
+    bool acted = true;
+    std::string where;
+    std::optional<int> answer;
+};
+
+Try tryOf(const tracer::Run &run) {
+    Try tried{run.acted, run.call.name + " " + run.call.path, std::nullopt};
+    if (run.crashed || WIFEXITED(run.status)) {
+        tried.answer = run.crashed ? 99 : WEXITSTATUS(run.status);
+    }
+    return tried;
+}
+
 class Interruption : public SchedTest, public testing::WithParamInterface<Operation> {
   protected:
     void SetUp() override {
         SchedTest::SetUp();
         signal(SIGHUP, SIG_IGN);
-        for (const char *const name : {"one", "two", "three"}) {
-            ASSERT_EQ(created(name), 0);
-        }
+        // Of programs; leaks cannot be looked for under a tracer.
+        setenv("ASAN_OPTIONS",
+               "abort_on_error=1:detect_leaks=0:verify_asan_link_order=0:"
+               "alloc_dealloc_mismatch=0",
+               1);
+        fakes.now = time(nullptr);
+        ASSERT_EQ(created("one"), 0);
+        ASSERT_EQ(created("two"), 0);
+        ASSERT_EQ(created("three", "printf x >> /home/ran"), 0);
         ASSERT_EQ(powerCreated(5), 0);
+        TAVI_SCHED_TASK task{};
+        TAVISchedTaskGetByID(3, &task);
+        task.runMin = 17;
+        ASSERT_EQ(TAVISchedTaskConvertToJson(&task, json.data(), json.size()), 0);
         writeFile("/run/crond.pid", std::to_string(getpid()));
         GetParam().prepare();
         start_.emplace();
-        old_ = stateNow();
-        oldList_ = listOfFreshProcess();
+        old_ = found();
+        new_ = half_ = learn(GetParam().run);
+        half_[kCrontab] = old_[kCrontab];
+        instead_ = GetParam().instead ? learn(GetParam().instead) : State();
     }
 
-    // What an operation that nothing disturbs leaves.
-    void learn(const Operation &operation) {
-        const auto undisturbed = tracer::run(operation.run, {});
-        ASSERT_EQ(undisturbed.status, 0) << lastLog();
-        new_ = stateNow();
-        newList_ = listOfFreshProcess();
-        EXPECT_EQ(stateNow(), new_);
-        EXPECT_THAT(leftovers(), IsEmpty());
-    }
-
-    static std::optional<int> answerOf(const tracer::Run &run) {
-        return WIFEXITED(run.status) ? std::optional(WEXITSTATUS(run.status)) : std::nullopt;
-    }
-
-    // What is wrong with the machine after a run; "" when nothing is.
-    std::string faults(std::optional<int> answer) const {
-        const std::string list = listOfFreshProcess();
-        const State now = stateNow();
-        const bool isOld = now == old_ && list == oldList_;
-        const bool isNew = now == new_ && list == newList_;
-        std::string found;
-        if (!isOld && !isNew) {
-            found += "neither old nor new:" + difference(now, list);
-        } else if (answer && !(*answer == 0 ? isNew : isOld)) {
-            found += " the answer was " + std::to_string(*answer) + ", the tasks are the " +
-                     (isOld ? "old" : "new");
-        }
-        for (const std::string &path : leftovers()) {
-            found += " left: " + path;
-        }
-        return found;
-    }
-
-    std::string faultsOfFailed(const Operation &operation, int answer) const {
-        State now = stateNow();
-        const std::string list = listOfFreshProcess();
-        std::string found = now == stateNow() ? "" : " the list changed something;";
-        const std::string crontab = std::exchange(now[kCrontab], "");
-        const auto isLike = [&](State wanted) {
-            wanted[kCrontab].clear();
-            return now == wanted;
-        };
-        const bool isOld = isLike(old_) && list == oldList_ && crontab == old_.at(kCrontab);
-        const bool isStored = isLike(new_) && list == newList_;
-        const bool isNew = isStored && crontab == new_.at(kCrontab);
-        const bool isHalf = isStored && crontab == old_.at(kCrontab);
-        const bool mayBeHalf = answer == 0 ? !operation.isBatch : operation.isPower;
-        const bool isRight = answer == 0 ? isNew : answer == 1 && isOld;
-        if (!isRight && !(mayBeHalf && (isHalf || isNew))) {
-            now[kCrontab] = crontab;
-            found += " the answer was " + std::to_string(answer) + ";" + difference(now, list);
-        }
-        for (const std::string &path : leftovers()) {
-            found += " left: " + path;
-        }
-        return found;
-    }
-
-    // Goes through all points of a plan; prints and checks how many held.
-    void tryAll(const Operation &operation, const char *what, tracer::Plan plan,
-                const std::function<bool(const tracer::Call &)> &concerned) {
-        size_t tried = 0;
-        size_t held = 0;
-        for (const size_t point : pointsOf(operation, plan, concerned)) {
-            plan.point = point;
+    // Goes through points, each time from the start.
+    void tryAll(const char *what, const std::vector<size_t> &points, End end,
+                const std::function<Try(size_t)> &tryAt) {
+        Tally tally(std::string(GetParam().name) + ", " + what);
+        for (const size_t point : points) {
             start_->restore();
+            unlink(kRan);
+            unlink(kSaid);
             logs();
-            const auto run = tracer::run(operation.run, plan);
-            if (!run.acted) {
-                continue;
+            Try tried = tryAt(point);
+            const std::string said = readFile(kSaid);
+            if (said.find("what was asked for was done") != std::string::npos) {
+                tried.answer = 0;
             }
-            ++tried;
-            const std::string found = faults(answerOf(run));
-            held += found.empty() ? 1 : 0;
-            if (!found.empty() && tried - held <= 5) {
-                ADD_FAILURE() << operation.name << ", " << what << " at " << point << ": "
-                              << run.call.name << " " << run.call.path << ": " << found << "\n"
-                              << testing::PrintToString(logs());
+            if (tried.acted) {
+                tally.add(std::to_string(point) + " " + tried.where + " " + said,
+                          faultsAfter(tried.answer, end));
             }
         }
-        report(operation, what, tried, held);
     }
 
-    static void report(const Operation &operation, const char *what, size_t tried, size_t held) {
-        std::printf("interruption: %s, %s: %zu points tried, %zu held\n", operation.name, what,
-                    tried, held);
-        EXPECT_EQ(tried, held);
-    }
-
-    std::optional<Snapshot> start_;
-    State old_, new_;
-    std::string oldList_, newList_;
-
-  private:
-    std::vector<size_t> pointsOf(const Operation &operation, const tracer::Plan &plan,
+    // Of the calls that matter those with these properties.
+    std::vector<size_t> pointsOf(tracer::Calls calls, size_t most,
                                  const std::function<bool(const tracer::Call &)> &concerned) const {
         std::vector<size_t> points;
         size_t point = 0;
         start_->restore();
-        tracer::run(operation.run, {.calls = plan.calls}, [&](const tracer::Call &call) {
+        tracer::run(GetParam().run, {.calls = calls}, [&](const tracer::Call &call) {
             ++point;
             if (concerned(call)) {
                 points.push_back(point);
             }
         });
-        std::vector<size_t> chosen;
-        for (size_t i = 0; i < points.size(); i += kStep) {
-            chosen.push_back(points[i]);
-        }
-        return chosen;
+        return chosen(points, most);
     }
 
-    static std::string cut(const std::string &text) {
-        return text.size() < 400 ? text : "..." + text.substr(text.size() - 400);
+    std::optional<Snapshot> start_;
+
+  private:
+    static State found() {
+        const std::string list = listOfFreshProcess();
+        State state = stateNow();
+        state["list"] = list;
+        return state;
     }
 
-    std::string difference(const State &now, const std::string &list) const {
-        std::string text;
+    // What an operation that nothing disturbs leaves.
+    State learn(const std::function<int()> &operation) const {
+        start_->restore();
+        const auto answer = tryOf(tracer::run(operation, {})).answer;
+        EXPECT_TRUE(answer == 0 || answer == kInstead) << lastLog();
+        EXPECT_THAT(leftovers(), IsEmpty());
+        return found();
+    }
+
+    std::string faultsAfter(std::optional<int> answer, End end) const {
+        const bool mayBeHalf = end != End::Cut;
+        const State before = stateNow();
+        State now = found();
+        const bool isOld = now == old_;
+        const bool isNew = now == new_ || (mayBeHalf && !GetParam().isBatch && now == half_);
+        const bool isRight = !answer               ? isOld || now == new_
+                             : *answer == 0        ? isNew
+                             : *answer == kInstead ? now == instead_
+                             : *answer == 1 ? isOld || (mayBeHalf && GetParam().isPower && isNew)
+                                            : false;
+        std::string faults =
+            isRight ? "" : " the answer was " + std::to_string(answer.value_or(-1)) + ";";
         for (const auto &[path, content] : now) {
-            const char *const which = content == old_.at(path) && content == new_.at(path) ? "same"
-                                      : content == old_.at(path)                           ? "old"
-                                      : content == new_.at(path)                           ? "new"
-                                                                 : nullptr;
-            text += " " + path + " " + (which ? which : "STRANGE " + cut(content)) + ";";
+            const bool was = content == old_.at(path);
+            faults += isRight ? ""
+                              : " " + path +
+                                    (was                        ? " old"
+                                     : content == new_.at(path) ? " new"
+                                                                : " STRANGE " + content);
         }
-        const char *const which = list == oldList_ ? "old" : list == newList_ ? "new" : nullptr;
-        return text + " list " + (which ? which : "STRANGE " + list);
+        now.erase("list");
+        faults += end == End::Failure && before != now ? " the list changed something;" : "";
+        return faults + (GetParam().faults && answer ? GetParam().faults(*answer) : "");
     }
+
+    State old_, new_, half_, instead_;
 };
 
-bool always(const tracer::Call &) {
-    return true;
-}
-bool isPrograms(const tracer::Call &call) {
-    return call.isPrograms;
-}
-bool isWrite(const tracer::Call &call) {
-    return call.isWrite;
-}
-// Those of a program's libraries and of its start are not ours.
-bool isOurs(const tracer::Call &call) {
-    constexpr std::array<const char *, 4> kPlaces = {"/tmp", "/usr/tavi", "/etc/crontab", "/run"};
-    return call.path.empty() || call.path == "/etc/" ||
-           std::any_of(kPlaces.begin(), kPlaces.end(),
-                       [&](const char *place) { return call.path.starts_with(place); });
-}
+// ---- Killing ----
 
-// What a call of this name fails with on a machine in trouble.
-std::vector<int> errorsOf(const std::string &name) {
-    const auto is = [&](std::initializer_list<const char *> names) {
-        return std::find(names.begin(), names.end(), name) != names.end();
-    };
-    return is({"open", "openat", "creat"})                     ? std::vector{ENOSPC, EMFILE, EACCES}
-           : is({"clone", "clone3", "fork", "vfork"})          ? std::vector{ENOMEM}
-           : is({"read", "pread", "fstat", "newfstatat"})      ? std::vector{EIO, ENOMEM}
-           : is({"fsync", "fdatasync", "flock", "unlink"})     ? std::vector{EIO}
-           : is({"fchown", "fchmod", "utimensat", "unlinkat"}) ? std::vector{EIO, EACCES}
-                                                               : std::vector{ENOSPC, EIO};
-}
+constexpr size_t kMostKills = kStep == 1 ? 99 : 3;
 
 TEST_P(Interruption, Killed) {
     using tracer::Act;
-    const Operation &operation = GetParam();
-    ASSERT_NO_FATAL_FAILURE(learn(operation));
-    // With no program there, the caller is all.
-    tryAll(operation, "all processes killed", {.act = Act::KillAll}, always);
-    tryAll(operation, "caller killed", {.act = Act::KillCaller}, isPrograms);
-    tryAll(operation, "program killed", {.act = Act::KillProgram}, isPrograms);
-    if (tracer::kCanChangeCalls) {
-        tryAll(operation, "half a write", {.act = Act::HalfThenKillAll}, isWrite);
+    using tracer::Call;
+    const auto always = [](const Call &) { return true; };
+    const auto isPrograms = [](const Call &call) { return call.isPrograms; };
+    const auto isWrite = [](const Call &call) { return tracer::kCanChangeCalls && call.isWrite; };
+    const struct {
+        const char *what;
+        Act act;
+        std::function<bool(const Call &)> concerned;
+    } rows[] = {{"all processes killed", Act::KillAll, always},
+                // With no program there, the caller is all.
+                {"caller killed", Act::KillCaller, isPrograms},
+                {"program killed", Act::KillProgram, isPrograms},
+                {"half a write", Act::HalfThenKillAll, isWrite}};
+    for (const auto &row : rows) {
+        tryAll(row.what, pointsOf(tracer::Calls::Changing, kMostKills, row.concerned), End::Cut,
+               [&](size_t point) {
+                   return tryOf(tracer::run(GetParam().run, {.point = point, .act = row.act}));
+               });
     }
-}
-
-class Failing : public Interruption {};
-
-// The same calls fail instead. Outside of a batch a task is stored also when the crontab cannot be
-// written, and power schedules when they cannot be applied.
-// A JSON text is left out: it is an edit, or, when the stored task cannot be read, a create.
-TEST_P(Failing, Calls) {
-    const Operation &operation = GetParam();
-    if (!tracer::kCanChangeCalls) {
-        GTEST_SKIP() << "calls cannot be made to fail on this architecture";
-    }
-    ASSERT_NO_FATAL_FAILURE(learn(operation));
-    const auto run = [&] {
-        PLATCErrSetEx(0, "", 0);
-        return operation.run() == 0 ? 0 : isDocumented(PLATCErrGet()) ? 1 : 2;
-    };
-    std::vector<std::pair<size_t, int>> plans;
-    size_t point = 0;
-    start_->restore();
-    tracer::run(run, {.calls = tracer::Calls::Failing}, [&](const tracer::Call &call) {
-        ++point;
-        if (isOurs(call)) {
-            const auto errors = errorsOf(call.name);
-            plans.emplace_back(point, errors[plans.size() % errors.size()]);
-        }
-    });
-    size_t tried = 0;
-    size_t held = 0;
-    for (size_t i = 0; i < plans.size(); i += kStep) {
-        start_->restore();
-        logs();
-        const auto tested = tracer::run(run, {.calls = tracer::Calls::Failing,
-                                              .point = plans[i].first,
-                                              .act = tracer::Act::Fail,
-                                              .error = plans[i].second});
-        if (!tested.acted) {
-            continue;
-        }
-        ++tried;
-        const auto lines = logs();
-        if (tested.call.name == "unlink") {
-            unlink(tested.call.path.c_str()); // what cannot be removed stays
-        }
-        const std::string found = faultsOfFailed(operation, answerOf(tested).value_or(-1));
-        held += found.empty() ? 1 : 0;
-        if (!found.empty() && tried - held <= 5) {
-            ADD_FAILURE() << operation.name << ", " << strerrorname_np(plans[i].second) << " at "
-                          << plans[i].first << ": " << tested.call.name << " " << tested.call.path
-                          << ": " << found << "\n"
-                          << testing::PrintToString(lines);
-        }
-    }
-    report(operation, "a call failed", tried, held);
-}
-
-// What the function answers in a process of its own; more than 9 when it crashes there, throws or
-// leaks.
-int answerInChild(const std::function<int()> &function) {
-    const pid_t child = fork();
-    if (child == 0) {
-        int answer = 10;
-        try {
-            answer = function();
-        } catch (const std::exception &) {
-            _exit(answer);
-        }
-#ifdef __SANITIZE_ADDRESS__
-        _exit(__lsan_do_recoverable_leak_check() == 0 ? answer : 10);
-#endif
-        _exit(answer);
-    }
-    int status = 0;
-    waitpid(child, &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 10 + WTERMSIG(status);
-}
-
-// The same for memory that is not there: every allocation, or, where nobody asks for all with
-// TAVI_TEST_ALL, some of them.
-TEST_P(Failing, Allocations) {
-    const Operation &operation = GetParam();
-    ASSERT_NO_FATAL_FAILURE(learn(operation));
-    constexpr int kNotReached = 3;
-    const auto run = [&](size_t failing) {
-        return answerInChild([&] {
-            PLATCErrSetEx(0, "", 0);
-            fakes.allocations = 0;
-            fakes.failingAllocation = failing;
-            const int result = operation.run();
-            const bool isReached = fakes.allocations >= failing;
-            fakes.failingAllocation = 0;
-            const unsigned int code = PLATCErrGet();
-            const bool isKnown =
-                code == 0 || isDocumented(code); // a text that is no JSON sets none
-            return !isReached ? kNotReached : result == 0 ? 0 : isKnown ? 1 : 2;
-        });
-    };
-    size_t tried = 0;
-    size_t held = 0;
-    const size_t step = std::getenv("TAVI_TEST_ALL") ? 1 : 7 * kStep;
-    for (size_t failing = 1;; failing += step) {
-        start_->restore();
-        logs();
-        const int answer = run(failing);
-        if (answer == kNotReached) {
-            break;
-        }
-        ++tried;
-        const auto lines = logs();
-        const std::string found = faultsOfFailed(operation, answer);
-        held += found.empty() ? 1 : 0;
-        if (!found.empty() && tried - held <= 5) {
-            ADD_FAILURE() << operation.name << ", allocation " << failing << ": " << found << "\n"
-                          << testing::PrintToString(lines);
-        }
-    }
-    report(operation, "an allocation failed", tried, held);
 }
 
 class TakingBack : public Interruption {};
 
 // Taking back what was cut off is cut off itself.
 TEST_P(TakingBack, Killed) {
-    using tracer::Act;
-    const Operation &operation = GetParam();
-    ASSERT_NO_FATAL_FAILURE(learn(operation));
     constexpr size_t kCuts = 4;
     const auto takeBack = [] { return listOfFreshProcess() == "failed" ? 1 : 0; };
     start_->restore();
-    const size_t points = tracer::run(operation.run, {}).points;
-    size_t tried = 0;
-    size_t held = 0;
+    const size_t points = tracer::run(GetParam().run, {}).points;
     for (size_t cut = 1; cut <= kCuts; ++cut) {
-        bool acted = true;
-        for (size_t point = 1; acted; point += kStep) {
+        const auto cutOff = [&] {
             start_->restore();
-            tracer::run(operation.run, {.point = cut * points / kCuts, .act = Act::KillAll});
-            const auto run = tracer::run(takeBack, {.point = point, .act = Act::KillAll});
-            acted = run.acted;
-            const std::string found = faults({});
-            ++tried;
-            held += found.empty() ? 1 : 0;
-            if (!found.empty() && tried - held <= 5) {
-                ADD_FAILURE() << operation.name << " cut off at " << cut << "/" << kCuts
-                              << ", taken back up to " << point << ": " << run.call.name << " "
-                              << run.call.path << ": " << found;
-            }
-        }
+            tracer::run(GetParam().run,
+                        {.point = cut * points / kCuts, .act = tracer::Act::KillAll});
+        };
+        cutOff();
+        const auto all = upTo(tracer::run(takeBack, {}).points);
+        tryAll("killed, and killed again while taken back", chosen(all, kMostKills), End::Cut,
+               [&](size_t point) {
+                   cutOff();
+                   Try tried =
+                       tryOf(tracer::run(takeBack, {.point = point, .act = tracer::Act::KillAll}));
+                   tried.answer.reset();
+                   return tried;
+               });
     }
-    report(operation, "killed, and killed again while taken back", tried, held);
 }
 
-INSTANTIATE_TEST_SUITE_P(Operations, Interruption, testing::ValuesIn(operations()), nameOf);
-INSTANTIATE_TEST_SUITE_P(Operations, Failing,
-                         testing::ValuesIn(operations({"create", "remove", "batch", "power", "sync",
-                                                       "first_create"})),
-                         nameOf);
-INSTANTIATE_TEST_SUITE_P(Operations, TakingBack,
-                         testing::ValuesIn(operations({"batch", "sync", "first_create",
-                                                       "create_with_differing_files"})),
-                         nameOf);
+// ---- Failing ----
+
+// Those of a program's libraries and of its start are not ours.
+bool isOurs(const tracer::Call &call) {
+    constexpr std::array<const char *, 5> kPlaces = {"/tmp", "/usr/tavi", "/etc/crontab", "/run",
+                                                     "/var/lib/tavischeduler"};
+    return call.path.empty() || call.path == "/etc/" ||
+           std::any_of(kPlaces.begin(), kPlaces.end(),
+                       [&](const char *place) { return call.path.starts_with(place); });
+}
+
+// What an operation may fail with; also what the platform's functions set.
+bool isDocumented(unsigned int code) {
+    const std::array<unsigned int, 12> codes = {0x0100, 0x0200, 0x0400, 0x0500, 0x0900, 0x0B00,
+                                                0x0D00, 0x2000, 0x2700, 0x2800, 0x2A00, 0x4000};
+    return std::find(codes.begin(), codes.end(), code) != codes.end();
+}
+
+int answer() {
+    PLATCErrSetEx(0, "", 0);
+    const int answer = testing::WithParamInterface<Operation>::GetParam().run();
+    return answer == 1 && !isDocumented(PLATCErrGet()) ? 3 : answer;
+}
+
+// The same in a process of its own, when all that this has started has ended; more than 9 when one
+// of them crashes, or it throws or leaks.
+int answerInChild() {
+    const pid_t child = fork();
+    if (child == 0) {
+        int answered = 10;
+        try {
+            answered = answer();
+        } catch (const std::exception &) {
+            _exit(answered);
+        }
+#ifdef __SANITIZE_ADDRESS__
+        answered = __lsan_do_recoverable_leak_check() == 0 ? answered : 10;
+#endif
+        _exit(answered);
+    }
+    int answered = 0;
+    int status = 0;
+    for (pid_t ended = 0; (ended = wait(&status)) > 0;) {
+        const int result = WIFSIGNALED(status) ? 10 + WTERMSIG(status) : WEXITSTATUS(status);
+        answered = ended == child || result > 10 ? std::max(answered, result) : answered;
+    }
+    return answered;
+}
+
+Try failSystemCall(size_t point) {
+    tracer::Plan plan{.calls = tracer::Calls::Failing, .point = point, .act = tracer::Act::Fail};
+    const auto run = tracer::run(answer, plan, [&](const tracer::Call &call) {
+        constexpr std::array<int, 3> kOpening = {ENOSPC, EMFILE, EACCES};
+        constexpr std::array<int, 3> kOthers = {EIO, ENOMEM, ENOSPC};
+        plan.error = (call.name.starts_with("open") ? kOpening : kOthers)[point % 3];
+    });
+    if (run.call.name == "unlink") {
+        unlink(run.call.path.c_str()); // what cannot be removed stays
+    }
+    Try tried = tryOf(run);
+    tried.acted = tried.acted && isOurs(run.call); // a minute may have passed
+    return tried;
+}
+
+class Failing : public Interruption {};
+
+TEST_P(Failing, Calls) {
+    constexpr size_t kMost = kStep == 1 ? 20 : 1;
+    const struct {
+        const char *what;
+        Fault fault; // none: system calls
+        bool isLasting = false;
+    } rows[] = {{"a system call failed", Fault::None},
+                {"an allocation failed", Fault::Memory},
+                {"no more memory", Fault::Memory, true},
+                {"a wait failed", Fault::Wait},
+                {"a start of a program failed", Fault::Spawn},
+                {"local time failed", Fault::Time},
+                {"opening a database failed", Fault::DatabaseOpen},
+                {"a step in a database failed", Fault::DatabaseStep},
+                {"a commit in a database failed", Fault::DatabaseCommit}};
+    start_->restore();
+    fail(Fault::All);
+    answerInChild();
+    std::vector<size_t> counts(faults().calls.begin(), faults().calls.end());
+    fail(Fault::None);
+    for (const auto &row : rows) {
+        if (row.fault == Fault::None && tracer::kCanChangeCalls) {
+            tryAll(row.what, pointsOf(tracer::Calls::Failing, 2 * kMost, isOurs), End::Failure,
+                   failSystemCall);
+            continue;
+        }
+        tryAll(row.what, chosen(upTo(counts.at(static_cast<size_t>(row.fault))), kMost),
+               row.isLasting ? End::Exhaustion : End::Failure, [&](size_t point) {
+                   fail(row.fault, point, row.isLasting);
+                   const int answered = answerInChild();
+                   fail(Fault::None);
+                   return Try{.acted = true, .where = "", .answer = answered};
+               });
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Operations, Interruption, testing::ValuesIn(operations('k')), nameOf);
+INSTANTIATE_TEST_SUITE_P(Operations, TakingBack, testing::ValuesIn(operations('t')), nameOf);
+INSTANTIATE_TEST_SUITE_P(Operations, Failing, testing::ValuesIn(operations('f')), nameOf);
 
 } // namespace

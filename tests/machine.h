@@ -16,6 +16,7 @@ constexpr size_t kStep = 1;
 #endif
 
 constexpr const char *kPower = "/usr/tavi/etc/auto_power";
+constexpr const char *kStatus = "/tmp/sched_status.sqlite";
 constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
 
 // By path; a file that is not there is "(none)", and the crontab's lines are sorted: they may
@@ -26,15 +27,39 @@ State stateNow();
 // What is in the folders of these files and does not belong there.
 std::vector<std::string> leftovers();
 
-// The files as they are when it is made, to start again from.
+// The files as they are when it is made, also those of runs, to start again from.
 class Snapshot {
   public:
     Snapshot();
     void restore() const;
 
   private:
-    std::map<std::string, std::optional<std::string>> contents_;
+    struct File {
+        std::string content;
+        timespec time;
+    };
+    std::map<std::string, File> files_;
 };
+
+// So many of something were tried, and how many held; told and checked when it ends.
+class Tally {
+  public:
+    explicit Tally(std::string what) : what_(std::move(what)) {}
+    ~Tally();
+    Tally(const Tally &) = delete;
+    Tally &operator=(const Tally &) = delete;
+    // "" when it held and left nothing; of others a few are shown, with what the library logged.
+    void add(const std::string &where, std::string fault);
+
+  private:
+    std::string what_;
+    size_t tried_ = 0, held_ = 0;
+};
+
+// Of these points those that a test takes: all with TAVI_TEST_ALL, else at most so many.
+std::vector<size_t> chosen(const std::vector<size_t> &points, size_t most);
+// 1 to so many.
+std::vector<size_t> upTo(size_t count);
 
 // What a process that has just started lists: "id name command; ...", or "failed".
 std::string listOfFreshProcess();

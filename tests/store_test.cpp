@@ -190,7 +190,7 @@ TEST_F(Store, FailedChangesLeaveTheFiles) {
     EXPECT_EQ(readFile(kWorking), stored);
     EXPECT_EQ(readFile(kPersistent), stored);
     expectNoScratch();
-    fakes.callocFails = sizeof(TAVI_SCHED_TASK);
+    faults().callocFails = sizeof(TAVI_SCHED_TASK);
     TAVI_SCHED_TASK *list = nullptr;
     EXPECT_EQ(SchedBackends[0].list_get(&list, nullptr), -1);
     EXPECT_EQ(PLATCErrorGetLine(), 56);

@@ -11,7 +11,6 @@
 #include <dlfcn.h>
 #include <filesystem>
 #include <fstream>
-#include <new>
 #include <regex>
 #include <sqlite3.h>
 #include <sstream>
@@ -223,13 +222,6 @@ time_t time(time_t *result) noexcept {
     return result ? *result = now : now;
 }
 
-tm *localtime(const time_t *time) noexcept {
-    static tm local;
-    errno = EOVERFLOW;
-    tzset();
-    return fakes.localtimeFails ? nullptr : localtime_r(time, &local);
-}
-
 void syslog(int priority, const char *format, ...) {
     const int savedErrno = errno; // also for %m
     char line[80000] = "wrong priority";
@@ -264,22 +256,6 @@ int usleep(useconds_t microseconds) {
     return 0;
 }
 
-#ifdef __SANITIZE_ADDRESS__
-#define REAL_CALLOC __interceptor_calloc
-#else
-#define REAL_CALLOC __libc_calloc
-#endif
-void *REAL_CALLOC(size_t count, size_t size);
-
-void *calloc(size_t count, size_t size) noexcept {
-    const bool fails = ++fakes.allocations == fakes.failingAllocation;
-    if (fails || (fakes.callocFails > 0 && count * size >= fakes.callocFails)) {
-        errno = ENOMEM;
-        return nullptr;
-    }
-    return REAL_CALLOC(count, size);
-}
-
 int rename(const char *from, const char *to) noexcept {
     const support::OwnAllocations own;
     auto *const real = support::next<int (*)(const char *, const char *)>("rename");
@@ -300,33 +276,6 @@ int fsync(int fd) {
 }
 
 } // extern "C"
-
-// All forms, as a sanitizer has its own of those that are left out.
-void *operator new(size_t size, const std::nothrow_t &) noexcept {
-    return ++fakes.allocations == fakes.failingAllocation ? nullptr : std::malloc(size);
-}
-void *operator new(size_t size) {
-    void *const memory = operator new(size, std::nothrow);
-    return memory ? memory : throw std::bad_alloc();
-}
-void *operator new[](size_t size) {
-    return operator new(size);
-}
-void *operator new[](size_t size, const std::nothrow_t &) noexcept {
-    return operator new(size, std::nothrow);
-}
-void operator delete[](void *memory) noexcept {
-    std::free(memory);
-}
-void operator delete[](void *memory, size_t) noexcept {
-    std::free(memory);
-}
-void operator delete(void *memory) noexcept {
-    std::free(memory);
-}
-void operator delete(void *memory, size_t) noexcept {
-    std::free(memory);
-}
 
 int main(int argc, char **argv) {
     // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may

@@ -3,6 +3,7 @@
 // shared library binds to them.
 #pragma once
 
+#include "faults.h"
 #include "platc.h"
 #include "tavischeduler.h"
 
@@ -35,10 +36,6 @@ constexpr const char *kOwnLine = "0\t0\t*\t*\t*\troot\t/tmp/tavischedtask --run 
 // What the functions that this program defines do; copied into forked children.
 struct Fakes {
     std::optional<time_t> now; // what time() answers
-    bool localtimeFails = false;
-    size_t callocFails = 0;       // a calloc of at least that many bytes fails; 0 = none
-    size_t allocations = 0;       // so many there were, by operator new and calloc
-    size_t failingAllocation = 0; // this one of them fails, from 1 on; 0 = none
     bool renameFails = false;
     bool fsyncFails = false;
     bool folderFsyncFails = false;
@@ -46,21 +43,6 @@ struct Fakes {
     long clockTicks = 0;        // how many a second has; 0 = as many as there are
 };
 extern Fakes fakes;
-
-// What is allocated while it lives does not count.
-class OwnAllocations {
-  public:
-    OwnAllocations() : kept_(fakes) { fakes.failingAllocation = 0; }
-    ~OwnAllocations() {
-        fakes.allocations = kept_.allocations;
-        fakes.failingAllocation = kept_.failingAllocation;
-    }
-    OwnAllocations(const OwnAllocations &) = delete;
-    OwnAllocations &operator=(const OwnAllocations &) = delete;
-
-  private:
-    Fakes kept_;
-};
 
 // Log lines since the last call, of this process and its children. A line's number stands only
 // where it is a stable one: `stable` keeps the numbers, else they are shown as "*".
@@ -122,7 +104,10 @@ Task taskOf(const When &row);
 class SchedTest : public testing::Test {
   protected:
     void SetUp() override;
-    void TearDown() override { fakes = {}; }
+    void TearDown() override {
+        fakes = {};
+        fail(Fault::None);
+    }
 };
 
 } // namespace support

@@ -38,7 +38,6 @@ struct Kind {
     int descriptor = kNone; // or a descriptor
     int length = kNone;     // the argument that says how much is written
     int flags = kNone;      // an open's flags
-    bool fails = true;      // with a full or broken disk
     bool onlyFailing = false;
 };
 
@@ -55,6 +54,7 @@ const std::vector<Kind> kKinds = {
     {.name = "rmdir", .number = __NR_rmdir, .path = 0},
     {.name = "chmod", .number = __NR_chmod, .path = 0},
     {.name = "chown", .number = __NR_chown, .path = 0},
+    {.name = "access", .number = __NR_access, .path = 0, .onlyFailing = true},
     {.name = "fork", .number = __NR_fork, .onlyFailing = true},
     {.name = "vfork", .number = __NR_vfork, .onlyFailing = true},
 #endif
@@ -85,7 +85,16 @@ const std::vector<Kind> kKinds = {
     {.name = "read", .number = __NR_read, .descriptor = 0, .onlyFailing = true},
     {.name = "pread", .number = __NR_pread64, .descriptor = 0, .onlyFailing = true},
     {.name = "fstat", .number = __NR_fstat, .descriptor = 0, .onlyFailing = true},
-    {.name = "newfstatat", .number = __NR_newfstatat, .path = 1, .onlyFailing = true},
+    {.name = "newfstatat",
+     .number = __NR_newfstatat,
+     .path = 1,
+     .descriptor = 0,
+     .onlyFailing = true},
+    {.name = "faccessat", .number = __NR_faccessat, .path = 1, .onlyFailing = true},
+    {.name = "getdents64", .number = __NR_getdents64, .descriptor = 0, .onlyFailing = true},
+#ifndef __SANITIZE_ADDRESS__ // which itself looks with it whether memory is there
+    {.name = "pipe2", .number = __NR_pipe2, .onlyFailing = true},
+#endif
     {.name = "flock", .number = __NR_flock, .descriptor = 0, .onlyFailing = true},
     {.name = "clone", .number = __NR_clone, .onlyFailing = true},
     {.name = "clone3", .number = __NR_clone3, .onlyFailing = true},
@@ -191,6 +200,7 @@ class Following {
             if (!WIFSTOPPED(status)) {
                 processes_.erase(pid);
                 run_.status = pid == caller_ ? status : run_.status;
+                run_.crashed = run_.crashed || (WIFSIGNALED(status) && WTERMSIG(status) != SIGKILL);
             } else {
                 resume(pid, onStop(pid, status));
             }
@@ -215,8 +225,17 @@ class Following {
             unsigned long child = 0;
             ptrace(PTRACE_GETEVENTMSG, pid, nullptr, &child);
             fresh_.insert(static_cast<pid_t>(child));
+            processes_.insert(static_cast<pid_t>(child));
+            if (programs_.contains(pid)) {
+                programs_.insert(static_cast<pid_t>(child));
+            }
             return 0;
         }
+        case PTRACE_EVENT_EXEC:
+            if (pid != caller_) {
+                programs_.insert(pid);
+            }
+            return 0;
         default:
             return 0;
         }
@@ -259,20 +278,20 @@ class Following {
         const bool changes =
             kind.flags == kNone || (arguments[kind.flags] & (O_CREAT | O_TRUNC)) != 0;
         if (kind.onlyFailing || !changes) {
-            return failing && pid == caller_;
+            return failing && !programs_.contains(pid);
         }
         return true;
     }
 
     Call describe(const Kind &kind, pid_t pid, const Info &info) const {
         const uint64_t *const arguments = info.seccomp.args;
-        std::string path = kind.path != kNone ? readText(pid, arguments[kind.path])
-                           : kind.descriptor != kNone
-                               ? pathOfDescriptor(pid, arguments[kind.descriptor])
-                               : "";
+        std::string path = kind.path != kNone ? readText(pid, arguments[kind.path]) : "";
+        if (path.empty() && kind.descriptor != kNone) {
+            path = pathOfDescriptor(pid, arguments[kind.descriptor]);
+        }
         return {.name = kind.name,
                 .path = std::move(path),
-                .isPrograms = pid != caller_,
+                .isPrograms = programs_.contains(pid),
                 .isWrite = kind.length != kNone};
     }
 
@@ -325,6 +344,7 @@ class Following {
     const Plan &plan_;
     const std::function<void(const Call &)> &onCall_;
     std::set<pid_t> processes_;
+    std::set<pid_t> programs_; // started by the caller, not forks of it
     std::set<pid_t> fresh_;
     pid_t cut_ = 0; // the process whose shortened write is being done
     Run run_;

@@ -14,8 +14,8 @@ extern const bool kCanChangeCalls;
 // Which calls count.
 enum class Calls {
     Changing, // those that change files, folders or their attributes, and flushes
-    Failing,  // of those the ones that a machine in trouble fails, and of the operation's own
-              // process also opens, reads and the start of programs
+    Failing,  // of those the ones that a machine in trouble fails, and of the operation's process
+              // and its forks also opens, reads and the start of programs
 };
 
 enum class Act { Nothing, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
@@ -37,8 +37,9 @@ struct Call {
 struct Run {
     size_t points = 0; // calls that counted
     bool acted = false;
-    Call call;      // the one at the point
-    int status = 0; // wait status of the operation's process
+    Call call;            // the one at the point
+    int status = 0;       // wait status of the operation's process
+    bool crashed = false; // some process
 };
 
 // The operation's result is its process's exit status. `onCall` sees every call that counts before

@@ -423,18 +423,25 @@ class CrontabBefore {
     // The error stays that of the failure.
     void putBack() const {
         const sched::KeptError error;
-        const auto now = CrontabBefore().content_;
-        if (!content_ || now == content_) {
-            return;
-        }
-        base::Replacement crontab(kCrontab, base::processTemporary());
-        if (!crontab.open() || !crontab.write(*content_) ||
-            !crontab.commit({.like = &opened_.status, .later = true})) {
+        if (sched::guarded(SCHED_SITE, [&] { return replaceOther(); }) != 0) {
             SCHED_LOG("%s cannot be put back: %m", kCrontab);
+            sched::ChangeLock::leaveToNext();
         }
     }
 
   private:
+    int replaceOther() const {
+        const auto now = CrontabBefore().content_;
+        if (!content_ || now == content_) {
+            return 0;
+        }
+        base::Replacement crontab(kCrontab, base::processTemporary());
+        return crontab.open() && crontab.write(*content_) &&
+                       crontab.commit({.like = &opened_.status, .later = true})
+                   ? 0
+                   : -1;
+    }
+
     base::Opened opened_;
     std::optional<std::string> content_;
 };

@@ -82,6 +82,7 @@ template <typename Try> bool retry(long pause, long longest, Try &&tryOnce) {
 struct HeldLock {
     base::Descriptor file;
     int depth = 0;
+    bool isLeftToNext = false;
     std::optional<sched::ChangeLock::CutOff> leftBehind;
 };
 HeldLock held;
@@ -293,6 +294,7 @@ sched::ChangeLock::ChangeLock(Wait wait) {
     }
     forgetInChildren();
     held.leftBehind.reset();
+    held.isLeftToNext = false;
     if (file) {
         held.leftBehind = writtenHolder(file.get());
         writeHolder(file.get(), held.leftBehind);
@@ -307,7 +309,9 @@ sched::ChangeLock::~ChangeLock() {
         return;
     }
     if (held.file) {
-        (void)!ftruncate(held.file.get(), 0);
+        if (!held.isLeftToNext) {
+            (void)!ftruncate(held.file.get(), 0);
+        }
         flock(held.file.get(), LOCK_UN);
     }
     held.file.close();
@@ -328,6 +332,10 @@ bool sched::ChangeLock::isHeldHere() {
 
 const std::optional<sched::ChangeLock::CutOff> &sched::ChangeLock::leftBehind() {
     return held.leftBehind;
+}
+
+void sched::ChangeLock::leaveToNext() {
+    held.isLeftToNext = true;
 }
 
 bool sched::ChangeLock::isMarked() {

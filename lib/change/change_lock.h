@@ -44,6 +44,9 @@ class ChangeLock {
     static const std::optional<CutOff> &leftBehind();
     // Some process holds it, or was cut off while it did.
     static bool isMarked();
+    // What the holder has begun cannot be ended by itself: when it releases the lock, it is as if
+    // it had been cut off.
+    static void leaveToNext();
 
     // While it lives, a program that is started keeps the lock beyond the end of this process: one
     // that overwrites tasks must have ended before anybody looks at them.

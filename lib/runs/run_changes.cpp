@@ -17,6 +17,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <memory>
+#include <optional>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -62,31 +63,35 @@ struct Look {
 class KnownRuns {
   public:
     explicit KnownRuns(RunRecords &records) : records_(records) {}
-    // Milliseconds since the epoch.
+    // Milliseconds since the epoch. Also when that cannot be told.
     bool has(int32_t taskId, int64_t due) {
         return records_.hasRunDue(taskId, due) || hasRow(taskId, due / 1000);
     }
+    // Something could not be told.
+    bool areIncomplete() const { return isUnreadable_ || records_.isIncomplete(); }
 
   private:
     bool hasRow(int32_t taskId, int64_t due) {
-        sqlite3_stmt *statement = nullptr;
-        if (open()) {
-            sqlite3_prepare_v2(database_.get(),
-                               "SELECT 1 FROM task_status WHERE task_id=?1 AND timestamp>=?2 AND "
-                               "timestamp<?2+60",
-                               -1, &statement, nullptr);
+        if (!open()) {
+            return isUnreadable_;
         }
+        sqlite3_stmt *statement = nullptr;
+        sqlite3_prepare_v2(database_.get(),
+                           "SELECT 1 FROM task_status WHERE task_id=?1 AND timestamp>=?2 AND "
+                           "timestamp<?2+60",
+                           -1, &statement, nullptr);
         sqlite3_bind_int(statement, 1, taskId);
         sqlite3_bind_int64(statement, 2, due);
-        const bool found = statement && sqlite3_step(statement) == SQLITE_ROW;
+        const int result = statement ? sqlite3_step(statement) : SQLITE_ERROR;
         sqlite3_finalize(statement);
-        return found;
+        isUnreadable_ = isUnreadable_ || (result != SQLITE_ROW && result != SQLITE_DONE);
+        return result != SQLITE_DONE;
     }
     bool open() {
         if (!isTried_) {
             isTried_ = true;
             sqlite3 *handle = nullptr;
-            TAVISchedDBOpenForReading(&handle);
+            isUnreadable_ = TAVISchedDBOpenForReading(&handle) < 0;
             database_.reset(handle);
         }
         return database_ != nullptr;
@@ -95,11 +100,13 @@ class KnownRuns {
     RunRecords &records_;
     sched::Database database_;
     bool isTried_ = false;
+    bool isUnreadable_ = false;
 };
 
-// Those of the task's times that no record tells of, the latest of them.
-std::vector<int64_t> missedTimes(const TAVI_SCHED_TASK &task, const Look &look, RunRecords &records,
-                                 KnownRuns &known) {
+// Those of the task's times that no record tells of, the latest of them; nothing when that cannot
+// be told.
+std::optional<std::vector<int64_t>> missedTimes(const TAVI_SCHED_TASK &task, const Look &look,
+                                                RunRecords &records, KnownRuns &known) {
     std::array<int64_t, kMostStarts> starts; // NOLINT: filled before it is read
     const int count =
         TAVISchedTaskStarts(&task, look.from, look.until, starts.data(), starts.size());
@@ -111,7 +118,7 @@ std::vector<int64_t> missedTimes(const TAVI_SCHED_TASK &task, const Look &look, 
             missed.insert(missed.begin(), due);
         }
     }
-    return missed;
+    return count < 0 || known.areIncomplete() ? std::nullopt : std::optional(std::move(missed));
 }
 
 // What cron should have started, or asked for in vain; the rest of the record is the caller's.
@@ -146,9 +153,10 @@ bool settleAwaited(const Look &look, RunRecords &records, KnownRuns &known) {
     for (sched::RunRecord &record : records.awaited(look.settled * 1000)) {
         record.result = TAVI_SCHED_RUN_MISSED;
         const bool hasRun = known.has(record.taskId, record.due);
-        done = (hasRun ? records.remove(record.run) : records.write(record)) && done;
+        done = done && !known.areIncomplete() &&
+               (hasRun ? records.remove(record.run) : records.write(record));
     }
-    return done;
+    return done && !known.areIncomplete();
 }
 
 bool recordMissedOfAll(const Look &look) {
@@ -161,10 +169,11 @@ bool recordMissedOfAll(const Look &look) {
     bool done = true;
     const auto onTask = [&](const char *, TAVI_SCHED_TASK *task) {
         const auto missed = missedTimes(*task, look, records, known);
-        for (const int64_t due : missed) {
-            done = done && recordMissed(*task, due, look, records);
+        done = done && missed;
+        for (size_t i = 0; done && i < missed->size(); ++i) {
+            done = recordMissed(*task, (*missed)[i], look, records);
         }
-        if (!missed.empty()) {
+        if (done && !missed->empty()) {
             records.prune(limits, task->id);
         }
         return done;

@@ -410,6 +410,7 @@ std::optional<int64_t> sched::RunRecords::number(const char *sql,
     case SQLITE_DONE:
         return 0;
     default:
+        isIncomplete_ = true;
         return std::nullopt;
     }
 }
@@ -544,9 +545,11 @@ std::vector<RunRecord> sched::RunRecords::awaited(int64_t before) {
         prepare("SELECT " + columns() + " FROM runs WHERE result=-1 AND due<?");
     sqlite3_bind_int64(statement.get(), 1, before);
     std::vector<RunRecord> found;
-    while (statement && sqlite3_step(statement.get()) == SQLITE_ROW) {
+    int result = SQLITE_ERROR;
+    while (statement && (result = sqlite3_step(statement.get())) == SQLITE_ROW) {
         take(statement.get(), found.emplace_back());
     }
+    isIncomplete_ = isIncomplete_ || result != SQLITE_DONE;
     return found;
 }
 

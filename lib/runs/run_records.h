@@ -55,6 +55,8 @@ class RunRecords {
 
     explicit operator bool() const { return database_ != nullptr; }
     bool isMissing() const { return isMissing_; }
+    // Something of it could not be read or written since it was opened.
+    bool isIncomplete() const { return isIncomplete_; }
     // Whether everything in it can be read.
     enum class Health { Whole, Damaged, Unknown };
     Health health();
@@ -108,6 +110,7 @@ class RunRecords {
     Pause pause_;
     int64_t patience_ = 0;    // until then a locked database is waited for
     bool hasGivenUp_ = false; // on purpose
+    bool isIncomplete_ = false;
     bool isMissing_ = false;
     bool wasDamaged_ = false; // and is not open
     Handle database_{nullptr, sqlite3_close};

@@ -121,8 +121,8 @@ PLATC_API int PLATCExec(const char *szProgram, const char *const *rgszArgs);
 /* 1 when the process exists and is no zombie, else 0. */
 PLATC_API int PLATCProcAlive(pid_t pid);
 /* Forks a child that the caller does not wait for: in a session of its own, descriptors 0, 1 and 2
- * on /dev/null, never a zombie. 1 in the caller, 0 in the child, -1. The child must end with _exit.
- */
+ * on /dev/null, never a zombie. 1 in the caller, 0 in the child, -1 when there is none. The child
+ * must end with _exit. */
 PLATC_API int PLATCProcForkChildNoWait(void);
 
 #ifdef __cplusplus

@@ -92,5 +92,8 @@ int PLATCProcForkChildNoWait() {
         }
         _exit(child == -1 ? 1 : 0);
     }
-    return base::waitForChild(middle) == 0 ? 1 : PLATFORM_FAIL(platform::kSystemCallFailed);
+    // A result that is lost is taken for a good one: told of a failure, callers try once more, and
+    // what they start must not be started twice.
+    const int status = base::waitForChild(middle);
+    return status == 0 || status == -1 ? 1 : PLATFORM_FAIL(platform::kSystemCallFailed);
 }

@@ -2,6 +2,7 @@
 // exit status.
 #include "commands/commands.h"
 #include "failure.h"
+#include "tasks/change.h"
 #include "text/utf8.h"
 #include "waiting.h"
 #include "json/json.h"
@@ -433,6 +434,11 @@ class Failing {
     bool json_;
 };
 
+// What fails behind a change that is stored has not undone it.
+std::string withDone(const char *what) {
+    return (Change::isStored() ? "what was asked for was done, but " : "") + std::string(what);
+}
+
 int execute(const Command &command, const Failing &fail) {
     try {
         if (geteuid() != 0) {
@@ -440,17 +446,40 @@ int execute(const Command &command, const Failing &fail) {
         }
         tellOfWaiting();
         const int status = command();
-        if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0) {
-            throw Failure("what was asked for was done, but the output could not be written");
-        }
-        return status;
+        return std::fflush(stdout) == 0 && std::ferror(stdout) == 0
+                   ? status
+                   : fail.with("what was asked for was done, but the output could not be written",
+                               Failure::kExitStatus);
     } catch (const Refusal &refusal) {
         return fail.with(refusal);
     } catch (const std::bad_alloc &) {
         throw; // there is none for words either
     } catch (const std::exception &failure) {
-        return fail.with(failure.what(), Failure::kExitStatus);
+        return fail.with(withDone(failure.what()), Failure::kExitStatus);
     }
+}
+
+void tellOutOfMemory() {
+    std::fputs(Change::isStored() ? "tavisched: what was asked for was done, but out of memory\n"
+                                  : "tavisched: out of memory\n",
+               stderr);
+}
+
+// Before main() and where nothing may be thrown, nobody catches: there is no memory either for what
+// the parser makes as the program is loaded.
+__attribute__((constructor(101))) void tellBeforeTermination() {
+    std::set_terminate([] {
+        try {
+            if (const auto thrown = std::current_exception()) {
+                std::rethrow_exception(thrown);
+            }
+        } catch (const std::bad_alloc &) {
+            tellOutOfMemory();
+            std::_Exit(Failure::kExitStatus);
+        } catch (...) {
+        }
+        std::abort();
+    });
 }
 
 // The options and subcommands, and what was typed of them.
@@ -499,7 +528,7 @@ int main(int argc, char **argv) {
         CommandLine line;
         return tavischedMain(line, argc, argv);
     } catch (const std::bad_alloc &) {
-        std::fputs("tavisched: out of memory\n", stderr);
+        tellOutOfMemory();
     } catch (const std::exception &error) {
         std::fprintf(stderr, "tavisched: %s\n", error.what());
     }

@@ -8,6 +8,8 @@
 #include "tasks/report.h"
 #include "text/utf8.h"
 
+#include <cerrno>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -32,6 +34,10 @@ std::string readWhole(const std::string &file) {
     }
     std::error_code ignored;
     std::ifstream stream(file, std::ios::binary);
+    const int error = errno;
+    if (!stream && error != ENOENT && error != ENOTDIR) {
+        throw Failure(printable(file) + " cannot be read: " + std::strerror(error));
+    }
     if (!stream || std::filesystem::is_directory(file, ignored)) {
         throw Refusal(printable(file) + " cannot be read; accepted: a file, or - for standard "
                                         "input");
@@ -46,6 +52,9 @@ class Plan {
 
     Planned decide(Imported &&imported) {
         const TAVI_SCHED_TASK &task = *imported.task;
+        if (isPower(task)) {
+            requirePower(tasks_);
+        }
         const TAVI_SCHED_TASK *const same = isPower(task) ? findSame(task) : nullptr;
         const TAVI_SCHED_TASK *const present = tasks_.find(task.id);
         Fate fate = Fate::Create;

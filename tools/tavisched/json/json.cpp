@@ -3,10 +3,12 @@
 #include "text/utf8.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdio>
 #include <json/reader.h>
 #include <json/writer.h>
 #include <memory>
+#include <new>
 
 namespace tavisched {
 
@@ -29,11 +31,15 @@ Json::CharReader &reader(bool anyRoot) {
 
 std::optional<std::string> parseJson(const std::string &text, bool anyRoot, Json::Value &value) {
     std::string errors;
+    errno = 0;
     try {
         if (reader(anyRoot).parse(text.data(), text.data() + text.size(), &value, &errors)) {
             return std::nullopt;
         }
-    } catch (const Json::Exception &refusal) { // of deep nesting
+    } catch (const Json::Exception &refusal) { // of deep nesting, or for lack of memory
+        if (errno == ENOMEM) {
+            throw std::bad_alloc();
+        }
         errors = refusal.what();
     }
     std::replace(errors.begin(), errors.end(), '\n', ' ');

@@ -13,6 +13,8 @@ namespace tavisched {
 
 namespace {
 
+bool anyIsStored = false;
+
 constexpr size_t kMaxPowerSchedules = 100; // of a kind; the library reads no more
 
 void requireClock(const TAVI_SCHED_TASK &task) {
@@ -63,6 +65,14 @@ void requireGoodFiles() {
     }
 }
 
+// A task that can be read, but could not be when the change began, would be stored twice.
+void requireUnknown(int32_t id, const Tasks &tasks) {
+    const auto present = std::make_unique<TAVI_SCHED_TASK>();
+    if (!tasks.find(id) && TAVISchedTaskGetByID(id, present.get()) == 0 && present->id == id) {
+        throw Failure(called(*present) + " could not be read at first; nothing is changed");
+    }
+}
+
 std::string idsOf(const TaskPointers &tasks) {
     std::vector<std::string> ids;
     for (const TAVI_SCHED_TASK *const task : tasks) {
@@ -85,15 +95,19 @@ TaskPointers rejected(const TaskPointers &tasks) {
 
 } // namespace
 
+void requirePower(const Tasks &power) {
+    if (power.lacksPower()) {
+        throw Failure("power schedules cannot be changed while they cannot be read; \"tavisched "
+                      "check\" tells more");
+    }
+}
+
 void requirePossible(const Tasks &power, const TAVI_SCHED_TASK &task,
                      const TAVI_SCHED_TASK *replaced) {
     if (!isPower(task)) {
         return;
     }
-    if (power.lacksPower()) {
-        throw Failure("power schedules cannot be changed while they cannot be read; \"tavisched "
-                      "check\" tells more");
-    }
+    requirePower(power);
     requireClock(task);
     const TAVI_SCHED_TASK *const same = findSameSchedule(power.all(), task);
     if (same && !(replaced && isSameSchedule(*same, *replaced))) {
@@ -149,6 +163,7 @@ void Change::createWithId(TAVI_SCHED_TASK &task) {
     if (TAVISchedTaskCreateWithId(&task) == 0) {
         stored(task);
     } else if (PLATCErrGet() == TAVI_SCHED_ERR_INVALID_ARGUMENT) {
+        requireUnknown(task.id, tasks_);
         create(task);
     } else {
         fail(task, "stored");
@@ -192,6 +207,11 @@ void Change::commit() {
         throw Failure("nothing could be stored: " + libraryError() +
                       "; \"tavisched check\" looks for the cause; everything is as it was before");
     }
+    anyIsStored = true;
+}
+
+bool Change::isStored() {
+    return anyIsStored;
 }
 
 } // namespace tavisched

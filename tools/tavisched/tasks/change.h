@@ -13,6 +13,8 @@ namespace tavisched {
 // `replaced` is the task whose place it takes, or nullptr.
 void requirePossible(const Tasks &power, const TAVI_SCHED_TASK &task,
                      const TAVI_SCHED_TASK *replaced);
+// Fails when power schedules could not be read.
+void requirePower(const Tasks &power);
 // Refused when these tasks, of which those are changed, have a line that cron rejects: it would
 // ignore all of /etc/crontab. It may be one that it ignores already.
 void requireGoodLines(const TaskPointers &unchanged, const TaskPointers &changed);
@@ -40,6 +42,8 @@ class Change {
     void sync();
 
     void commit();
+    // Whether this process has stored one.
+    static bool isStored();
 
   private:
     // The library's; rolled back unless it was committed.

@@ -1,0 +1,54 @@
+// Calls that fail: the n-th of a kind, in whatever process it comes. The test program has the
+// functions of this source itself, so that the shared library binds to them; a program that the
+// tests start gets them from a library that is loaded before all others.
+#pragma once
+
+#include <array>
+#include <atomic>
+#include <cstddef>
+
+namespace support {
+
+enum class Fault {
+    None,
+    All,    // none of them fails
+    Memory, // also operator new
+    Wait,   // somebody else has taken the child's result
+    Spawn,
+    Time, // local time
+    DatabaseOpen,
+    DatabaseStep, // an instruction of a statement's program
+    DatabaseCommit,
+    Count
+};
+
+// Shared with child processes, and with programs that are started for them.
+struct Faults {
+    int file;
+    std::atomic<Fault> kind;     // calls of this kind fail; while there is one, all are counted
+    std::atomic<size_t> failing; // this one of them, from 1 on
+    std::atomic<bool> isLasting; // and all that follow
+    size_t callocFails;          // a calloc of at least that many bytes fails, too; 0 = none
+    std::array<std::atomic<size_t>, static_cast<size_t>(Fault::Count)> calls; // by kind
+};
+Faults &faults();
+
+// From here on the n-th call fails; Fault::None ends that.
+void fail(Fault kind, size_t call = 1, bool isLasting = false);
+// To be called in a process before it becomes a program in which calls are to fail, with the path
+// of the library.
+void letProgramFail(const char *library);
+
+// What is called while it lives does not count.
+class OwnAllocations {
+  public:
+    OwnAllocations() : kind_(faults().kind.exchange(Fault::None)) {}
+    ~OwnAllocations() { faults().kind = kind_; }
+    OwnAllocations(const OwnAllocations &) = delete;
+    OwnAllocations &operator=(const OwnAllocations &) = delete;
+
+  private:
+    Fault kind_;
+};
+
+} // namespace support

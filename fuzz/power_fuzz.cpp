@@ -159,7 +159,7 @@ void requireWritten(int kind, const Entries &entries) {
 } // namespace
 
 void fuzz::test(Input input) {
-    fuzz::readStep = input.step();
+    shortenReads(input.step());
     fuzz::contentOf(fuzz::kAutoPower) = input.rest();
     const auto on = entriesOf(TAVI_AUTOPOWER_KIND_ON);
     const auto off = entriesOf(TAVI_AUTOPOWER_KIND_OFF);

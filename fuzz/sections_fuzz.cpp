@@ -166,7 +166,7 @@ void requireChange(const std::string &content) {
 } // namespace
 
 void fuzz::test(Input input) {
-    fuzz::readStep = input.step();
+    shortenReads(input.step());
     const std::string content = input.rest();
     const auto sections = parse(content);
     fuzz::contentOf(fuzz::kWorking) = content;

@@ -43,6 +43,8 @@ constexpr const char *kFolders[] = {"/etc", "/tmp", "/usr/tavi/bin", "/usr/tavi/
 std::map<std::string, NodePointer, std::less<>> nodes;
 std::vector<OpenFile> opened;
 std::vector<std::pair<FILE *, int>> streams;
+size_t shortSize = 0;
+int shortReads = 0; // that are still to come
 
 int fail(int error) {
     errno = error;
@@ -186,6 +188,12 @@ void fuzz::requireTidy() {
     }
 }
 
+void fuzz::shortenReads(size_t most) {
+    constexpr int kReads = 16; // more take time and show no more
+    shortSize = most;
+    shortReads = most > 0 ? kReads : 0;
+}
+
 std::string &fuzz::contentOf(const char *path) {
     const NodePointer node = find(path);
     return (node ? node : make(path, S_IFREG | 0600))->content;
@@ -213,7 +221,8 @@ ssize_t read(int fd, void *buffer, size_t size) {
     if (!isOurs(fd)) {
         return OWN(read)(fd, buffer, size);
     }
-    const size_t most = fuzz::readStep > 0 ? std::min(fuzz::readStep, size) : size;
+    const size_t most = shortReads > 0 ? std::min(shortSize, size) : size;
+    shortReads -= shortReads > 0 ? 1 : 0;
     const ssize_t count = readAt(*at(fd).node, at(fd).at, buffer, most);
     at(fd).at += static_cast<size_t>(count);
     return count;

@@ -1,4 +1,4 @@
-// What the fuzz targets share: a small machine inside the sandbox, made anew for each input, on
+// What the fuzz targets share: a small machine inside the sandbox, whose files are in memory, and on
 // which no program is started, nothing is logged and nobody waits; and what must hold.
 #pragma once
 
@@ -32,8 +32,6 @@ constexpr const char *kRunner = "/tmp/tavischedtask";
 
 // What time() answers.
 extern time_t now;
-// How many bytes a read gives at most; 0 = as many as there are.
-extern size_t readStep;
 
 // Both task files.
 void storeTasks(std::string_view content);
@@ -43,7 +41,7 @@ class Input {
   public:
     Input(const uint8_t *data, size_t size) : rest_(reinterpret_cast<const char *>(data), size) {}
     uint32_t number(size_t bytes);
-    // For readStep; mostly 0, as many reads take time.
+    // For shortenReads; mostly 0, as many reads take time.
     size_t step();
     std::string rest() const { return std::string(rest_); }
     std::string text() const { return std::string(rest_.substr(0, rest_.find('\0'))); }

@@ -81,8 +81,25 @@ void requirePlain(const Json::Value &element, const TAVI_SCHED_TASK &task) {
     REQUIRE(isEveryDay || !isOfNames(element["week"]) || weekOf(element["week"]) == task.week);
 }
 
+// Without the member "backend" by id and arguments.
+bool isPowerInWeb(const Json::Value &element) {
+    Json::Value value;
+    const auto textOf = [&](const char *key) {
+        return element.isMember(key) && !tavisched::parseJson(element[key].asString(), true, value)
+                   ? value.asString()
+                   : "";
+    };
+    const int id = std::atoi(textOf("id").c_str());
+    const std::string arguments = textOf("app args");
+    return element.isMember("backend") ? textOf("backend") == "-3"
+                                       : id >= 60'000'000 && id <= 99'999'999 &&
+                                             (arguments == "poweron" || arguments == "poweroff");
+}
+
 void requireMembers(const Json::Value &element, const TAVI_SCHED_TASK &task) {
-    if (!tavisched::isWebTask(element)) {
+    const bool isWeb = tavisched::isWebTask(element);
+    REQUIRE(tavisched::isPower(task) == (isWeb ? isPowerInWeb(element) : element["backend"] == -3));
+    if (!isWeb) {
         requirePlain(element, task);
         return;
     }

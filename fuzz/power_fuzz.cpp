@@ -88,12 +88,18 @@ void requireTask(const TAVI_SCHED_TASK &task) {
             std::strcmp(found->appArgs, task.appArgs) == 0);
 }
 
+// Id, arguments, days, state and time.
 std::string inWords(int kind, const TAVIAUTOPOWER &entry) {
-    std::string words = kind == TAVI_AUTOPOWER_KIND_ON ? "poweron " : "poweroff ";
+    const bool isOn = kind == TAVI_AUTOPOWER_KIND_ON;
+    const bool isEnabled = entry.enabled == 1;
+    std::string words =
+        std::to_string((isOn ? 60'000'000 : 80'000'000) + (isEnabled ? 10'000'000 : 0) +
+                       entry.weekBits * 10'000 + entry.hour * 100 + entry.minute) +
+        (isOn ? " poweron " : " poweroff ");
     for (int day = 0; day < TAVI_SCHED_WEEK_DAYS; ++day) {
         words += (entry.weekBits >> day & 1) != 0 ? '1' : '0';
     }
-    return words + (entry.enabled == 1 ? " 1 " : " 0 ") + std::to_string(entry.hour) + ":" +
+    return words + (isEnabled ? " 1 " : " 0 ") + std::to_string(entry.hour) + ":" +
            std::to_string(entry.minute);
 }
 
@@ -113,7 +119,7 @@ void requireTasks(const std::optional<Entries> &on, const std::optional<Entries>
     auto next = expected.begin();
     for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
         REQUIRE(next != expected.end());
-        REQUIRE(*next++ == std::string(task->appArgs) + " " + task->week + " " +
+        REQUIRE(*next++ == std::to_string(task->id) + " " + task->appArgs + " " + task->week + " " +
                                std::to_string(task->state) + " " + std::to_string(task->runHour) +
                                ":" + std::to_string(task->runMin));
         requireTask(*task);
@@ -159,7 +165,7 @@ void requireWritten(int kind, const Entries &entries) {
 } // namespace
 
 void fuzz::test(Input input) {
-    fuzz::readStep = input.step();
+    shortenReads(input.step());
     fuzz::contentOf(fuzz::kAutoPower) = input.rest();
     const auto on = entriesOf(TAVI_AUTOPOWER_KIND_ON);
     const auto off = entriesOf(TAVI_AUTOPOWER_KIND_OFF);

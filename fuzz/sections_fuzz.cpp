@@ -123,11 +123,24 @@ void requireTasks(const std::vector<Section> &sections) {
     REQUIRE(count == given && (!all || count == readable));
 }
 
-void requireFaults(const std::vector<Section> &sections) {
+void requireFaults(const std::string &content, const std::vector<Section> &sections) {
+    std::vector<std::string> expected;
+    for (const Section &section : sections) {
+        const auto line = std::count(content.begin(),
+                                     content.begin() + static_cast<ptrdiff_t>(section.begin), '\n');
+        const std::string where = "line " + std::to_string(line + 1) + ": ";
+        if (section.isDamaged) {
+            const std::string header = content.substr(section.begin);
+            expected.push_back(
+                cut(where + "damaged header: " + header.substr(0, header.find('\n'))));
+        } else if (find(sections, section.name) != &section) {
+            expected.push_back(cut(where + "section [" + section.name + "] stands more than once"));
+        }
+    }
     const fuzz::List list = fuzz::newList();
     PLATCSZLIST *faults = list.get();
-    REQUIRE(PLATCFileCheckSections(fuzz::kWorking, &faults) ==
-            static_cast<int>(sections.size() - namesOf(sections).size()));
+    REQUIRE(PLATCFileCheckSections(fuzz::kWorking, &faults) == static_cast<int>(expected.size()));
+    REQUIRE(fuzz::textsOf(faults) == expected);
 }
 
 std::string without(const std::string &content, const std::string &name) {
@@ -166,7 +179,7 @@ void requireChange(const std::string &content) {
 } // namespace
 
 void fuzz::test(Input input) {
-    fuzz::readStep = input.step();
+    shortenReads(input.step());
     const std::string content = input.rest();
     const auto sections = parse(content);
     fuzz::contentOf(fuzz::kWorking) = content;
@@ -191,6 +204,6 @@ void fuzz::test(Input input) {
         requireChange(content);
         break;
     default:
-        requireFaults(sections);
+        requireFaults(content, sections);
     }
 }

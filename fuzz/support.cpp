@@ -21,7 +21,6 @@
 namespace fuzz {
 
 time_t now = 1715158800; // 2024-05-08 09:00 UTC
-size_t readStep = 0;
 
 namespace {
 
@@ -170,7 +169,7 @@ int LLVMFuzzerInitialize(int *, char ***argv) {
 }
 
 int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-    fuzz::readStep = 0;
+    fuzz::shortenReads(0);
     fuzz::test(fuzz::Input(data, size));
     fuzz::requireTidy();
     return 0;

@@ -68,23 +68,9 @@ TEST_F(Durability, OrderOfFlushesAndRenames) {
 
 // Stops a create for good at the first call that the predicate wants.
 void cutOff(const std::function<bool(const tracer::Call &)> &isWanted) {
-    size_t wanted = 0;
-    size_t point = 0;
-    const auto create = [] { return created("new"); };
-    const Snapshot before;
-    tracer::run(create, {}, [&](const tracer::Call &call) {
-        ++point;
-        wanted = wanted == 0 && isWanted(call) ? point : wanted;
-    });
-    // A look for missed runs may come between, as a second has passed.
-    for (int tries = 0; tries < 10; ++tries) {
-        before.restore();
-        const auto run = tracer::run(create, {.point = wanted, .act = tracer::Act::KillAll});
-        if (run.acted && isWanted(run.call)) {
-            return;
-        }
-    }
-    ADD_FAILURE() << "it was not cut off";
+    const auto run = tracer::run([] { return created("new"); },
+                                 {.act = tracer::Act::KillAll, .isPoint = isWanted});
+    EXPECT_TRUE(run.acted) << "it was not cut off";
 }
 
 std::string firstHalf(const std::string &text) {

@@ -266,7 +266,8 @@ class Following {
         if (onCall_) {
             onCall_(call);
         }
-        if (run_.points == plan_.point) {
+        const bool isFirst = plan_.isPoint && !run_.acted && plan_.isPoint(call);
+        if (isFirst || run_.points == plan_.point) {
             run_.call = call;
             act(*kind, pid, info);
         }

@@ -20,18 +20,19 @@ enum class Calls {
 
 enum class Act { Nothing, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
 
-struct Plan {
-    Calls calls = Calls::Changing;
-    size_t point = 0; // from 1 on; 0 is never reached
-    Act act = Act::Nothing;
-    int error = 0; // for Fail
-};
-
 struct Call {
     std::string name;
     std::string path; // the first that it names, or that of its descriptor
     bool isPrograms = false;
     bool isWrite = false; // of a length that can be cut short
+};
+
+struct Plan {
+    Calls calls = Calls::Changing;
+    size_t point = 0; // from 1 on; 0 is never reached
+    Act act = Act::Nothing;
+    int error = 0;                               // for Fail
+    std::function<bool(const Call &)> isPoint{}; // the first for which it is true, instead
 };
 
 struct Run {

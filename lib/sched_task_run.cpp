@@ -353,9 +353,8 @@ class TaskRun {
         return true;
     }
 
-    // A row that is left as it is tells of a run that was interrupted.
     void storeResult() {
-        if (run_.isLost() || !openDatabase()) {
+        if (!openDatabase()) {
             return;
         }
         if (TAVISchedDBSetStatus(database_.get(), statusId_, SCHED_STATUS_CODE_RUNNING, statusCode_,

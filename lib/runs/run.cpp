@@ -175,9 +175,7 @@ void sched::Run::end(int32_t result, int32_t number) {
     if (began_ == 0) {
         countWaiting();
     }
-    record_.result = wasStopped_ ? TAVI_SCHED_RUN_STOPPED_BY_USER
-                     : isLost_   ? TAVI_SCHED_RUN_INTERRUPTED
-                                 : result;
+    record_.result = wasStopped_ ? TAVI_SCHED_RUN_STOPPED_BY_USER : result;
     record_.number = number;
     record_.ended = wallClock();
     record_.duration = began_ == 0 ? 0 : steadyClock() - began_;
@@ -238,7 +236,6 @@ int sched::Run::wait(pid_t process) {
         await(isStored || next == 0 ? next : kUnrecorded);
     }
     takeRest();
-    isLost_ = awaited_ == process;
     return status;
 }
 

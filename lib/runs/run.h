@@ -38,8 +38,6 @@ class Run final : private CommandWatch {
 
     // The next command of this process is the run's. It takes no long time.
     void beginCommand();
-    // Its command has ended, and nobody knows how.
-    bool isLost() const { return isLost_; }
     // The result as it is stored, and that of a command that was asked to end.
     void end(int32_t result, int32_t number);
     // What is still to do when nobody waits for the result any more: the handlers, and what the
@@ -78,7 +76,6 @@ class Run final : private CommandWatch {
     base::Descriptor children_; // tells of children that end
     pid_t awaited_ = -1;        // the command's, then the handlers' process; -1 when it has ended
     bool wasStopped_ = false;
-    bool isLost_ = false;
     int64_t killAt_ = 0;
     int kills_ = 0;
 };

@@ -27,16 +27,16 @@ void requirePairs(int kind, int count, const Entries &entries) {
     bool isWhole = true;
     for (size_t i = 0; i < most; ++i) {
         const auto pair = pairs.find(std::to_string(1000 + i).substr(1));
-        unsigned int numbers[4] = {};
+        unsigned long long numbers[4] = {}; // too large ones do not wrap to small ones
         int end = 0;
         isWhole = pair != pairs.end() &&
                   pair->second.find_first_not_of("0123456789 ") == std::string::npos &&
-                  std::sscanf(pair->second.c_str(), "%u %u %u %u%n", &numbers[0], &numbers[1],
-                              &numbers[2], &numbers[3], &end) == 4 &&
+                  std::sscanf(pair->second.c_str(), "%llu %llu %llu %llu%n", &numbers[0],
+                              &numbers[1], &numbers[2], &numbers[3], &end) == 4 &&
                   std::count(pair->second.begin(), pair->second.end(), ' ') == 3 &&
                   static_cast<size_t>(end) == pair->second.size() &&
                   std::all_of(std::begin(numbers), std::end(numbers),
-                              [](unsigned int number) { return number <= 255; });
+                              [](unsigned long long number) { return number <= 255; });
         if (!isWhole) {
             break;
         }

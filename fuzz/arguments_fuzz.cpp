@@ -176,6 +176,10 @@ int completeIds() {
     return 0;
 }
 
+bool Change::isStored() {
+    return false;
+}
+
 } // namespace tavisched
 
 namespace {

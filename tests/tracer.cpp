@@ -127,17 +127,26 @@ bool getInfo(pid_t pid, Info &info) {
            0;
 }
 
+// A page at a time: what follows the text need not be there.
 std::string readText(pid_t pid, uint64_t address) {
-    std::array<char, PATH_MAX> text{};
-    iovec local{text.data(), text.size() - 1};
-    // A page at a time: what follows the text need not be there.
     constexpr uint64_t kPage = 4096;
-    local.iov_len = kPage - address % kPage;
-    const iovec remote{reinterpret_cast<void *>(address), local.iov_len};
-    if (process_vm_readv(pid, &local, 1, &remote, 1, 0) <= 0) {
-        return "?";
+    std::string text;
+    std::array<char, kPage> part{};
+    while (text.size() < PATH_MAX) {
+        iovec local{part.data(), kPage - address % kPage};
+        const iovec remote{reinterpret_cast<void *>(address), local.iov_len};
+        const ssize_t length = process_vm_readv(pid, &local, 1, &remote, 1, 0);
+        if (length <= 0) {
+            return "?";
+        }
+        const size_t size = strnlen(part.data(), static_cast<size_t>(length));
+        text.append(part.data(), size);
+        if (size < static_cast<size_t>(length)) {
+            break;
+        }
+        address += size;
     }
-    return text.data();
+    return text;
 }
 
 std::string pathOfDescriptor(pid_t pid, uint64_t number) {

@@ -1,5 +1,5 @@
-// What the fuzz targets share: a small machine inside the sandbox, whose files are in memory, and on
-// which no program is started, nothing is logged and nobody waits; and what must hold.
+// What the fuzz targets share: a small machine inside the sandbox, whose files are in memory, and
+// on which no program is started, nothing is logged and nobody waits; and what must hold.
 #pragma once
 
 #include "files.h"

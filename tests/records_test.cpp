@@ -499,9 +499,11 @@ TEST_F(Records, NothingKeepsARunFromRunning) {
          "head -c 4096 /dev/zero | dd bs=4096 seek=1 conv=notrunc of=runs.sqlite 2> /dev/null",
          "test -s runs.sqlite.damaged", 1, "is damaged and put aside"},
         {"newer",
-         "rm -f runs.sqlite*; python3 -c \"import sqlite3; "
+         "python3 -c \"import sqlite3; "
          "sqlite3.connect('runs.sqlite').execute('PRAGMA user_version=99')\"",
-         "rm runs.sqlite*", -1, "cannot be opened"},
+         "python3 -c \"import sqlite3; exit(sqlite3.connect('runs.sqlite')"
+         ".execute('SELECT count(*) FROM runs').fetchone() != (1,))\" && rm runs.sqlite*",
+         -1, "cannot be opened"},
         {"full", "head -c 100M /dev/zero > fill 2>/dev/null", "rm fill", 0, kFolder},
         {"no place for outputs", "rm -r output; touch output", "rm output", 1, "cannot be made"},
     };

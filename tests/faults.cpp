@@ -84,7 +84,9 @@ void letProgramFail(const char *library) {
     const OwnAllocations own;
     fcntl(faults().file, F_SETFD, 0);
     setenv(kVariable, std::to_string(faults().file).c_str(), 1);
-    setenv("LD_PRELOAD", library, 1);
+    constexpr const char *kName = "/home/faults.so"; // in which there is no blank
+    (void)!symlink(library, kName);
+    setenv("LD_PRELOAD", kName, 1);
 }
 
 } // namespace support

@@ -97,8 +97,8 @@ template <typename... Arguments> int tool(Arguments... arguments) {
 
 // Two tasks with another command, one as a new one.
 void exportTasks() {
-    shell(TAVISCHED " export | sed 's/\"true\"/\"false\"/; s/\"one\"/\"uno\"/' "
-                    "> /run/tasks.json");
+    shell("'" TAVISCHED "' export | sed 's/\"true\"/\"false\"/; s/\"one\"/\"uno\"/' "
+          "> /run/tasks.json");
 }
 
 std::string faultsOfTool(int answer) {

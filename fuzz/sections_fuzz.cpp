@@ -91,7 +91,10 @@ std::optional<int32_t> idOf(const std::string &name) {
 void requireTasks(const std::vector<Section> &sections) {
     int readable = 0;
     for (const std::string &name : namesOf(sections)) {
-        const Section *const section = find(sections, cut(name));
+        if (cut(name) != name) {
+            continue;
+        }
+        const Section *const section = find(sections, name);
         const fuzz::Task task = fuzz::newTask();
         const bool isReadable =
             section && !hasNul(section->pairs) &&

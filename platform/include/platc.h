@@ -87,8 +87,8 @@ PLATC_API int PLATCFileEnumSection(const char *szPath, PLATCSZLIST **ppList);
 /* Reads the section's pairs into the hash, beside what it holds. 1 found, 0 no such section, -1. */
 PLATC_API int PLATCFileGetSection(const char *szPath, const char *szSection, PLATCSZHASH **ppHash);
 /* Hands every section to the function, in file order and as one reading shows them: its name and
- * its pairs, both valid during the call. The function ends the pass by any other answer than 0.
- * Returns the number of calls, or -1. */
+ * its pairs, both valid during the call; but none with a NUL in its name, which nobody can name.
+ * The function ends the pass by any other answer than 0. Returns the number of calls, or -1. */
 PLATC_API int PLATCFileForEachSection(const char *szPath,
                                       int (*pfOnSection)(void *pContext, const char *szSection,
                                                          PLATCSZHASH *pHash),

@@ -347,9 +347,13 @@ int PLATCFileForEachSection(const char *szPath,
             int calls = 0;
             PLATCSZHASH hash;
             forEachFirst(content->text, [&](const Section &section) {
+                const std::string name(section.name);
+                if (name.find('\0') != std::string::npos) {
+                    return true;
+                }
                 replacePairs(content->text, section, hash);
                 ++calls;
-                return pfOnSection(pContext, std::string(section.name).c_str(), &hash) == 0;
+                return pfOnSection(pContext, name.c_str(), &hash) == 0;
             });
             return calls;
         },

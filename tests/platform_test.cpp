@@ -85,7 +85,7 @@ TEST_F(Platform, SectionsAreFoundWhereverTheyLie) {
 TEST_F(Platform, APassOverAllSections) {
     writeFile("/etc/f", "k=0\n[1]\na=1\nb=2\n[2] \na=3\nb=4\n[3\n[4]\na=5\n[1]\na=6\n[5]\n"
                         "b=7\na=8\nno pair\n[6]\na=1\nb=2\nc=3\nc=4\n[7]\n" +
-                            std::string("[8\0]\na=9\n", 10));
+                            std::string("[8\0]\na=9\n", 9));
     std::string seen;
     const auto take = [](void *text, const char *name, PLATCSZHASH *pairs) {
         auto &told = *static_cast<std::string *>(text);

@@ -11,6 +11,7 @@
 #undef main
 
 #include <iostream>
+#include <limits>
 #include <random>
 #include <utility>
 
@@ -191,26 +192,27 @@ constexpr std::string_view kTaskUsage =
     "--name= --command= --at= --daily --weekly= --monthly= --yearly= --once= --every= --until= "
     "--owner= --app= --power= --enabled --disabled --allow-overlap --no-overlap --dry-run --quiet "
     "--json";
+constexpr size_t kAny = std::numeric_limits<size_t>::max();
 constexpr struct {
     std::string_view name, argument;
     size_t least, most;
     std::string_view usage;
 } kCommands[] = {
-    {"list", "WORD", 0, 99, "--all --failed --owner= --next= --sort=id --reverse --json"},
+    {"list", "WORD", 0, kAny, "--all --failed --owner= --next= --sort=id --reverse --json"},
     {"show", "ID", 1, 1, "--json"},
     {"history", "ID", 0, 1, "--failed --since= --limit=0 --json"},
     {"log", "ID", 1, 1, "--run= --follow"},
-    {"export", "ID", 0, 99, "--web"},
+    {"export", "ID", 0, kAny, "--web"},
     {"add", "", 0, 0, kTaskUsage},
     {"edit", "ID", 1, 1, kTaskUsage},
-    {"enable", "ID", 1, 99, ""},
-    {"disable", "ID", 1, 99, ""},
-    {"remove", "ID", 1, 99, "--yes"},
+    {"enable", "ID", 1, kAny, ""},
+    {"disable", "ID", 1, kAny, ""},
+    {"remove", "ID", 1, kAny, "--yes"},
     {"import", "FILE", 1, 1, "--replace --dry-run"},
-    {"run", "ID", 0, 99, "--wait --missed"},
-    {"next", "ID", 0, 99, "--number=0 --until= --all --json"},
+    {"run", "ID", 0, kAny, "--wait --missed"},
+    {"next", "ID", 0, kAny, "--number=0 --until= --all --json"},
     {"calendar", "", 0, 0, "--days=7 --past=1 --hours --all --json"},
-    {"stop", "ID", 1, 99, "--after=10"},
+    {"stop", "ID", 1, kAny, "--after=10"},
     {"sync", "", 0, 0, ""},
     {"check", "", 0, 0, "--repair --json"},
     {"complete-ids", "", 0, 0, ""}};

@@ -1,13 +1,12 @@
-# The target "tidy": clang-tidy on every C++ source of the tree. A source is looked at anew when its object is, so
-# when it, a header that it includes or its compile command changed, and when .clang-tidy did.
-find_program(CLANG_TIDY clang-tidy)
+# The target "tidy": clang-tidy on every C++ source of the tree. A source is looked at anew when it or a header of ours
+# that it includes changed, and when clang-tidy or its rules did. Needs a tree in which each source is compiled alone.
+find_program(CLANG_TIDY NAMES clang-tidy-22 clang-tidy) # from 21 on it does not walk through the standard library
 set(analysed)
 
 function(analyse_folder folder)
     get_property(targets DIRECTORY ${folder} PROPERTY BUILDSYSTEM_TARGETS)
     foreach(target IN LISTS targets)
         get_target_property(sources ${target} SOURCES)
-        get_target_property(objects ${target} BINARY_DIR)
         foreach(source IN LISTS sources)
             if(NOT source MATCHES "\\.cpp$")
                 continue()
@@ -22,9 +21,9 @@ function(analyse_folder folder)
             add_custom_command(OUTPUT ${stamp} VERBATIM
                 COMMENT "clang-tidy ${name}"
                 COMMAND ${PROJECT_SOURCE_DIR}/cmake/static_analysis.sh
-                    ${CLANG_TIDY} ${PROJECT_BINARY_DIR} ${file} ${stamp}
-                DEPENDS ${objects}/CMakeFiles/${target}.dir/${source}.o ${CLANG_TIDY}
-                    ${PROJECT_SOURCE_DIR}/.clang-tidy ${rules})
+                    ${CLANG_TIDY} ${PROJECT_BINARY_DIR} ${file} tidy/${name}
+                DEPENDS ${file} ${CLANG_TIDY} ${PROJECT_SOURCE_DIR}/.clang-tidy ${rules}
+                DEPFILE ${PROJECT_BINARY_DIR}/tidy/${name}.d)
             list(APPEND analysed ${stamp})
         endforeach()
     endforeach()
@@ -35,7 +34,7 @@ function(analyse_folder folder)
     set(analysed ${analysed} PARENT_SCOPE)
 endfunction()
 
-if(CLANG_TIDY AND CMAKE_GENERATOR STREQUAL "Ninja")
+if(CLANG_TIDY AND CMAKE_GENERATOR STREQUAL "Ninja" AND NOT CMAKE_UNITY_BUILD AND CMAKE_DISABLE_PRECOMPILE_HEADERS)
     analyse_folder(${PROJECT_SOURCE_DIR})
     add_custom_target(tidy DEPENDS ${analysed})
 endif()

@@ -177,10 +177,6 @@ int completeIds() {
     return 0;
 }
 
-bool Change::isStored() {
-    return false;
-}
-
 } // namespace tavisched
 
 namespace {

@@ -9,12 +9,12 @@
 
 // Leap days are eight years apart at most, and clocks do not skip the same time every year.
 std::optional<int64_t> sched::findNextStart(const TAVI_SCHED_TASK &task, int64_t from) {
-    constexpr int64_t kLongestWait = 10 * 366 * kDay;
+    constexpr int64_t kFarthest = 10 * 366 * kDay;
     tzset();
     from = sched::inTime(from);
     const int64_t begin = std::max(from, secondsOf(Days(task).first()));
     std::optional<int64_t> next;
-    forEachStart(task, from, sched::inTime(begin + kLongestWait), [&](int64_t moment) {
+    forEachStart(task, from, sched::inTime(begin + kFarthest), [&](int64_t moment) {
         next = moment;
         return false;
     });

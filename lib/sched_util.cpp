@@ -13,7 +13,7 @@ namespace {
 
 // The numbers of a text that holds nothing but digits and its separator are small: ten characters
 // at most.
-uint32_t number(const char *text) {
+uint32_t parseNumber(const char *text) {
     return static_cast<uint32_t>(std::strtoul(text, nullptr, 10));
 }
 
@@ -29,14 +29,14 @@ bool parseDate(const char *text, TAVI_SCHED_DATE &date) {
         std::strcspn(text, "/") != 4) {
         return false;
     }
-    date.year = number(text);
+    date.year = parseNumber(text);
     const char *const month = text + 5;
     const size_t digits = std::strcspn(month, "/");
     if (digits < 1 || digits > 2 || month[digits] == '\0') {
         return false;
     }
-    date.month = number(month);
-    date.day = number(month + digits + 1);
+    date.month = parseNumber(month);
+    date.day = parseNumber(month + digits + 1);
     return true;
 }
 
@@ -46,8 +46,8 @@ bool parseTime(const char *text, TAVI_SCHED_DATE &date) {
     if (length < 3 || length > 5 || !consistsOf(text, "0123456789:") || digits < 1 || digits > 2) {
         return false;
     }
-    date.hour = number(text);
-    date.minute = number(text + digits + 1);
+    date.hour = parseNumber(text);
+    date.minute = parseNumber(text + digits + 1);
     return true;
 }
 

@@ -35,7 +35,7 @@ struct Operation {
     bool isPower = false;
 };
 
-int editedHere() {
+int editedName() {
     return edited("a name of quite another length than the one it had");
 }
 
@@ -52,7 +52,7 @@ int saved(int create = 0) {
 
 int batchDone() {
     const bool changed = TAVISchedChangeBegin() == 0 && created("first") == 0 &&
-                         editedHere() == 0 && TAVISchedTaskRemove(1) == 0 && powerCreated() == 0 &&
+                         editedName() == 0 && TAVISchedTaskRemove(1) == 0 && powerCreated() == 0 &&
                          saved() == 0 && created("second") == 0;
     return changed && TAVISchedChangeCommit() == 0 ? 0 : 1;
 }
@@ -176,7 +176,7 @@ std::string faultsOfMissed(int) {
 std::vector<Operation> operations(char suite) {
     std::vector<Operation> all = {
         {"create", "kf", [] { return created("new"); }},
-        {"edit", "kf", editedHere},
+        {"edit", "kf", editedName},
         {"remove", "kf", [] { return TAVISchedTaskRemove(2) == 0 ? 0 : 1; }},
         {"save", "kf", [] { return saved(); }, [] {}, nullptr, [] { return saved(1); }},
         {.name = "batch", .suites = "ktf", .run = batchDone, .isBatch = true},

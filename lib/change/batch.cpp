@@ -48,7 +48,7 @@ void forgetStaged() {
 // alone.
 void leaveInChild() {
     forgetStaged();
-    static_cast<void>(batch.release());
+    [[maybe_unused]] const Batch *const parents = batch.release();
 }
 
 // What backends do from here on is done at once.

@@ -110,14 +110,14 @@ int sched::takeBackCutOffChange() {
 namespace {
 
 // A child has no part in its parent's change.
-void forgetInChild() {
+void forgetChangesInChild() {
     recorded = false;
     openChanges = 0;
     takesBack = false;
 }
 
-void forgetInChildren() {
-    static const int registered = pthread_atfork(nullptr, nullptr, forgetInChild);
+void forgetChangesInChildren() {
+    static const int registered = pthread_atfork(nullptr, nullptr, forgetChangesInChild);
     static_cast<void>(registered);
 }
 
@@ -127,7 +127,7 @@ sched::Change::Change() {
     if (!lock_) {
         return;
     }
-    forgetInChildren();
+    forgetChangesInChildren();
     isOutermost_ = openChanges++ == 0 && !takesBack;
     ready_ = !isOutermost_ || takeBackCutOffChange() == 0;
     recorded = recorded && !isOutermost_;

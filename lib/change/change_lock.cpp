@@ -95,15 +95,15 @@ struct OwnReading {
 OwnReading own;
 
 // A child does not hold what its parent holds, and must not keep it either.
-void forgetInChild() {
+void forgetLocksInChild() {
     held.file.close();
     held.depth = 0;
     own.file.close();
     own.depth = 0;
 }
 
-void forgetInChildren() {
-    static const int registered = pthread_atfork(nullptr, nullptr, forgetInChild);
+void forgetLocksInChildren() {
+    static const int registered = pthread_atfork(nullptr, nullptr, forgetLocksInChild);
     static_cast<void>(registered);
 }
 
@@ -292,7 +292,7 @@ sched::ChangeLock::ChangeLock(Wait wait) {
         }
         return;
     }
-    forgetInChildren();
+    forgetLocksInChildren();
     held.leftBehind.reset();
     held.isLeftToNext = false;
     if (file) {

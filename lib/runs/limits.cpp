@@ -33,7 +33,7 @@ void readFlag(std::string_view key, std::string_view value, int32_t &flag, Fault
     flag = value == "1" ? 1 : 0;
 }
 
-TAVI_SCHED_RUN_LIMITS read(Faults &faults) {
+TAVI_SCHED_RUN_LIMITS readLimits(Faults &faults) {
     TAVI_SCHED_RUN_LIMITS limits = kDefaults;
     sched::Hash section(8);
     sched::List keys(8);
@@ -65,7 +65,7 @@ TAVI_SCHED_RUN_LIMITS read(Faults &faults) {
 
 TAVI_SCHED_RUN_LIMITS sched::readRunLimits() {
     Faults faults;
-    const TAVI_SCHED_RUN_LIMITS limits = read(faults);
+    const TAVI_SCHED_RUN_LIMITS limits = readLimits(faults);
     for (const std::string &fault : faults) {
         SCHED_LOG("%s: %s", kRunLimits, LogText(fault.c_str()).c_str());
     }
@@ -74,7 +74,7 @@ TAVI_SCHED_RUN_LIMITS sched::readRunLimits() {
 
 std::vector<std::string> sched::faultsOfRunLimits() {
     Faults faults;
-    read(faults);
+    readLimits(faults);
     return faults;
 }
 

@@ -12,6 +12,7 @@
 #include <optional>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 namespace {
 
@@ -109,10 +110,11 @@ bool sched::OutputFile::make(int64_t run) {
         return base::Descriptor(
             ::open(path.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_NOFOLLOW | O_CLOEXEC, 0600));
     };
-    file_ = open();
-    if (!file_ && errno == ENOENT && mkdir(kOutputFolder, 0700) == 0) {
-        file_ = open();
+    base::Descriptor file = open();
+    if (!file && errno == ENOENT && mkdir(kOutputFolder, 0700) == 0) {
+        file = open();
     }
+    file_ = std::move(file);
     return static_cast<bool>(file_);
 }
 

@@ -14,15 +14,13 @@ using platform::guarded;
 
 constexpr const char *kCrontab = "/etc/crontab";
 constexpr const char *kCronPid = "/var/run/crond.pid";
-constexpr int kWeekDays = 7;
-constexpr unsigned int kEveryDay = 127;
 
 std::string dayField(unsigned int weekBits) {
-    if (weekBits == kEveryDay) {
+    if (weekBits == platform::kEveryDay) {
         return "*";
     }
     std::string days;
-    for (int day = 0; day < kWeekDays; ++day) {
+    for (int day = 0; day < platform::kWeekDays; ++day) {
         if ((weekBits >> day & 1) != 0) {
             days += (days.empty() ? "" : ",") + std::to_string(day);
         }
@@ -34,7 +32,7 @@ std::string dayField(unsigned int weekBits) {
 bool cronTakes(const TAVISCHEDULE &schedule) {
     constexpr size_t kMaxCommand = 998; // cron refuses a longer one
     const size_t length = strnlen(schedule.szCommand, sizeof schedule.szCommand);
-    return schedule.weekBits <= kEveryDay && schedule.hour >= 0 && schedule.hour <= 23 &&
+    return schedule.weekBits <= platform::kEveryDay && schedule.hour >= 0 && schedule.hour <= 23 &&
            schedule.minute >= 0 && schedule.minute <= 59 && length > 0 && length <= kMaxCommand &&
            !std::strchr(schedule.szCommand, '\n');
 }

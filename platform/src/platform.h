@@ -20,6 +20,9 @@ constexpr unsigned int kRenameFailed = 0x2800;
 constexpr unsigned int kSystemCallFailed = 0x2A00;
 constexpr unsigned int kBadFormat = 0x4000;
 
+constexpr int kWeekDays = 7;
+constexpr unsigned int kEveryDay = 127; // as bits of week days
+
 constexpr const char *baseName(const char *path) {
     const size_t slash = std::string_view(path).rfind('/');
     return slash == std::string_view::npos ? path : path + slash + 1;

@@ -16,18 +16,17 @@
 namespace {
 
 constexpr const char *kWakeAlarm = "/sys/class/rtc/rtc0/wakealarm";
-constexpr int kWeekDays = 7;
-constexpr unsigned int kEveryDay = 127;
 
 // The first time after now at which an enabled entry switches the machine on.
 std::optional<time_t> nextTime(const TAVIAUTOPOWER &entry, time_t now) {
-    if (entry.enabled != 1 || entry.weekBits > kEveryDay || entry.hour > 23 || entry.minute > 59) {
+    if (entry.enabled != 1 || entry.weekBits > platform::kEveryDay || entry.hour > 23 ||
+        entry.minute > 59) {
         return std::nullopt;
     }
     tm today{};
     localtime_r(&now, &today);
-    for (int days = 0; days <= kWeekDays; ++days) {
-        if ((entry.weekBits >> ((today.tm_wday + days) % kWeekDays) & 1) == 0) {
+    for (int days = 0; days <= platform::kWeekDays; ++days) {
+        if ((entry.weekBits >> ((today.tm_wday + days) % platform::kWeekDays) & 1) == 0) {
             continue;
         }
         tm due{};

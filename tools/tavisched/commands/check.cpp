@@ -32,7 +32,7 @@ void printRepaired(const TAVI_SCHED_FINDING &finding) {
                 printable(finding.what).c_str(), printable(finding.repaired).c_str());
 }
 
-void printAsJson(const TAVI_SCHED_FINDING &finding) {
+void printFindingAsJson(const TAVI_SCHED_FINDING &finding) {
     Json::Value value;
     value["problem"] = !isNote(finding);
     value["what"] = plainText(finding.what);
@@ -77,7 +77,7 @@ int check(bool repair, bool json) {
     const Findings findings = Findings::all();
     int status = 0;
     for (const auto *finding = findings.first(); finding; finding = finding->next) {
-        (json ? printAsJson : printFinding)(*finding);
+        (json ? printFindingAsJson : printFinding)(*finding);
         status = isNote(*finding) ? status : 1;
     }
     if (status == 0 && !json) {

@@ -44,7 +44,7 @@ bool hasWord(const TAVI_SCHED_TASK &task, const Run *run, const std::string &wor
 }
 
 // The end of a time such as "24h" from now.
-time_t endOf(const std::string &span) {
+time_t endOfSpan(const std::string &span) {
     const auto seconds = parseSpan(span);
     if (!seconds) {
         throw Refusal("--next: \"" + printable(span) +
@@ -58,7 +58,7 @@ class Filter {
   public:
     explicit Filter(const ListOptions &options)
         : options_(options),
-          until_(options.next.empty() ? std::nullopt : std::optional(endOf(options.next))) {
+          until_(options.next.empty() ? std::nullopt : std::optional(endOfSpan(options.next))) {
         for (const std::string &word : options.words) {
             words_.push_back(folded(word));
         }

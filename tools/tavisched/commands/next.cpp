@@ -54,7 +54,7 @@ std::vector<Start> collectStarts(const TaskPointers &tasks, time_t until, size_t
     return starts;
 }
 
-void printAsJson(const Start &start) {
+void printStartAsJson(const Start &start) {
     Json::Value value;
     value["time"] = isoTime(start.time);
     value["task"] = start.task->id;
@@ -91,7 +91,7 @@ int next(const NextOptions &options) {
     }
     const std::vector<Start> starts = collectStarts(tasks, until, number);
     if (options.json) {
-        std::for_each(starts.begin(), starts.end(), printAsJson);
+        std::for_each(starts.begin(), starts.end(), printStartAsJson);
     } else if (starts.empty()) {
         std::printf("Nothing will run%s.\n", options.until.empty() ? "" : " until then");
     } else {

@@ -54,7 +54,6 @@ constexpr struct Member {
     {"editForm", "edit form"},
     {"simpleEditForm", "simple edit form", Kind::Flag},
 };
-constexpr const char *kBackend = "backend";
 constexpr const char *kOwner = "owner";
 constexpr std::array<std::string_view, 6> kThatFollow = {"schedule", "nextRun", "nextStart",
                                                          "lastRun",  "notes",   "starts"};

@@ -9,6 +9,9 @@
 
 namespace tavisched {
 
+inline constexpr const char *kBackend =
+    "backend"; // a member of JSON that the stored form does not have
+
 // Owner of a platform hash with a stored form.
 class Hash {
   public:

@@ -16,10 +16,8 @@ namespace tavisched {
 
 namespace {
 
-constexpr size_t kTextSize = 160 * 1024; // holds every task
-// The members that the stored form does not have.
-constexpr const char *kBackend = "backend";
-constexpr const char *kOwnerName = "owner name";
+constexpr size_t kTextSize = 160 * 1024;         // holds every task
+constexpr const char *kOwnerName = "owner name"; // nor has it this one
 
 using Members = std::map<std::string, std::string>;
 

@@ -192,9 +192,9 @@ Task readTask(int32_t id) {
 
 std::string called(const TAVI_SCHED_TASK &task) {
     const std::string number = task.id == -1 ? "the task" : "task " + std::to_string(task.id);
-    constexpr size_t kColumns = 60;
+    constexpr size_t kWidest = 60;
     return task.name[0] == '\0' ? number
-                                : number + " (" + cutTo(printable(task.name), kColumns) + ")";
+                                : number + " (" + cutTo(printable(task.name), kWidest) + ")";
 }
 
 } // namespace tavisched

@@ -18,13 +18,11 @@ namespace {
 constexpr const char *kWakeAlarm = "/sys/class/rtc/rtc0/wakealarm";
 
 // The first time after now at which an enabled entry switches the machine on.
-std::optional<time_t> nextTime(const TAVIAUTOPOWER &entry, time_t now) {
+std::optional<time_t> nextTime(const TAVIAUTOPOWER &entry, const tm &today, time_t now) {
     if (entry.enabled != 1 || entry.weekBits > platform::kEveryDay || entry.hour > 23 ||
         entry.minute > 59) {
         return std::nullopt;
     }
-    tm today{};
-    localtime_r(&now, &today);
     for (int days = 0; days <= platform::kWeekDays; ++days) {
         if ((entry.weekBits >> ((today.tm_wday + days) % platform::kWeekDays) & 1) == 0) {
             continue;
@@ -76,9 +74,14 @@ int TAVIAutoPoweronSet() {
         return -1;
     }
     const time_t now = time(nullptr);
+    tm today{};
+    if (!localtime_r(&now, &today)) {
+        PLATFORM_LOG("power-on cannot be armed: %s: %m", "local time");
+        return PLATFORM_FAIL(platform::kSystemCallFailed);
+    }
     std::optional<time_t> wake;
     for (int i = 0; i < count; ++i) {
-        const auto time = nextTime(entries[static_cast<size_t>(i)], now);
+        const auto time = nextTime(entries[static_cast<size_t>(i)], today, now);
         if (time && (!wake || *time < *wake)) {
             wake = time;
         }

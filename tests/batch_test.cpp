@@ -1,5 +1,4 @@
 // Several changes as one.
-#include "arrange.h"
 #include "machine.h"
 
 #include <array>
@@ -136,17 +135,13 @@ TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     // One that waits for the end of the batch changes tasks like any other process.
     std::array<int, 2> ends{};
     ASSERT_EQ(pipe(ends.data()), 0);
-    const pid_t later = fork();
-    if (later == 0) {
+    const pid_t later = start([&] {
         char byte = 0;
-        const bool read = ::read(ends[0], &byte, 1) == 1;
-        _exit(read && TAVISchedTaskCreate(newTask().get()) == 0 ? 0 : 1);
-    }
+        return read(ends[0], &byte, 1) == 1 && TAVISchedTaskCreate(newTask().get()) == 0 ? 0 : 1;
+    });
     EXPECT_EQ(TAVISchedChangeCommit(), 0);
     EXPECT_EQ(write(ends[1], "x", 1), 1);
-    int status = -1;
-    waitpid(later, &status, 0);
-    EXPECT_EQ(status, 0);
+    EXPECT_EQ(exitOf(later), 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
     close(ends[0]);
     close(ends[1]);

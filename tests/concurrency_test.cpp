@@ -1,5 +1,4 @@
 // Several processes at once: writers, readers, plug-in handlers, and another user in /tmp.
-#include "arrange.h"
 #include "machine.h"
 
 #include <array>
@@ -41,20 +40,6 @@ Shared &shared() {
     static auto *const memory = static_cast<Shared *>(
         mmap(nullptr, sizeof(Shared), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
     return *memory;
-}
-
-template <typename Function> pid_t start(Function &&function) {
-    const pid_t pid = fork();
-    if (pid == 0) {
-        _exit(function());
-    }
-    return pid;
-}
-
-int resultOf(pid_t pid) {
-    int status = -1;
-    waitpid(pid, &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
 int addByTool() {
@@ -119,7 +104,7 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
     }
     const auto areDone = [](const std::vector<pid_t> &processes) {
         return std::count_if(processes.begin(), processes.end(),
-                             [](pid_t process) { return resultOf(process) == 0; });
+                             [](pid_t process) { return exitOf(process) == 0; });
     };
     EXPECT_EQ(areDone(writers), 2 * kWriters)
         << testing::PrintToString(logs()) << readFile("/run/output");
@@ -239,7 +224,7 @@ class LocalUser : public Concurrency {
     void endAttack() {
         if (stranger_ > 0) {
             kill(stranger_, SIGKILL);
-            resultOf(std::exchange(stranger_, 0));
+            exitOf(std::exchange(stranger_, 0));
         }
     }
     void attackInALoop(void (*attack)()) {

@@ -20,11 +20,7 @@ bool hasCron() {
 constexpr const char *kNow = "2024-05-08 09:00";
 
 pid_t startCron() {
-    const pid_t cron = fork();
-    if (cron == 0) {
-        execl("/usr/sbin/cron", "cron", "-f", nullptr);
-        _exit(127);
-    }
+    const pid_t cron = start([] { return execl("/usr/sbin/cron", "cron", "-f", nullptr); });
     EXPECT_TRUE(waitFor("[ -e /var/run/crond.pid ]"));
     return cron;
 }
@@ -98,11 +94,7 @@ TEST_F(Crontab, EveryRewriteIsLaterByAWholeSecond) {
 }
 
 TEST_F(Crontab, CronIsSignalledWhenItRuns) {
-    const pid_t cron = fork();
-    if (cron == 0) {
-        alarm(5);
-        pause();
-    }
+    const pid_t cron = start([] { return alarm(60) + pause(); });
     writeFile("/var/run/crond.pid", std::to_string(cron) + "\n");
     storedTask();
     int status = 0;

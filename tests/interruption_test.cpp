@@ -404,35 +404,27 @@ bool isOurs(const tracer::Call &call) {
                        [&](const char *place) { return call.path.starts_with(place); });
 }
 
-// What an operation may fail with; also what the platform's functions set.
-bool isDocumented(unsigned int code) {
-    const std::array<unsigned int, 12> codes = {0x0100, 0x0200, 0x0400, 0x0500, 0x0900, 0x0B00,
-                                                0x0D00, 0x2000, 0x2700, 0x2800, 0x2A00, 0x4000};
-    return std::find(codes.begin(), codes.end(), code) != codes.end();
-}
-
 int answer() {
+    // What an operation may fail with; also what the platform's functions set.
+    constexpr std::array<unsigned int, 12> kCodes = {0x0100, 0x0200, 0x0400, 0x0500,
+                                                     0x0900, 0x0B00, 0x0D00, 0x2000,
+                                                     0x2700, 0x2800, 0x2A00, 0x4000};
     PLATCErrSetEx(0, "", 0);
     const int answer = testing::WithParamInterface<Operation>::GetParam().run();
-    return answer == 1 && !isDocumented(PLATCErrGet()) ? 3 : answer;
+    const bool isKnown = std::find(kCodes.begin(), kCodes.end(), PLATCErrGet()) != kCodes.end();
+    return answer == 1 && !isKnown ? 3 : answer;
 }
 
 // The same in a process of its own, when all that this has started has ended; more than 9 when one
 // of them crashes, or it throws or leaks.
 int answerInChild() {
-    const pid_t child = fork();
-    if (child == 0) {
-        int answered = 10;
-        try {
-            answered = answer();
-        } catch (const std::exception &) {
-            _exit(answered);
-        }
+    const pid_t child = start([]() noexcept {
+        int answered = answer();
 #ifdef __SANITIZE_ADDRESS__
         answered = __lsan_do_recoverable_leak_check() == 0 ? answered : 10;
 #endif
-        _exit(answered);
-    }
+        return answered;
+    });
     int answered = 0;
     int status = 0;
     for (pid_t ended = 0; (ended = wait(&status)) > 0;) {

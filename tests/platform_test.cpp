@@ -23,10 +23,7 @@ std::string sectionOf(const char *path, const std::string &name) {
 
 // A process that has ended and was not waited for: it writes no more.
 pid_t startZombie() {
-    const pid_t child = fork();
-    if (child == 0) {
-        _exit(0);
-    }
+    const pid_t child = start([] { return 0; });
     siginfo_t info{};
     waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOWAIT);
     return child;

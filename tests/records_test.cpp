@@ -1,5 +1,5 @@
 // What runs leave behind, with real processes: records, outputs, and what happens beside a command.
-#include "arrange.h"
+#include "machine.h"
 
 #include <array>
 #include <fcntl.h>
@@ -536,10 +536,11 @@ TEST_F(Records, NothingKeepsARunFromRunning) {
 TEST_F(Records, ALockedDatabaseIsNotWaitedForLong) {
     runNew("true");
     waitForChildren();
-    const pid_t other = fork();
-    if (other == 0) { // SQLite takes what this process itself holds for held in its children too
+    // SQLite takes what this process itself holds for held in its children too.
+    const pid_t other = start([] {
         recorded("BEGIN IMMEDIATE; CREATE TABLE other(value)", "/tmp/locked");
-    }
+        return 0;
+    });
     awaitThat([] { return access("/tmp/locked", F_OK) == 0; });
     // More than a pipe holds is printed while the record is waited for.
     storedTask("head -c 300000 /dev/zero; touch /tmp/printed");
@@ -561,10 +562,10 @@ TEST_F(Records, ALockedDatabaseIsNotWaitedForLong) {
 
 TEST_F(Records, ANewDatabaseIsMadeBesideOthers) {
     storedTask("sleep 0.2"); // it is recorded when it begins, too
-    const pid_t other = fork();
-    if (other == 0) {
+    const pid_t other = start([] {
         recorded("BEGIN IMMEDIATE", "/tmp/locked");
-    }
+        return 0;
+    });
     awaitThat([] { return access("/tmp/locked", F_OK) == 0; });
     ASSERT_EQ(TAVISchedTaskRun(1, 0, 0), 0);
     awaitThat([] { return query("SELECT status_code FROM task_status") == "3 "; });

@@ -1,5 +1,5 @@
 // Running tasks, with real processes.
-#include "arrange.h"
+#include "machine.h"
 
 #include <array>
 #include <csignal>

@@ -1,5 +1,5 @@
 // The minutes at which tasks will really be started.
-#include "arrange.h"
+#include "machine.h"
 
 namespace {
 

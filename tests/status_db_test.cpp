@@ -220,9 +220,7 @@ TEST_F(StatusDatabase, ManyMayOpenItFirst) {
     for (int round = 0; round < 20; ++round) {
         shell("rm -f /tmp/sched_status.sqlite*");
         for (int i = 0; i < 8; ++i) {
-            if (fork() == 0) {
-                _exit(TAVISchedDBInit() ? 0 : 1);
-            }
+            start([] { return TAVISchedDBInit() ? 0 : 1; });
         }
         for (int status = -1; wait(&status) > 0;) {
             EXPECT_EQ(status, 0);

@@ -132,28 +132,6 @@ TEST_F(Store, TheStartOfTheMachineFillsAnEmptyWorkingCopy) {
     EXPECT_EQ(TAVISchedChangeRollback(), 0);
 }
 
-// A copy is killed with the process that changes tasks, and power is lost.
-TEST_F(Store, TheStartOfTheMachineTakesBackWhatWasCutOff) {
-    storedTask();
-    const State before = stateNow();
-    writeFile("/run/cut", "#!/bin/sh\n[ $3 != $CUT ] || exec kill -9 $PPID\nexec /run/cp \"$@\"\n");
-    ASSERT_EQ(shell("cp /bin/cp /run/cp; chmod 755 /run/cut"), 0);
-    for (const std::string cut : {kPersistent, kWorking}) {
-        for (const std::string loss : {"truncate -s 9", "truncate -s 0", "rm", "touch"}) {
-            setenv("CUT", cut.c_str(), 1);
-            ASSERT_EQ(shell("mount -n --bind /run/cut /bin/cp"), 0);
-            EXPECT_EQ(inChild([] { return created("new"); }), -1);
-            EXPECT_EQ(shell("umount -n -l /bin/cp"), 0);
-            ASSERT_EQ(shell("test -s /usr/tavi/etc/scheduled_tasks.journal && " + loss +
-                            " /usr/tavi/etc/scheduled_tasks && rm /tmp/scheduled_tasks"),
-                      0);
-            EXPECT_EQ(TAVISchedStart(), 0);
-            EXPECT_EQ(stateNow(), before) << cut << loss;
-            EXPECT_EQ(access(kRecord, F_OK), -1);
-        }
-    }
-}
-
 TEST_F(Store, ChangesOfATask) {
     Task task = newTask();
     TAVISchedCTaskSetName(task.get(), "");

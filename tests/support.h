@@ -66,6 +66,16 @@ void writeFile(const std::string &path, const std::string &content);
 struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Starts a process of a function that gives its exit status.
+template <typename Function> pid_t start(Function &&function) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+        _exit(function());
+    }
+    return pid;
+}
+// Waits for a process; its exit status, or -1.
+int exitOf(pid_t pid);
 // Waits until a shell command succeeds, for two minutes at most.
 bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.

@@ -1,5 +1,5 @@
 // The command line for people, from outside: what it accepts, refuses, stores, shows and repairs.
-#include "arrange.h"
+#include "machine.h"
 
 #include <csignal>
 #include <sys/prctl.h>
@@ -12,7 +12,6 @@ using testing::ContainsRegex;
 using testing::MatchesRegex;
 using testing::Not;
 
-constexpr const char *kPower = "/usr/tavi/etc/auto_power";
 constexpr const char *kOffFrom4To7 = "[power on]\n000=1 127 7 0\n[power off]\n000=1 127 4 0\n";
 
 class CommandLine : public SchedTest {
@@ -36,13 +35,12 @@ class CommandLine : public SchedTest {
         setenv("BOTH", "/tmp/scheduled_tasks /usr/tavi/etc/scheduled_tasks", 1);
         setenv("RUNS", "/var/lib/tavischeduler", 1);
         setenv("HANDLERS", "/usr/tavi/etc/plugins/task_scheduler", 1);
-        cron_ = fork();
-        if (cron_ == 0) {
+        cron_ = start([] {
             signal(SIGHUP, SIG_IGN);
             prctl(PR_SET_NAME, "cron");
             prctl(PR_SET_PDEATHSIG, SIGKILL);
-            pause();
-        }
+            return pause();
+        });
     }
     static void TearDownTestSuite() {
         kill(cron_, SIGKILL);

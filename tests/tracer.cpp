@@ -4,20 +4,19 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <climits>
 #include <csignal>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
-#include <cstring>
 #include <elf.h>
 #include <fcntl.h>
+#include <filesystem>
+#include <fstream>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <set>
 #include <sys/prctl.h>
 #include <sys/ptrace.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/uio.h>
 #include <sys/user.h>
@@ -28,6 +27,8 @@
 namespace tracer {
 
 namespace {
+
+namespace fs = std::filesystem;
 
 constexpr int kNone = -1;
 
@@ -122,38 +123,18 @@ void installFilter() {
 
 using Info = __ptrace_syscall_info;
 
-bool getInfo(pid_t pid, Info &info) {
-    return ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid, sizeof info, &info) >
-           0;
-}
-
-// A page at a time: what follows the text need not be there.
 std::string readText(pid_t pid, uint64_t address) {
-    constexpr uint64_t kPage = 4096;
+    std::ifstream memory("/proc/" + std::to_string(pid) + "/mem");
+    memory.seekg(static_cast<std::streamoff>(address));
     std::string text;
-    std::array<char, kPage> part{};
-    while (text.size() < PATH_MAX) {
-        iovec local{part.data(), kPage - address % kPage};
-        const iovec remote{reinterpret_cast<void *>(address), local.iov_len};
-        const ssize_t length = process_vm_readv(pid, &local, 1, &remote, 1, 0);
-        if (length <= 0) {
-            return "?";
-        }
-        const size_t size = strnlen(part.data(), static_cast<size_t>(length));
-        text.append(part.data(), size);
-        if (size < static_cast<size_t>(length)) {
-            break;
-        }
-        address += size;
-    }
+    std::getline(memory, text, '\0');
     return text;
 }
 
 std::string pathOfDescriptor(pid_t pid, uint64_t number) {
-    std::array<char, PATH_MAX> target{};
-    const std::string name =
-        "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(static_cast<int>(number));
-    return readlink(name.c_str(), target.data(), target.size() - 1) > 0 ? target.data() : "?";
+    std::error_code error;
+    return fs::read_symlink(
+        "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(static_cast<int>(number)), error);
 }
 
 #if defined(__x86_64__)
@@ -220,47 +201,33 @@ class Following {
   private:
     // The signal to go on with.
     int onStop(pid_t pid, int status) {
-        const bool isNew = processes_.insert(pid).second;
-        const int signal = WSTOPSIG(status);
-        switch (status >> 16) {
-        case 0:
-            break;
-        case PTRACE_EVENT_SECCOMP:
+        const int event = status >> 16;
+        processes_.insert(pid);
+        if (event == PTRACE_EVENT_SECCOMP) {
             onCall(pid);
-            return 0;
-        case PTRACE_EVENT_FORK:
-        case PTRACE_EVENT_VFORK:
-        case PTRACE_EVENT_CLONE: {
+        } else if (event == PTRACE_EVENT_EXEC && pid != caller_) {
+            programs_.insert(pid);
+        } else if (event == PTRACE_EVENT_FORK || event == PTRACE_EVENT_VFORK ||
+                   event == PTRACE_EVENT_CLONE) {
             unsigned long child = 0;
             ptrace(PTRACE_GETEVENTMSG, pid, nullptr, &child);
-            fresh_.insert(static_cast<pid_t>(child));
             processes_.insert(static_cast<pid_t>(child));
             if (programs_.contains(pid)) {
                 programs_.insert(static_cast<pid_t>(child));
             }
-            return 0;
-        }
-        case PTRACE_EVENT_EXEC:
-            if (pid != caller_) {
-                programs_.insert(pid);
-            }
-            return 0;
-        default:
-            return 0;
-        }
-        if (signal == (SIGTRAP | 0x80)) {
+        } else if (WSTOPSIG(status) == (SIGTRAP | 0x80)) {
             cut_ = 0; // the shortened write has been done
             kill(processes_);
-            return 0;
+        } else if (event == 0) {
+            return WSTOPSIG(status);
         }
-        // A new process begins with a stop of the tracer's.
-        const bool first = fresh_.erase(pid) > 0 || isNew;
-        return signal == SIGSTOP && first ? 0 : signal;
+        return 0;
     }
 
     void onCall(pid_t pid) {
         Info info{};
-        const bool known = getInfo(pid, info);
+        const bool known = ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid,
+                                  sizeof info, &info) > 0;
         const auto kind = std::find_if(kKinds.begin(), kKinds.end(), [&](const Kind &one) {
             return static_cast<uint64_t>(one.number) == info.seccomp.nr;
         });
@@ -333,11 +300,11 @@ class Following {
     // Programs ask for more than there is.
     static uint64_t halfOf(const Kind &kind, pid_t pid, const Info &info) {
         const uint64_t length = info.seccomp.args[kind.length];
-        struct stat source {};
         const uint64_t from = info.seccomp.args[kind.number == __NR_copy_file_range ? 0 : 1];
-        const std::string path = "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(from);
-        const bool copies = kind.length > 2 && stat(path.c_str(), &source) == 0;
-        return (copies ? std::min(length, static_cast<uint64_t>(source.st_size)) : length) / 2;
+        std::error_code error;
+        return kind.length > 2
+                   ? std::min(length, fs::file_size(pathOfDescriptor(pid, from), error)) / 2
+                   : length / 2;
     }
 
     static void kill(const std::set<pid_t> &processes) {
@@ -355,8 +322,7 @@ class Following {
     const std::function<void(const Call &)> &onCall_;
     std::set<pid_t> processes_;
     std::set<pid_t> programs_; // started by the caller, not forks of it
-    std::set<pid_t> fresh_;
-    pid_t cut_ = 0; // the process whose shortened write is being done
+    pid_t cut_ = 0;            // the process whose shortened write is being done
     Run run_;
 };
 
@@ -372,20 +338,18 @@ Run run(const std::function<int()> &operation, const Plan &plan,
         const std::function<void(const Call &)> &onCall) {
     const pid_t caller = fork();
     if (caller == 0) {
-        ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
-        raise(SIGSTOP);
+        raise(SIGSTOP); // until it is followed
         installFilter();
         _exit(operation());
     }
-    int status = 0;
-    if (waitpid(caller, &status, 0) != caller || !WIFSTOPPED(status)) {
+    waitpid(caller, nullptr, WUNTRACED);
+    if (ptrace(PTRACE_SEIZE, caller, nullptr,
+               static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
+                                 PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP |
+                                 PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL)) != 0) {
         std::abort();
     }
-    ptrace(PTRACE_SETOPTIONS, caller, nullptr,
-           static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
-                             PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP | PTRACE_O_TRACESYSGOOD |
-                             PTRACE_O_EXITKILL));
-    ptrace(PTRACE_CONT, caller, nullptr, nullptr);
+    kill(caller, SIGCONT);
     return Following(caller, plan, onCall).follow();
 }
 

@@ -151,7 +151,7 @@ std::string listOfFreshProcess() {
 int created(const char *name, const char *command) {
     const Task task = newTask(command);
     TAVISchedCTaskSetName(task.get(), name);
-    return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
+    return task && TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
 }
 
 int edited(const char *name, const char *command) {
@@ -166,7 +166,8 @@ int edited(const char *name, const char *command) {
 }
 
 int powerCreated(int hour) {
-    return TAVISchedTaskCreate(powerTask("poweroff", hour).get()) == 0 ? 0 : 1;
+    const Task task = powerTask("poweroff", hour);
+    return task && TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
 }
 
 } // namespace support

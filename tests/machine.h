@@ -34,8 +34,8 @@ inline void addHandler(const std::string &name, const std::string &script, mode_
 inline Task powerTask(const char *kind, int hour = 0, int minute = 0) {
     const OwnAllocations own;
     Task task = newTask();
-    task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-    EXPECT_EQ(TAVISchedTaskGetDefault(task.get()), 0);
+    TAVISchedCTaskSetBackend(task.get(), TAVI_SCHED_BACKEND_AUTOPOWER);
+    TAVISchedTaskGetDefault(task.get());
     TAVISchedCTaskSetAppArgs(task.get(), kind);
     TAVISchedCTaskSetRunHour(task.get(), hour);
     TAVISchedCTaskSetRunMin(task.get(), minute);

@@ -195,15 +195,6 @@ TEST_F(Power, SchedulesAreWholeLinesThatCronTakes) {
     EXPECT_EQ(readFile(kCrontab), kForeignCrontab + ("15\t0\t*\t*\t*\troot\t" + longest + "\n"));
 }
 
-TEST_F(Power, AFullKindKeepsWhatItHas) {
-    std::vector<TAVIAUTOPOWER> entries(100, {0, 1, 2, 3});
-    TAVIAutoPowerConfSet(TAVI_AUTOPOWER_KIND_ON, 100, entries.data());
-    EXPECT_EQ(store("poweron", "1000000", 5, 5), 70010505);
-    EXPECT_THAT(readFile(kPower), HasSubstr("\n100=1 1 5 5\n"));
-    EXPECT_EQ(TAVIAutoPowerConfGet(TAVI_AUTOPOWER_KIND_ON, 1000, entries.data()), 100);
-    EXPECT_EQ(listedIds().size(), 100U);
-}
-
 TEST_F(Power, WithoutAClockOnlyArmingFails) {
     shell("rm -r /sys/class/rtc/rtc0");
     EXPECT_EQ(store("poweroff", "1000000", 5, 5), 90010505);

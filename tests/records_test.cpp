@@ -549,17 +549,12 @@ TEST_F(Records, ALockedDatabaseIsNotWaitedForLong) {
     EXPECT_THAT(logs(), IsEmpty());
     awaitThat([] { return !lastLog().empty(); });
     EXPECT_EQ(query("SELECT task_id, status_code FROM task_status"), "1 3 2 3 ");
-    // One that is let go in time is waited for.
-    storedTask("true");
-    logs();
-    ASSERT_EQ(TAVISchedTaskRun(3, 0, 0), 0);
-    awaitThat([] { return query("SELECT status_code FROM task_status WHERE task_id=3") == "3 "; });
     kill(other, SIGKILL);
     waitForChildren();
-    EXPECT_THAT(logs(), IsEmpty());
-    EXPECT_EQ(results(ofTask(-1)), "3:0 3:0 ");
+    EXPECT_EQ(results(ofTask(-1)), "3:0 ");
 }
 
+// One that is let go in time is waited for.
 TEST_F(Records, ANewDatabaseIsMadeBesideOthers) {
     storedTask("sleep 0.2"); // it is recorded when it begins, too
     const pid_t other = start([] {
@@ -576,11 +571,7 @@ TEST_F(Records, ANewDatabaseIsMadeBesideOthers) {
 }
 
 TEST_F(Records, ManyAtOnce) {
-#ifdef __SANITIZE_ADDRESS__
-    constexpr int kMany = 30;
-#else
-    constexpr int kMany = 200;
-#endif
+    constexpr int kMany = kStep == 1 ? 200 : 30;
     fakes.pauseMicroseconds = 3000; // a locked status database is waited for
     Task task = newTask("echo $TAVI_RUN_ID");
     TAVISchedCTaskSetCanRunTaskSameTime(task.get(), 1);

@@ -7,6 +7,7 @@
 namespace {
 
 using namespace support;
+using namespace std::string_literals;
 using testing::AllOf;
 using testing::ContainsRegex;
 using testing::MatchesRegex;
@@ -61,6 +62,10 @@ class CommandLine : public SchedTest {
     std::string done(const std::string &arguments) { return ended(0, arguments); }
     std::string failed(const std::string &arguments) { return ended(1, arguments); }
     std::string refused(const std::string &arguments) { return ended(2, arguments); }
+    static std::string jsonError(const std::string &option, int status) {
+        return "\\{\"error\": \".*\",\"option\": " + option +
+               ",\"status\": " + std::to_string(status) + "\\}\n";
+    }
     // The state of everything that a refused command must leave alone.
     static std::string machine() {
         std::string all;
@@ -77,22 +82,25 @@ class CommandLine : public SchedTest {
 TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     done("add --command true --at 08:00 --every 4 --until 20");
     done("add --power off --at 23:00 --weekly Mon");
-    const Texts cases = {
-        {"add", "needs --command"},
+    const struct {
+        std::string arguments;
+        const char *said, *option = nullptr; // as JSON tells it
+    } cases[] = {
+        {"add", "needs --command", "\"command\""},
         {"add --command ' '", "--command: it is empty"},
         {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\"", "at most 12285"},
         {"add --command x --at 23:60", "\"23:60\" is not accepted; accepted: HH:MM"},
         {"add --command x --at 9:5", "accepted: HH:MM"},
-        {"add --command x --at 24:00", "accepted: HH:MM"},
+        {"add --command x --at 24:00", "accepted: HH:MM", "\"at\""},
         {"add --command x --yearly 02-30", "--yearly: \"02-30\""},
         {"add --command x --yearly 13-01", "--yearly"},
         {"add --command x --monthly 32", "a day from 1 to 31"},
         {"add --command x --monthly 0", "a day from 1 to 31"},
-        {"add --command x --weekly ''", "is no day of the week"},
+        {"add --command x --weekly ''", "is no day of the week", "\"weekly\""},
         {"add --command x --weekly Mon-", "\"mon-\" is no day of the week; accepted: a list"},
         {"add --command x --weekly Mon,,Fri", "is no day of the week"},
         {"add --command x --once 2099-02-29", "a date of the calendar"},
-        {"add --command x --once 2020-01-01", "once on 2020-01-01 at 00:00, has passed"},
+        {"add --command x --once 2020-01-01", "2020-01-01 at 00:00, has passed", "\"once\""},
         {"add --command x --every 0 --until 20", "--until: it needs an interval"},
         {"add --command x --every 24", "hours from 1 to 23"},
         {"add --command x --every 2 --until 24", "an hour from 00 to 23"},
@@ -120,7 +128,8 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"remove 1 9 --yes", "there is no task 9"},
         {"remove 1", "--yes removes without a question"},
         {"list --next 24", "--next: \"24\" is not accepted; accepted: a time such as 30m"},
-        {"run 9", "there is no task 9"},
+        {"run 9", "there is no task 9", "null"},
+        {"import /nowhere", "/nowhere", "null"},
         {"list --sort colour", "--sort: colour not in"},
         {"edit 4 --at 08:00", "task 4 (Task 4) is kept under another number"},
         {"remove 01x --yes", "\"01x\" is no id; accepted"},
@@ -128,20 +137,23 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"history --since 2026-02-30", "--since: \"2026-02-30\" is not accepted; accepted: a time"},
         {"log 1 --run 7", "task 1 has no run 7; \"tavisched history 1\" lists its runs"},
         {"log 1 --run 1x", "\"1x\" is no run"},
-        {"stop 1 --after -1", "--after: Value -1 not in range"},
+        {"stop 1 --after -1", "--after: Value -1 not in range", "\"after\""},
         {"frobnicate", "there is no command \"frobnicate\"\n\"tavisched --help\""},
         {"lsit 3", "there is no command \"lsit\"; did you mean \"list\"?"},
         {"add --nmae foo --bar", "\"--nmae foo --bar\" is not understood; did you mean \"--name\""},
-        {"rm 1 --ye", "did you mean \"--yes\"?\n\"tavisched remove --help\""},
+        {"rm 1 --ye", "did you mean \"--yes\"?\n\"tavisched remove --help\"", "null"},
         {"\"$(printf 'a\\302\\233\\177')\"", "no command \"a\\u009b\\u007f\""},
         {"", "a command is needed"},
     };
     shell("echo \"$(sed 's/^.1]/[3]/; s/^id=1/id=4/; s/Task 1/Task 4/' /tmp/scheduled_tasks)\" "
           "| tee -a $BOTH > /tmp/out");
     const std::string before = machine();
-    for (const auto &[arguments, said] : cases) {
+    for (const auto &[arguments, said, option] : cases) {
         EXPECT_THAT(refused(arguments), HasSubstr(said)) << arguments;
         EXPECT_EQ(machine(), before) << arguments;
+        if (option) {
+            EXPECT_THAT(refused(arguments + " --json"), MatchesRegex(jsonError(option, 2)));
+        }
     }
 }
 
@@ -223,6 +235,7 @@ TEST_F(CommandLine, PowerSchedulesAreEditedAndRefused) {
     for (const char *const add : {"add --power on --at 06:00", "add --power on --dry-run"}) {
         EXPECT_THAT(failed(add), HasSubstr("machine has no clock that can switch it on: /sys"));
         EXPECT_EQ(machine(), before);
+        EXPECT_THAT(failed(add + " --json"s), MatchesRegex(jsonError("null", 1)));
     }
     EXPECT_THAT(done("check"), HasSubstr("note: this machine has no clock that can wake it (/sys"));
     EXPECT_EQ(done("add --power on --disabled -q"), "61270000\n");
@@ -368,27 +381,6 @@ TEST_F(CommandLine, ShowsTheCalendar) {
                                    "\"tasks\": *\n? *\\[\n? *2,\n? *3\n",
                                    "T04:00:00[+-]..:..\",\n *\"until\": \".*T07:00:00"}) {
         EXPECT_THAT(json, ContainsRegex(part));
-    }
-}
-
-TEST_F(CommandLine, TellsErrorsAsJson) {
-    done("add --command x");
-    const struct {
-        const char *arguments, *option;
-        int status;
-    } cases[] = {{"add --command x --at 24:00", "\"at\"", 2},
-                 {"add", "\"command\"", 2},
-                 {"add --command x --weekly ''", "\"weekly\"", 2},
-                 {"add --command x --once 2020-01-01", "\"once\"", 2},
-                 {"add --power on", "null", 1},
-                 {"stop 1 --after -1", "\"after\"", 2},
-                 {"import /nowhere", "null", 2},
-                 {"remove 1 --yse", "null", 2},
-                 {"run 9", "null", 2}};
-    for (const auto &c : cases) {
-        EXPECT_THAT(ended(c.status, std::string(c.arguments) + " --json"),
-                    MatchesRegex("\\{\"error\": \".*\",\"option\": " + std::string(c.option) +
-                                 ",\"status\": " + std::to_string(c.status) + "\\}\n"));
     }
 }
 

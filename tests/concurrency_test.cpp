@@ -1,15 +1,11 @@
 // Several processes at once: writers, readers, plug-in handlers, and another user in /tmp.
 #include "machine.h"
 
-#include <array>
 #include <atomic>
 #include <chrono>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
-#include <fcntl.h>
-#include <filesystem>
 #include <functional>
 #include <grp.h>
 #include <set>
@@ -19,7 +15,6 @@
 namespace {
 
 using namespace support;
-namespace fs = std::filesystem;
 using std::chrono::steady_clock;
 
 constexpr int kWriters = kStep == 1 ? 50 : 10;
@@ -51,13 +46,7 @@ size_t linesWith(const char *text, const char *path) {
     return count;
 }
 
-class Concurrency : public SchedTest {
-  protected:
-    void SetUp() override {
-        SchedTest::SetUp();
-        new (&shared()) Shared{};
-    }
-};
+using Concurrency = SchedTest;
 
 // Lists, which is never less than before, and looks the first task up, until it is told to stop.
 int readInALoop() {
@@ -84,6 +73,7 @@ int runInALoop() {
 }
 
 TEST_F(Concurrency, WritersReadersAndRunners) {
+    new (&shared()) Shared{};
     Task first = newTask();
     first->runHour = static_cast<uint32_t>((::time(nullptr) / 3600 + 12) % 24);
     ASSERT_EQ(TAVISchedTaskCreate(first.get()), 0);
@@ -144,7 +134,7 @@ TEST_F(Handlers, AreRefusedAtOnceInABatch) {
     EXPECT_LT(steady_clock::now() - begin, std::chrono::seconds(15));
     EXPECT_EQ(readFile("/run/pre"), "1\n") << readFile("/run/pre.add");
     EXPECT_THAT(readFile("/run/pre.list"), HasSubstr("Task 1"));
-    EXPECT_FALSE(fs::exists("/run/post"));
+    EXPECT_EQ(access("/run/post", F_OK), -1);
     ASSERT_EQ(TAVISchedChangeCommit(), 0);
     EXPECT_EQ(readFile("/run/post"), "0\n") << readFile("/run/post.add");
     EXPECT_THAT(listedIds(), ElementsAre(1, 2));
@@ -169,13 +159,9 @@ void moveIn() {
     unlink(kWorking);
 }
 
-// Also at the name that a change's scratch file will have, for as long as it knows none better.
+// Takes all the room, and gives it back.
 void fillAndFree() {
-    const int file = open("/tmp/filler", O_WRONLY | O_CREAT, 0600);
-    const std::string block(16384, 'x');
-    while (write(file, block.data(), block.size()) > 0) {
-    }
-    close(file);
+    writeFile("/tmp/filler", std::string(300000, 'x'));
     unlink("/tmp/filler");
 }
 
@@ -184,15 +170,11 @@ void plantRunner() {
     chmod(kRunner, 0755);
 }
 
-// The user's own file may be there for a moment: what was opened is looked at.
+// The user's own file may be there for a moment; in the place of root's there comes no other.
 bool isRootsAndPlanted(const char *path) {
-    const int file = open(path, O_RDONLY | O_CLOEXEC);
-    struct stat status {};
-    std::array<char, 65536> text{};
-    const bool isRoots = fstat(file, &status) == 0 && status.st_uid == 0 &&
-                         read(file, text.data(), text.size() - 1) >= 0;
-    close(file);
-    return isRoots && std::strstr(text.data(), "planted");
+    const struct stat status = statusOf(path);
+    return S_ISREG(status.st_mode) && status.st_uid == 0 &&
+           readFile(path).find("planted") != std::string::npos;
 }
 
 int becomeStranger() {
@@ -202,28 +184,20 @@ int becomeStranger() {
                : 1;
 }
 
-class LocalUser : public Concurrency {
+class LocalUser : public SchedTest {
   protected:
     void SetUp() override {
-        Concurrency::SetUp();
+        SchedTest::SetUp();
         if (inChild(becomeStranger) != 0) {
             GTEST_SKIP() << "there is only one user in here";
         }
     }
-    void TearDown() override {
-        endAttack();
-        Concurrency::TearDown();
-    }
-    void endAttack() {
-        if (stranger_ > 0) {
-            kill(stranger_, SIGKILL);
-            exitOf(std::exchange(stranger_, 0));
-        }
-    }
-    void attackInALoop(void (*attack)()) {
-        endAttack();
+    // Goes on for some seconds, or for as many tries as TAVI_TEST_TRIES says, while the user
+    // attacks.
+    static void tryOften(const char *what, void (*attack)(),
+                         const std::function<bool(long)> &holds) {
         shared().looks = 0;
-        stranger_ = start([&]() -> int {
+        const pid_t stranger = start([&] {
             umask(022);
             while (geteuid() == kStranger || becomeStranger() == 0) {
                 attack();
@@ -231,9 +205,6 @@ class LocalUser : public Concurrency {
             }
             return 1;
         });
-    }
-    // Goes on for some seconds, or for as many tries as TAVI_TEST_TRIES says.
-    static void tryOften(const char *what, const std::function<bool(long)> &holds) {
         const char *const wanted = std::getenv("TAVI_TEST_TRIES");
         const long most = wanted ? std::atol(wanted) : 1000;
         const auto end = steady_clock::now() + std::chrono::seconds(3);
@@ -242,11 +213,11 @@ class LocalUser : public Concurrency {
             EXPECT_TRUE(holds(tried++)) << testing::PrintToString(logs());
             logs();
         }
+        kill(stranger, SIGKILL);
+        exitOf(stranger);
         std::printf("%s: %ld tries of root, %ld of the user\n", what, tried, shared().looks.load());
         EXPECT_GT(shared().looks, 0);
     }
-
-    pid_t stranger_ = 0;
 };
 
 // Root stores a machine's first task while the user is at it.
@@ -257,8 +228,7 @@ TEST_F(LocalUser, NeverGivesRootATask) {
     } cases[] = {{"a task file put and taken away", putAndTakeAway},
                  {"a task file moved in", moveIn}};
     for (const auto &row : cases) {
-        attackInALoop(row.attack);
-        tryOften(row.what, [](long number) {
+        tryOften(row.what, row.attack, [](long number) {
             unlink(kWorking);
             unlink(kPersistent);
             writeFile(kCrontab, kForeignCrontab);
@@ -276,9 +246,8 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
     for (const char *const name : {"one", "two", "three"}) {
         ASSERT_EQ(created(name, std::string(3000, 'x').c_str()), 0);
     }
-    attackInALoop(fillAndFree);
     std::set<int> wanted = {1, 2, 3};
-    tryOften("/tmp filled and freed", [&](long) {
+    tryOften("/tmp filled and freed", fillAndFree, [&](long) {
         const Task task = newTask();
         if (task && TAVISchedTaskCreate(task.get()) == 0) {
             wanted.insert(task->id);
@@ -289,7 +258,6 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
         }
         return isRight;
     });
-    endAttack();
     unlink("/tmp/filler");
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
     EXPECT_THAT(leftovers(), IsEmpty());
@@ -297,9 +265,8 @@ TEST_F(LocalUser, FillsAndFreesTmp) {
 }
 
 TEST_F(LocalUser, PlantsARunner) {
-    attackInALoop(plantRunner);
-    tryOften("a runner planted", [&](long) {
-        fs::remove(kRunner);
+    tryOften("a runner planted", plantRunner, [&](long) {
+        unlink(kRunner);
         logs();
         const bool stored = created("root's") == 0;
         const bool isRoots = statusOf(kRunner).st_uid == 0;

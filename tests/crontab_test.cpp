@@ -3,7 +3,6 @@
 
 #include <csignal>
 #include <cstring>
-#include <fcntl.h>
 
 namespace {
 

@@ -3,7 +3,6 @@
 #include "machine.h"
 #include "tracer.h"
 
-#include <algorithm>
 #include <filesystem>
 #include <functional>
 #include <sys/statvfs.h>
@@ -43,17 +42,17 @@ std::string shown(const tracer::Call &call) {
 
 TEST_F(Durability, OrderOfFlushesAndRenames) {
     std::vector<std::string> order;
-    const auto run = tracer::run(
-        [] { return created("new"); }, {},
-        [&](const tracer::Call &call) {
-            const bool isFlush = call.name == "fsync" || call.name.starts_with("rename");
-            const bool overwrites = call.isPrograms && call.name == "openat" &&
-                                    (call.path == kPersistent || call.path == kWorking ||
-                                     call.path.starts_with(kScratch));
-            if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
-                order.push_back(shown(call));
-            }
-        });
+    const auto note = [&](const tracer::Call &call, size_t) {
+        const bool isFlush = call.name == "fsync" || call.name.starts_with("rename");
+        const bool overwrites =
+            call.isPrograms && call.name == "openat" &&
+            (call.path == kPersistent || call.path == kWorking || call.path.starts_with(kScratch));
+        if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
+            order.push_back(shown(call));
+        }
+        return false;
+    };
+    const auto run = tracer::run([] { return created("new"); }, {.isPoint = note});
     EXPECT_EQ(run.status, 0);
     const std::string record = kRecord;
     EXPECT_THAT(order,
@@ -67,15 +66,16 @@ TEST_F(Durability, OrderOfFlushesAndRenames) {
 // ---- Loss of power ----
 
 // Stops a create for good at the first call that the predicate wants.
-void cutOff(const std::function<bool(const tracer::Call &)> &isWanted) {
+void cutOff(const tracer::Wanted &isWanted) {
     const auto run = tracer::run([] { return created("new"); },
                                  {.act = tracer::Act::KillAll, .isPoint = isWanted});
     EXPECT_TRUE(run.acted) << "it was not cut off";
 }
 
 // A program is about to write to the path.
-std::function<bool(const tracer::Call &)> isCopyTo(const char *path) {
-    return [path](const tracer::Call &call) { return call.isPrograms && call.path == path; };
+tracer::Wanted isCopyTo(const char *path) {
+    return
+        [path](const tracer::Call &call, size_t) { return call.isPrograms && call.path == path; };
 }
 
 std::string firstHalf(const std::string &text) {
@@ -83,11 +83,9 @@ std::string firstHalf(const std::string &text) {
 }
 
 TEST_F(Durability, LossOfPower) {
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
+    const State old = stateNow(listOfFreshProcess());
     ASSERT_EQ(inChild([] { return created("new"); }), 0);
-    const State stored = stateNow();
-    const std::string storedList = listOfFreshProcess();
+    const State stored = stateNow(listOfFreshProcess());
 
     const std::vector<std::pair<const char *, void (*)(const std::string &)>> losses = {
         {"kept", [](const std::string &) {}},
@@ -103,12 +101,12 @@ TEST_F(Durability, LossOfPower) {
         {"create", [] { return created("new"); }},
         {"sync", TAVISchedTaskSync},
         {"start", TAVISchedStart}};
-    const std::vector<std::pair<const char *, std::function<bool(const tracer::Call &)>>> moments =
-        {{"before the copies", isCopyTo(kPersistent)},
-         {"between the copies", isCopyTo(kWorking)},
-         {"before the record goes", [](const tracer::Call &call) {
-              return call.name.starts_with("rename") && call.path == kRecord;
-          }}};
+    const std::vector<std::pair<const char *, tracer::Wanted>> moments = {
+        {"before the copies", isCopyTo(kPersistent)},
+        {"between the copies", isCopyTo(kWorking)},
+        {"before the record goes", [](const tracer::Call &call, size_t) {
+             return call.name.starts_with("rename") && call.path == kRecord;
+         }}};
     size_t state = 0;
     Tally tally("durability: loss of power");
     for (const auto &[moment, isWanted] : moments) {
@@ -123,9 +121,10 @@ TEST_F(Durability, LossOfPower) {
                     losePersistent(kPersistent);
                     loseWorking(kWorking);
                     const int answer = inChild(next);
-                    const bool isNew = name == "create";
-                    const bool isRight = answer == 0 && stateNow() == (isNew ? stored : old) &&
-                                         listOfFreshProcess() == (isNew ? storedList : oldList);
+                    const State &wanted = name == "create" ? stored : old;
+                    const std::string &list = wanted.at("list");
+                    const bool isRight =
+                        answer == 0 && stateNow(list) == wanted && listOfFreshProcess() == list;
                     tally.add(std::string(moment) + ", persistent file " + persistentLoss +
                                   ", working copy " + workingLoss + ", then " + name,
                               isRight ? "" : std::to_string(answer));
@@ -209,11 +208,9 @@ void expectWholeChanges(const Snapshot &start, const std::string &folder, bool i
                         bool isBatch) {
     int (*const operation)() = isBatch ? batch : editedHere;
     start.restore();
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
+    const State old = stateNow(listOfFreshProcess());
     ASSERT_EQ(inChild(operation), 0);
-    const State stored = stateNow();
-    const std::string storedList = listOfFreshProcess();
+    const State stored = stateNow(listOfFreshProcess());
     start.restore();
     Small small(folder);
     Tally tally(std::string("durability: ") + (isBatch ? "batch" : "edit") + " with " + folder +
@@ -227,14 +224,12 @@ void expectWholeChanges(const Snapshot &start, const std::string &folder, bool i
         const int answer = inChild(operation);
         const std::string fullList = listOfFreshProcess();
         small.free();
-        const std::string list = listOfFreshProcess();
-        State now = stateNow();
+        State now = stateNow(listOfFreshProcess());
         done = now == stored;
         if (answer == 0 && !isBatch && now[kCrontab] == old.at(kCrontab)) {
             now[kCrontab] = stored.at(kCrontab);
         }
-        const bool isRight = now == (answer == 0 ? stored : old) &&
-                             list == (answer == 0 ? storedList : oldList) && fullList == list;
+        const bool isRight = now == (answer == 0 ? stored : old) && fullList == now.at("list");
         tally.add(std::to_string(rest) + " left", isRight ? "" : std::to_string(answer));
     }
     EXPECT_TRUE(done);
@@ -251,14 +246,13 @@ TEST_F(Durability, FullFileSystems) {
 
 // A working copy that cannot be restored for lack of room is not read, and nothing is changed.
 TEST_F(Durability, TornWorkingCopyWithoutRoom) {
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
+    const State old = stateNow(listOfFreshProcess());
     Small small("/tmp");
     cutOff(isCopyTo(kWorking));
     writeFile(kWorking, "");
     shell("rm /tmp/scheduled_tasks.tmp*"); // that would be room enough
     small.fill(0, false);
-    EXPECT_EQ(listOfFreshProcess(), oldList);
+    EXPECT_EQ(listOfFreshProcess(), old.at("list"));
     EXPECT_EQ(inChild([] {
                   TAVI_SCHED_TASK task{};
                   return TAVISchedTaskGetByID(3, &task) == 0 && task.id == 3 ? 0 : 1;
@@ -269,8 +263,7 @@ TEST_F(Durability, TornWorkingCopyWithoutRoom) {
     EXPECT_EQ(readFile(kPersistent), persistent);
     EXPECT_TRUE(fs::exists(kRecord));
     small.free();
-    EXPECT_EQ(listOfFreshProcess(), oldList);
-    EXPECT_EQ(stateNow(), old);
+    EXPECT_EQ(stateNow(listOfFreshProcess()), old);
     EXPECT_THAT(leftovers(), IsEmpty());
 }
 

@@ -23,6 +23,15 @@ std::vector<std::string> entriesOf(const char *folder) {
     return paths;
 }
 
+std::vector<std::string> filesOfTasksAndRuns() {
+    std::vector<std::string> paths = entriesOf("/var/lib/tavischeduler");
+    for (const std::string path : {kWorking, kPersistent, kPower, kCrontab, kStatus}) {
+        paths.push_back(path);
+    }
+    std::erase_if(paths, [](const std::string &path) { return !fs::is_regular_file(path); });
+    return paths;
+}
+
 std::string sortedLines(const std::string &text) {
     std::istringstream stream(text);
     std::multiset<std::string> lines;
@@ -34,8 +43,8 @@ std::string sortedLines(const std::string &text) {
 
 } // namespace
 
-State stateNow() {
-    State state;
+State stateNow(const std::string &list) {
+    State state = {{"list", list}};
     for (const char *const path : {kWorking, kPersistent, kPower, kCrontab}) {
         state[path] = fs::exists(path) ? readFile(path) : "(none)";
     }
@@ -61,19 +70,6 @@ std::vector<std::string> leftovers() {
     return found;
 }
 
-namespace {
-
-std::vector<std::string> filesOfTasksAndRuns() {
-    std::vector<std::string> paths = entriesOf("/var/lib/tavischeduler");
-    for (const std::string path : {kWorking, kPersistent, kPower, kCrontab, kStatus}) {
-        paths.push_back(path);
-    }
-    std::erase_if(paths, [](const std::string &path) { return !fs::is_regular_file(path); });
-    return paths;
-}
-
-} // namespace
-
 Snapshot::Snapshot() {
     for (const std::string &path : filesOfTasksAndRuns()) {
         files_[path] = {readFile(path), fs::last_write_time(path)};
@@ -91,8 +87,8 @@ void Snapshot::restore() const {
         }
     }
     for (const auto &[path, file] : files_) {
-        writeFile(path, file.content);
-        fs::last_write_time(path, file.time);
+        writeFile(path, file.first);
+        fs::last_write_time(path, file.second);
     }
     // A new crontab is later than the old one: with the same calls whatever the second is.
     fs::last_write_time(kCrontab, fs::file_time_type::clock::now() + std::chrono::minutes(1));

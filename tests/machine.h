@@ -49,9 +49,9 @@ inline void addRunning() {
 }
 
 // By path; a file that is not there is "(none)", and the crontab's lines are sorted: they may
-// change places.
+// change places. With "list", what a process that has just started lists.
 using State = std::map<std::string, std::string>;
-State stateNow();
+State stateNow(const std::string &list = "");
 
 // What is in the folders of these files and does not belong there.
 std::vector<std::string> leftovers();
@@ -63,11 +63,7 @@ class Snapshot {
     void restore() const;
 
   private:
-    struct File {
-        std::string content;
-        std::filesystem::file_time_type time;
-    };
-    std::map<std::string, File> files_;
+    std::map<std::string, std::pair<std::string, std::filesystem::file_time_type>> files_;
 };
 
 // So many of something were tried, and how many held; told and checked when it ends.

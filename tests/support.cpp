@@ -127,12 +127,12 @@ std::string query(const std::string &sql) {
     return result;
 }
 
-void recorded(const std::string &sql, const char *untilKilled) {
+void recorded(const std::string &sql, bool untilKilled) {
     sqlite3 *database = nullptr;
     ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
     EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK) << sql;
     while (untilKilled) {
-        writeFile(untilKilled, "");
+        writeFile("/tmp/held", "");
         ::pause();
     }
     sqlite3_close(database);
@@ -289,8 +289,7 @@ int fsync(int fd) {
 } // extern "C"
 
 int main(int argc, char **argv) {
-    // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may
-    // not.
+    // Whoever starts this may ignore signals; its processes may not.
     for (const int number : {SIGHUP, SIGINT, SIGQUIT, SIGPIPE, SIGTERM, SIGCHLD, SIGALRM}) {
         signal(number, SIG_DFL);
     }

@@ -80,8 +80,8 @@ int exitOf(pid_t pid);
 bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.
 std::string query(const std::string &sql);
-// Executes on the records of runs, and, with a path, makes that file and keeps the database open.
-void recorded(const std::string &sql, const char *untilKilled = nullptr);
+// Executes on the records of runs; makes /tmp/held and keeps the database open, if so.
+void recorded(const std::string &sql, bool untilKilled = false);
 // Waits until all detached children of this process have ended.
 void waitForChildren();
 // "2024-05-08 09:00" in local time.

@@ -138,6 +138,7 @@ std::string pathOfDescriptor(pid_t pid, uint64_t number) {
 }
 
 #if defined(__x86_64__)
+constexpr bool kCanChange = true;
 bool setArgument(pid_t pid, int argument, uint64_t value) {
     constexpr std::array<size_t, 6> kOffsets = {offsetof(user, regs.rdi), offsetof(user, regs.rsi),
                                                 offsetof(user, regs.rdx), offsetof(user, regs.r10),
@@ -149,6 +150,7 @@ bool failCall(pid_t pid, int error) {
            ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.rax), -static_cast<long>(error)) == 0;
 }
 #elif defined(__aarch64__)
+constexpr bool kCanChange = true;
 bool setRegister(pid_t pid, int number, uint64_t value) {
     user_regs_struct registers{};
     iovec all{&registers, sizeof registers};
@@ -168,6 +170,7 @@ bool failCall(pid_t pid, int error) {
            setRegister(pid, 0, static_cast<uint64_t>(-static_cast<int64_t>(error)));
 }
 #else
+constexpr bool kCanChange = false;
 bool setArgument(pid_t, int, uint64_t) {
     return false;
 }
@@ -180,8 +183,7 @@ bool failCall(pid_t, int) {
 
 class Following {
   public:
-    Following(pid_t caller, const Plan &plan, const std::function<void(const Call &)> &onCall)
-        : caller_(caller), plan_(plan), onCall_(onCall), processes_{caller} {}
+    Following(pid_t caller, const Plan &plan) : caller_(caller), plan_(plan), processes_{caller} {}
 
     Run follow() {
         int status = 0;
@@ -239,11 +241,7 @@ class Following {
             return;
         }
         ++run_.points;
-        if (onCall_) {
-            onCall_(call);
-        }
-        const bool isFirst = plan_.isPoint && !run_.acted && plan_.isPoint(call);
-        if (isFirst || run_.points == plan_.point) {
+        if (plan_.isPoint && plan_.isPoint(call, run_.points) && !run_.acted) {
             run_.call = call;
             act(*kind, pid, info);
         }
@@ -274,26 +272,18 @@ class Following {
 
     void act(const Kind &kind, pid_t pid, const Info &info) {
         run_.acted = true;
-        switch (plan_.act) {
-        case Act::Nothing:
-            break;
-        case Act::KillAll:
+        if (plan_.act == Act::KillAll) {
             kill(processes_);
-            break;
-        case Act::KillCaller:
+        } else if (plan_.act == Act::KillCaller) {
             kill({caller_});
-            break;
-        case Act::KillProgram:
+        } else if (plan_.act == Act::KillProgram) {
             kill({pid});
-            break;
-        case Act::HalfThenKillAll:
+        } else if (plan_.act == Act::Fail) {
+            run_.acted = failCall(pid, plan_.error);
+        } else if (plan_.act == Act::HalfThenKillAll) {
             run_.acted =
                 kind.length != kNone && setArgument(pid, kind.length, halfOf(kind, pid, info));
             cut_ = run_.acted ? pid : 0;
-            break;
-        case Act::Fail:
-            run_.acted = failCall(pid, plan_.error);
-            break;
         }
     }
 
@@ -319,7 +309,6 @@ class Following {
 
     pid_t caller_;
     const Plan &plan_;
-    const std::function<void(const Call &)> &onCall_;
     std::set<pid_t> processes_;
     std::set<pid_t> programs_; // started by the caller, not forks of it
     pid_t cut_ = 0;            // the process whose shortened write is being done
@@ -328,14 +317,9 @@ class Following {
 
 } // namespace
 
-#if defined(__x86_64__) || defined(__aarch64__)
-const bool kCanChangeCalls = true;
-#else
-const bool kCanChangeCalls = false;
-#endif
+const bool kCanChangeCalls = kCanChange;
 
-Run run(const std::function<int()> &operation, const Plan &plan,
-        const std::function<void(const Call &)> &onCall) {
+Run run(const std::function<int()> &operation, const Plan &plan) {
     const pid_t caller = fork();
     if (caller == 0) {
         raise(SIGSTOP); // until it is followed
@@ -350,7 +334,7 @@ Run run(const std::function<int()> &operation, const Plan &plan,
         std::abort();
     }
     kill(caller, SIGCONT);
-    return Following(caller, plan, onCall).follow();
+    return Following(caller, plan).follow();
 }
 
 } // namespace tracer

@@ -157,13 +157,11 @@ TEST_F(Durability, TornRecord) {
 class Small {
   public:
     explicit Small(std::string folder) : folder_(std::move(folder)) {
-        const std::string rights = folder_ == "/tmp" ? "1777" : "755";
-        EXPECT_EQ(shell("mkdir /run/aside && cp -a " + folder_ +
-                        "/. /run/aside && mount -n -t "
-                        "tmpfs -o size=400k,nr_inodes=200,mode=" +
-                        rights + " small " + folder_ +
-                        " && cp -a /run/aside/crontab* /run/aside/scheduled* /run/aside/auto* " +
-                        folder_ + " 2>/dev/null; rm -r /run/aside; mountpoint -q " + folder_),
+        EXPECT_EQ(shell("f=" + folder_ +
+                        "; mkdir /run/aside && cp -a $f/. /run/aside && mount -n -t tmpfs -o "
+                        "size=400k,nr_inodes=200,mode=$(stat -c %a $f) small $f && cd /run/aside "
+                        "&& cp -a crontab* scheduled* auto* $f 2>/dev/null; rm -r /run/aside; "
+                        "mountpoint -q $f"),
                   0);
     }
     ~Small() { shell("umount -n -l " + folder_); }

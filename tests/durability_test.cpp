@@ -141,7 +141,8 @@ TEST_F(Durability, TornRecord) {
     const std::string record = readFile(kRecord);
     for (const std::string &left :
          {std::string(), firstHalf(record), record.substr(0, record.size() - 3),
-          std::string(record.size(), '\0'), record + "more"}) {
+          std::string(record.size(), '\0'), record + "more",
+          std::string(9, '\0') + record.substr(9)}) {
         start_->restore();
         writeFile(kRecord, left);
         shell("touch /etc/crontab.cutOff; touch -d '100 seconds ago' " + std::string(kRecord));

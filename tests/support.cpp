@@ -131,7 +131,7 @@ void recorded(const std::string &sql, bool untilKilled) {
     sqlite3 *database = nullptr;
     ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
     EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK) << sql;
-    while (untilKilled) {
+    if (untilKilled) {
         writeFile("/tmp/held", "");
         ::pause();
     }

@@ -1,5 +1,5 @@
 // The registry of backends, the task operations that dispatch to them, and the plug-in hooks.
-#include "arrange.h"
+#include "machine.h"
 
 namespace {
 

@@ -1,6 +1,6 @@
 // Several changes as one.
-#include "arrange.h"
 #include "machine.h"
+#include "tavisdk.h"
 
 #include <array>
 #include <functional>
@@ -103,14 +103,18 @@ TEST_F(Batch, BesideDamagedSections) {
 }
 
 TEST_F(Batch, OfMorePowerSchedulesThanAreRead) {
-    shell("{ echo '[power off]'; for i in $(seq 0 99); do printf '%03d=0 1 %d %d\n' $i "
-          "$((i / 60)) $((i % 60)); done; } > /usr/tavi/etc/auto_power");
-    ASSERT_EQ(TAVISchedChangeBegin(), 0);
-    for (int minute = 0; minute < 3; ++minute) {
-        EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 20, minute).get()), 0);
+    for (const bool isBatch : {false, true}) {
+        shell("{ echo '[power off]'; for i in $(seq 0 99); do printf '%03d=0 1 %d %d\n' $i "
+              "$((i / 60)) $((i % 60)); done; } > /usr/tavi/etc/auto_power");
+        EXPECT_EQ(isBatch ? TAVISchedChangeBegin() : 0, 0);
+        for (int minute = 0; minute < 3; ++minute) {
+            EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 20, minute).get()), 0);
+        }
+        EXPECT_EQ(isBatch ? TAVISchedChangeCommit() : 0, 0);
+        EXPECT_THAT(readFile(kPower), HasSubstr("099=0 1 1 39\n100=1 127 20 2\n"));
     }
-    EXPECT_EQ(TAVISchedChangeCommit(), 0);
-    EXPECT_THAT(readFile(kPower), HasSubstr("099=0 1 1 39\n100=1 127 20 2\n"));
+    std::vector<TAVIAUTOPOWER> entries(200);
+    EXPECT_EQ(TAVIAutoPowerConfGet(TAVI_AUTOPOWER_KIND_OFF, 200, entries.data()), 100);
 }
 
 // A handler's PRE phase runs with each change, its POST phase at the end, with the batch's result.
@@ -136,17 +140,13 @@ TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     // One that waits for the end of the batch changes tasks like any other process.
     std::array<int, 2> ends{};
     ASSERT_EQ(pipe(ends.data()), 0);
-    const pid_t later = fork();
-    if (later == 0) {
+    const pid_t later = start([&] {
         char byte = 0;
-        const bool read = ::read(ends[0], &byte, 1) == 1;
-        _exit(read && TAVISchedTaskCreate(newTask().get()) == 0 ? 0 : 1);
-    }
+        return read(ends[0], &byte, 1) == 1 && TAVISchedTaskCreate(newTask().get()) == 0 ? 0 : 1;
+    });
     EXPECT_EQ(TAVISchedChangeCommit(), 0);
     EXPECT_EQ(write(ends[1], "x", 1), 1);
-    int status = -1;
-    waitpid(later, &status, 0);
-    EXPECT_EQ(status, 0);
+    EXPECT_EQ(exitOf(later), 0);
     EXPECT_THAT(listedIds(), ElementsAre(1, 2, 3));
     close(ends[0]);
     close(ends[1]);

@@ -48,15 +48,6 @@ TEST_F(Dates, ParseTakesTheFormAndNoRange) {
     EXPECT_EQ(lastLog(), "sched_util.cpp:* Bad time format: [7.5]");
 }
 
-TEST_F(Dates, CompareLooksAtTheDayAlone) {
-    const TAVI_SCHED_DATE early{2023, 12, 31, 1, 9, 0};
-    TAVI_SCHED_DATE late{2024, 2, 1, 0, 0, 0};
-    EXPECT_EQ(TAVISchedDateComp(&early, &late), -1);
-    EXPECT_EQ(TAVISchedDateComp(&late, &early), 1);
-    late = {2023, 12, 31, 5, 1, 7};
-    EXPECT_EQ(TAVISchedDateComp(&early, &late), 0);
-}
-
 TEST_F(Dates, NormalizeCarries) {
     const auto normalized = [](TAVI_SCHED_DATE date) {
         return TAVISchedDateNormalize(&date) == 0 ? text(date) : "failed, " + text(date);

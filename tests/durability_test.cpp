@@ -3,7 +3,6 @@
 #include "machine.h"
 #include "tracer.h"
 
-#include <algorithm>
 #include <filesystem>
 #include <functional>
 #include <sys/statvfs.h>
@@ -43,17 +42,17 @@ std::string shown(const tracer::Call &call) {
 
 TEST_F(Durability, OrderOfFlushesAndRenames) {
     std::vector<std::string> order;
-    const auto run = tracer::run(
-        [] { return created("new"); }, {},
-        [&](const tracer::Call &call) {
-            const bool isFlush = call.name == "fsync" || call.name.starts_with("rename");
-            const bool overwrites = call.isPrograms && call.name == "openat" &&
-                                    (call.path == kPersistent || call.path == kWorking ||
-                                     call.path.starts_with(kScratch));
-            if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
-                order.push_back(shown(call));
-            }
-        });
+    const auto note = [&](const tracer::Call &call, size_t) {
+        const bool isFlush = call.name == "fsync" || call.name.starts_with("rename");
+        const bool overwrites =
+            call.isPrograms && call.name == "openat" &&
+            (call.path == kPersistent || call.path == kWorking || call.path.starts_with(kScratch));
+        if (overwrites || (isFlush && !call.path.starts_with("/tmp/"))) {
+            order.push_back(shown(call));
+        }
+        return false;
+    };
+    const auto run = tracer::run([] { return created("new"); }, {.isPoint = note});
     EXPECT_EQ(run.status, 0);
     const std::string record = kRecord;
     EXPECT_THAT(order,
@@ -67,10 +66,16 @@ TEST_F(Durability, OrderOfFlushesAndRenames) {
 // ---- Loss of power ----
 
 // Stops a create for good at the first call that the predicate wants.
-void cutOff(const std::function<bool(const tracer::Call &)> &isWanted) {
+void cutOff(const tracer::Wanted &isWanted) {
     const auto run = tracer::run([] { return created("new"); },
                                  {.act = tracer::Act::KillAll, .isPoint = isWanted});
     EXPECT_TRUE(run.acted) << "it was not cut off";
+}
+
+// A program is about to write to the path.
+tracer::Wanted isCopyTo(const char *path) {
+    return
+        [path](const tracer::Call &call, size_t) { return call.isPrograms && call.path == path; };
 }
 
 std::string firstHalf(const std::string &text) {
@@ -78,45 +83,48 @@ std::string firstHalf(const std::string &text) {
 }
 
 TEST_F(Durability, LossOfPower) {
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
+    const State old = stateNow(listOfFreshProcess());
     ASSERT_EQ(inChild([] { return created("new"); }), 0);
-    const State stored = stateNow();
-    const std::string storedList = listOfFreshProcess();
+    const State stored = stateNow(listOfFreshProcess());
 
-    using Text = std::function<std::string(const std::string &)>;
-    const std::vector<std::pair<const char *, Text>> losses = {
-        {"kept", [](const std::string &text) { return text; }},
-        {"empty", [](const std::string &) { return ""; }},
-        {"torn", firstHalf},
-        {"zeros", [](const std::string &text) { return std::string(text.size(), '\0'); }}};
-    const std::vector<std::pair<const char *, int (*)()>> nexts = {
+    const std::vector<std::pair<const char *, void (*)(const std::string &)>> losses = {
+        {"kept", [](const std::string &) {}},
+        {"empty", [](const std::string &path) { writeFile(path, ""); }},
+        {"torn", [](const std::string &path) { writeFile(path, firstHalf(readFile(path))); }},
+        {"zeros",
+         [](const std::string &path) {
+             writeFile(path, std::string(readFile(path).size(), '\0'));
+         }},
+        {"gone", [](const std::string &path) { unlink(path.c_str()); }}};
+    const std::vector<std::pair<std::string, int (*)()>> nexts = {
         {"list", [] { return listOfFreshProcess() == "failed" ? 1 : 0; }},
         {"create", [] { return created("new"); }},
-        {"sync", [] { return TAVISchedTaskSync() == 0 ? 0 : 1; }}};
-    const std::vector<std::pair<const char *, std::function<bool(const tracer::Call &)>>> moments =
-        {{"before the copies",
-          [](const tracer::Call &call) { return call.isPrograms && call.path == kPersistent; }},
-         {"before the record goes", [](const tracer::Call &call) {
-              return call.name.starts_with("rename") && call.path == kRecord;
-          }}};
+        {"sync", TAVISchedTaskSync},
+        {"start", TAVISchedStart}};
+    const std::vector<std::pair<const char *, tracer::Wanted>> moments = {
+        {"before the copies", isCopyTo(kPersistent)},
+        {"between the copies", isCopyTo(kWorking)},
+        {"before the record goes", [](const tracer::Call &call, size_t) {
+             return call.name.starts_with("rename") && call.path == kRecord;
+         }}};
     size_t state = 0;
     Tally tally("durability: loss of power");
     for (const auto &[moment, isWanted] : moments) {
-        for (const auto &[persistentLoss, persistent] : losses) {
-            for (const auto &[workingLoss, working] : losses) {
+        for (const auto &[persistentLoss, losePersistent] : losses) {
+            for (const auto &[workingLoss, loseWorking] : losses) {
                 for (const auto &[name, next] : nexts) {
                     if (state++ % kStep != 0) {
                         continue;
                     }
                     start_->restore();
                     cutOff(isWanted);
-                    writeFile(kPersistent, persistent(readFile(kPersistent)));
-                    writeFile(kWorking, working(readFile(kWorking)));
+                    losePersistent(kPersistent);
+                    loseWorking(kWorking);
                     const int answer = inChild(next);
-                    const bool isCreate = name == std::string("create");
-                    const bool isRight = answer == 0 && stateNow() == (isCreate ? stored : old) &&
-                                         listOfFreshProcess() == (isCreate ? storedList : oldList);
+                    const State &wanted = name == "create" ? stored : old;
+                    const std::string &list = wanted.at("list");
+                    const bool isRight =
+                        answer == 0 && stateNow(list) == wanted && listOfFreshProcess() == list;
                     tally.add(std::string(moment) + ", persistent file " + persistentLoss +
                                   ", working copy " + workingLoss + ", then " + name,
                               isRight ? "" : std::to_string(answer));
@@ -129,11 +137,12 @@ TEST_F(Durability, LossOfPower) {
 // Nothing was overwritten while the record was not whole.
 TEST_F(Durability, TornRecord) {
     const State old = stateNow();
-    cutOff([](const tracer::Call &call) { return call.isPrograms && call.path == kPersistent; });
+    cutOff(isCopyTo(kPersistent));
     const std::string record = readFile(kRecord);
     for (const std::string &left :
          {std::string(), firstHalf(record), record.substr(0, record.size() - 3),
-          std::string(record.size(), '\0'), record + "more"}) {
+          std::string(record.size(), '\0'), record + "more",
+          std::string(9, '\0') + record.substr(9)}) {
         start_->restore();
         writeFile(kRecord, left);
         shell("touch /etc/crontab.cutOff; touch -d '100 seconds ago' " + std::string(kRecord));
@@ -148,14 +157,12 @@ TEST_F(Durability, TornRecord) {
 // A small file system over a folder, with what was in it.
 class Small {
   public:
-    explicit Small(const char *folder) : folder_(folder) {
-        const std::string path = folder_;
-        EXPECT_EQ(shell("mkdir -p /run/aside && cp -a " + path +
-                        "/. /run/aside && mount -n -t tmpfs -o " +
-                        "size=400k,nr_inodes=200,mode=1777 small " + path +
-                        " && cp -a /run/aside/crontab* /run/aside/scheduled* /run/aside/auto* " +
-                        path + " 2>/dev/null; rm -r /run/aside; mountpoint -q " + path +
-                        (path == "/tmp" ? "" : " && chmod 755 " + path)),
+    explicit Small(std::string folder) : folder_(std::move(folder)) {
+        EXPECT_EQ(shell("f=" + folder_ +
+                        "; mkdir /run/aside && cp -a $f/. /run/aside && mount -n -t tmpfs -o "
+                        "size=400k,nr_inodes=200,mode=$(stat -c %a $f) small $f && cd /run/aside "
+                        "&& cp -a crontab* scheduled* auto* $f 2>/dev/null; rm -r /run/aside; "
+                        "mountpoint -q $f"),
                   0);
     }
     ~Small() { shell("umount -n -l " + folder_); }
@@ -183,16 +190,8 @@ class Small {
     std::string folder_;
 };
 
-struct Full {
-    const char *name;
-    const char *folder;
-    bool inodes;
-    int (*operation)();
-    bool isBatch;
-};
-
 int editedHere() {
-    return edited("edited", std::string(9000, 'y'));
+    return edited("edited", std::string(9000, 'y').c_str());
 }
 
 int batch() {
@@ -203,60 +202,56 @@ int batch() {
 }
 
 // With less and less in the way, until the change succeeds: it is whole or not there, and the tasks
-// can be listed while everything is full.
+// can be listed while everything is full. Outside of a batch the crontab may stay behind.
+void expectWholeChanges(const Snapshot &start, const std::string &folder, bool inodes,
+                        bool isBatch) {
+    int (*const operation)() = isBatch ? batch : editedHere;
+    start.restore();
+    const State old = stateNow(listOfFreshProcess());
+    ASSERT_EQ(inChild(operation), 0);
+    const State stored = stateNow(listOfFreshProcess());
+    start.restore();
+    Small small(folder);
+    Tally tally(std::string("durability: ") + (isBatch ? "batch" : "edit") + " with " + folder +
+                " full of " + (inodes ? "inodes" : "bytes"));
+    bool done = false;
+    for (size_t rest = 0; rest < 60 && !done; rest += kStep) {
+        small.free();
+        start.restore();
+        small.fill(rest, inodes);
+        logs();
+        const int answer = inChild(operation);
+        const std::string fullList = listOfFreshProcess();
+        small.free();
+        State now = stateNow(listOfFreshProcess());
+        done = now == stored;
+        if (answer == 0 && !isBatch && now[kCrontab] == old.at(kCrontab)) {
+            now[kCrontab] = stored.at(kCrontab);
+        }
+        const bool isRight = now == (answer == 0 ? stored : old) && fullList == now.at("list");
+        tally.add(std::to_string(rest) + " left", isRight ? "" : std::to_string(answer));
+    }
+    EXPECT_TRUE(done);
+}
+
 TEST_F(Durability, FullFileSystems) {
-    std::vector<Full> cases;
     for (const char *const folder : {"/usr/tavi/etc", "/tmp", "/etc"}) {
         for (const bool inodes : {false, true}) {
-            cases.push_back({"edit", folder, inodes, editedHere, false});
-            cases.push_back({"batch", folder, inodes, batch, true});
+            expectWholeChanges(*start_, folder, inodes, false);
+            expectWholeChanges(*start_, folder, inodes, true);
         }
-    }
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
-    for (const Full &full : cases) {
-        start_->restore();
-        ASSERT_EQ(inChild(full.operation), 0);
-        const State stored = stateNow();
-        const std::string storedList = listOfFreshProcess();
-        start_->restore();
-        Small small(full.folder);
-        Tally tally(std::string("durability: ") + full.name + " with " + full.folder + " full of " +
-                    (full.inodes ? "inodes" : "bytes"));
-        bool done = false;
-        for (size_t rest = 0; rest < 60 && !done; rest += kStep) {
-            small.free();
-            start_->restore();
-            small.fill(rest, full.inodes);
-            logs();
-            const int answer = inChild(full.operation);
-            const std::string fullList = listOfFreshProcess();
-            small.free();
-            const std::string list = listOfFreshProcess();
-            State now = stateNow();
-            const bool isOld = now == old && list == oldList && fullList == list;
-            done = now == stored;
-            const std::string crontab = std::exchange(now[kCrontab], stored.at(kCrontab));
-            const bool mayBeBehind = !full.isBatch && crontab == old.at(kCrontab);
-            const bool isStored =
-                now == stored && list == storedList && fullList == list && (done || mayBeBehind);
-            const bool isRight = answer == 0 ? isStored : isOld;
-            tally.add(std::to_string(rest) + " left", isRight ? "" : std::to_string(answer));
-        }
-        EXPECT_TRUE(done);
     }
 }
 
 // A working copy that cannot be restored for lack of room is not read, and nothing is changed.
 TEST_F(Durability, TornWorkingCopyWithoutRoom) {
-    const State old = stateNow();
-    const std::string oldList = listOfFreshProcess();
+    const State old = stateNow(listOfFreshProcess());
     Small small("/tmp");
-    cutOff([](const tracer::Call &call) { return call.isPrograms && call.path == kWorking; });
+    cutOff(isCopyTo(kWorking));
     writeFile(kWorking, "");
     shell("rm /tmp/scheduled_tasks.tmp*"); // that would be room enough
     small.fill(0, false);
-    EXPECT_EQ(listOfFreshProcess(), oldList);
+    EXPECT_EQ(listOfFreshProcess(), old.at("list"));
     EXPECT_EQ(inChild([] {
                   TAVI_SCHED_TASK task{};
                   return TAVISchedTaskGetByID(3, &task) == 0 && task.id == 3 ? 0 : 1;
@@ -267,8 +262,7 @@ TEST_F(Durability, TornWorkingCopyWithoutRoom) {
     EXPECT_EQ(readFile(kPersistent), persistent);
     EXPECT_TRUE(fs::exists(kRecord));
     small.free();
-    EXPECT_EQ(listOfFreshProcess(), oldList);
-    EXPECT_EQ(stateNow(), old);
+    EXPECT_EQ(stateNow(listOfFreshProcess()), old);
     EXPECT_THAT(leftovers(), IsEmpty());
 }
 

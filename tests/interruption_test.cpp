@@ -19,6 +19,8 @@
 namespace {
 
 using namespace support;
+using tracer::Act;
+using tracer::Call;
 
 // ---- Operations ----
 
@@ -234,8 +236,7 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
         signal(SIGHUP, SIG_IGN);
         // Of programs; leaks cannot be looked for under a tracer.
         setenv("ASAN_OPTIONS",
-               "abort_on_error=1:detect_leaks=0:verify_asan_link_order=0:"
-               "alloc_dealloc_mismatch=0",
+               "abort_on_error=1:detect_leaks=0:verify_asan_link_order=0:alloc_dealloc_mismatch=0",
                1);
         fakes.now = time(nullptr);
         ASSERT_EQ(created("one"), 0);
@@ -249,7 +250,7 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
         writeFile("/run/crond.pid", std::to_string(getpid()));
         GetParam().prepare();
         start_.emplace();
-        old_ = found();
+        old_ = stateNow(listOfFreshProcess());
         new_ = half_ = learn(GetParam().run);
         half_[kCrontab] = old_[kCrontab];
         instead_ = GetParam().instead ? learn(GetParam().instead) : State();
@@ -278,42 +279,35 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
 
     // Of the calls that matter those with these properties.
     std::vector<size_t> pointsOf(tracer::Calls calls, size_t most,
-                                 const std::function<bool(const tracer::Call &)> &concerned) const {
+                                 const std::function<bool(const Call &)> &concerned) const {
         std::vector<size_t> points;
-        size_t point = 0;
-        start_->restore();
-        tracer::run(GetParam().run, {.calls = calls}, [&](const tracer::Call &call) {
-            ++point;
+        const auto note = [&](const Call &call, size_t point) {
             if (concerned(call)) {
                 points.push_back(point);
             }
-        });
+            return false;
+        };
+        start_->restore();
+        tracer::run(GetParam().run, {.calls = calls, .isPoint = note});
         return chosen(points, most);
     }
 
     std::optional<Snapshot> start_;
 
   private:
-    static State found() {
-        const std::string list = listOfFreshProcess();
-        State state = stateNow();
-        state["list"] = list;
-        return state;
-    }
-
     // What an operation that nothing disturbs leaves.
     State learn(const std::function<int()> &operation) const {
         start_->restore();
-        const auto answer = tryOf(tracer::run(operation, {})).answer;
+        const auto answer = tryOf(tracer::run(operation)).answer;
         EXPECT_TRUE(answer == 0 || answer == kInstead) << lastLog();
         EXPECT_THAT(leftovers(), IsEmpty());
-        return found();
+        return stateNow(listOfFreshProcess());
     }
 
     std::string faultsAfter(std::optional<int> answer, End end) const {
         const bool mayBeHalf = end != End::Cut;
         const State before = stateNow();
-        State now = found();
+        State now = stateNow(listOfFreshProcess());
         const bool isOld = now == old_;
         const bool isNew = now == new_ || (mayBeHalf && !GetParam().isBatch && now == half_);
         const bool isRight = !answer               ? isOld || now == new_
@@ -321,17 +315,17 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
                              : *answer == kInstead ? now == instead_
                              : *answer == 1 ? isOld || (mayBeHalf && GetParam().isPower && isNew)
                                             : false;
-        std::string faults =
-            isRight ? "" : " the answer was " + std::to_string(answer.value_or(-1)) + ";";
-        for (const auto &[path, content] : now) {
-            const bool was = content == old_.at(path);
-            faults += isRight ? ""
-                              : " " + path +
-                                    (was                        ? " old"
-                                     : content == new_.at(path) ? " new"
-                                                                : " STRANGE " + content);
+        std::string faults;
+        if (!isRight) {
+            faults = " the answer was " + std::to_string(answer.value_or(-1)) + ";";
+            for (const auto &[path, content] : now) {
+                faults += " " + path +
+                          (content == old_.at(path)   ? " old"
+                           : content == new_.at(path) ? " new"
+                                                      : " STRANGE " + content);
+            }
         }
-        now.erase("list");
+        now["list"] = "";
         faults += end == End::Failure && before != now ? " the list changed something;" : "";
         return faults + (GetParam().faults && answer ? GetParam().faults(*answer) : "");
     }
@@ -344,24 +338,22 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
 constexpr size_t kMostKills = kStep == 1 ? 99 : 3;
 
 TEST_P(Interruption, Killed) {
-    using tracer::Act;
-    using tracer::Call;
-    const auto always = [](const Call &) { return true; };
     const auto isPrograms = [](const Call &call) { return call.isPrograms; };
-    const auto isWrite = [](const Call &call) { return tracer::kCanChangeCalls && call.isWrite; };
     const struct {
         const char *what;
         Act act;
         std::function<bool(const Call &)> concerned;
-    } rows[] = {{"all processes killed", Act::KillAll, always},
+    } rows[] = {{"all processes killed", Act::KillAll, [](const Call &) { return true; }},
                 // With no program there, the caller is all.
                 {"caller killed", Act::KillCaller, isPrograms},
                 {"program killed", Act::KillProgram, isPrograms},
-                {"half a write", Act::HalfThenKillAll, isWrite}};
+                {"half a write", Act::HalfThenKillAll,
+                 [](const Call &call) { return tracer::kCanChangeCalls && call.isWrite; }}};
     for (const auto &row : rows) {
         tryAll(row.what, pointsOf(tracer::Calls::Changing, kMostKills, row.concerned), End::Cut,
                [&](size_t point) {
-                   return tryOf(tracer::run(GetParam().run, {.point = point, .act = row.act}));
+                   return tryOf(
+                       tracer::run(GetParam().run, {.act = row.act, .isPoint = tracer::at(point)}));
                });
     }
 }
@@ -373,20 +365,20 @@ TEST_P(TakingBack, Killed) {
     constexpr size_t kCuts = 4;
     const auto takeBack = [] { return listOfFreshProcess() == "failed" ? 1 : 0; };
     start_->restore();
-    const size_t points = tracer::run(GetParam().run, {}).points;
+    const size_t points = tracer::run(GetParam().run).points;
     for (size_t cut = 1; cut <= kCuts; ++cut) {
         const auto cutOff = [&] {
             start_->restore();
             tracer::run(GetParam().run,
-                        {.point = cut * points / kCuts, .act = tracer::Act::KillAll});
+                        {.act = Act::KillAll, .isPoint = tracer::at(cut * points / kCuts)});
         };
         cutOff();
-        const auto all = upTo(tracer::run(takeBack, {}).points);
+        const auto all = upTo(tracer::run(takeBack).points);
         tryAll("killed, and killed again while taken back", chosen(all, kMostKills), End::Cut,
                [&](size_t point) {
                    cutOff();
-                   Try tried =
-                       tryOf(tracer::run(takeBack, {.point = point, .act = tracer::Act::KillAll}));
+                   Try tried = tryOf(
+                       tracer::run(takeBack, {.act = Act::KillAll, .isPoint = tracer::at(point)}));
                    tried.answer.reset();
                    return tried;
                });
@@ -396,7 +388,7 @@ TEST_P(TakingBack, Killed) {
 // ---- Failing ----
 
 // Those of a program's libraries and of its start are not ours.
-bool isOurs(const tracer::Call &call) {
+bool isOurs(const Call &call) {
     constexpr std::array<const char *, 5> kPlaces = {"/tmp", "/usr/tavi", "/etc/crontab", "/run",
                                                      "/var/lib/tavischeduler"};
     return call.path.empty() || call.path == "/etc/" ||
@@ -404,35 +396,27 @@ bool isOurs(const tracer::Call &call) {
                        [&](const char *place) { return call.path.starts_with(place); });
 }
 
-// What an operation may fail with; also what the platform's functions set.
-bool isDocumented(unsigned int code) {
-    const std::array<unsigned int, 12> codes = {0x0100, 0x0200, 0x0400, 0x0500, 0x0900, 0x0B00,
-                                                0x0D00, 0x2000, 0x2700, 0x2800, 0x2A00, 0x4000};
-    return std::find(codes.begin(), codes.end(), code) != codes.end();
-}
-
 int answer() {
+    // What an operation may fail with; also what the platform's functions set.
+    constexpr std::array<unsigned int, 12> kCodes = {0x0100, 0x0200, 0x0400, 0x0500,
+                                                     0x0900, 0x0B00, 0x0D00, 0x2000,
+                                                     0x2700, 0x2800, 0x2A00, 0x4000};
     PLATCErrSetEx(0, "", 0);
     const int answer = testing::WithParamInterface<Operation>::GetParam().run();
-    return answer == 1 && !isDocumented(PLATCErrGet()) ? 3 : answer;
+    const bool isKnown = std::find(kCodes.begin(), kCodes.end(), PLATCErrGet()) != kCodes.end();
+    return answer == 1 && !isKnown ? 3 : answer;
 }
 
 // The same in a process of its own, when all that this has started has ended; more than 9 when one
 // of them crashes, or it throws or leaks.
 int answerInChild() {
-    const pid_t child = fork();
-    if (child == 0) {
-        int answered = 10;
-        try {
-            answered = answer();
-        } catch (const std::exception &) {
-            _exit(answered);
-        }
+    const pid_t child = start([]() noexcept {
+        int answered = answer();
 #ifdef __SANITIZE_ADDRESS__
         answered = __lsan_do_recoverable_leak_check() == 0 ? answered : 10;
 #endif
-        _exit(answered);
-    }
+        return answered;
+    });
     int answered = 0;
     int status = 0;
     for (pid_t ended = 0; (ended = wait(&status)) > 0;) {
@@ -443,12 +427,14 @@ int answerInChild() {
 }
 
 Try failSystemCall(size_t point) {
-    tracer::Plan plan{.calls = tracer::Calls::Failing, .point = point, .act = tracer::Act::Fail};
-    const auto run = tracer::run(answer, plan, [&](const tracer::Call &call) {
+    tracer::Plan plan{.calls = tracer::Calls::Failing, .act = Act::Fail};
+    plan.isPoint = [&](const Call &call, size_t number) {
         constexpr std::array<int, 3> kOpening = {ENOSPC, EMFILE, EACCES};
         constexpr std::array<int, 3> kOthers = {EIO, ENOMEM, ENOSPC};
         plan.error = (call.name.starts_with("open") ? kOpening : kOthers)[point % 3];
-    });
+        return number == point;
+    };
+    const auto run = tracer::run(answer, plan);
     if (run.call.name == "unlink") {
         unlink(run.call.path.c_str()); // what cannot be removed stays
     }

@@ -1,13 +1,12 @@
 // A machine's task files as a whole.
 #include "machine.h"
 
-#include <algorithm>
-#include <array>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
-#include <fcntl.h>
 #include <filesystem>
 #include <numeric>
+#include <set>
 #include <sstream>
 
 namespace support {
@@ -24,24 +23,28 @@ std::vector<std::string> entriesOf(const char *folder) {
     return paths;
 }
 
+std::vector<std::string> filesOfTasksAndRuns() {
+    std::vector<std::string> paths = entriesOf("/var/lib/tavischeduler");
+    for (const std::string path : {kWorking, kPersistent, kPower, kCrontab, kStatus}) {
+        paths.push_back(path);
+    }
+    std::erase_if(paths, [](const std::string &path) { return !fs::is_regular_file(path); });
+    return paths;
+}
+
 std::string sortedLines(const std::string &text) {
-    std::vector<std::string> lines;
     std::istringstream stream(text);
+    std::multiset<std::string> lines;
     for (std::string line; std::getline(stream, line);) {
-        lines.push_back(line);
+        lines.insert(line + "\n");
     }
-    std::sort(lines.begin(), lines.end());
-    std::string sorted;
-    for (const std::string &line : lines) {
-        sorted += line + "\n";
-    }
-    return sorted;
+    return std::accumulate(lines.begin(), lines.end(), std::string());
 }
 
 } // namespace
 
-State stateNow() {
-    State state;
+State stateNow(const std::string &list) {
+    State state = {{"list", list}};
     for (const char *const path : {kWorking, kPersistent, kPower, kCrontab}) {
         state[path] = fs::exists(path) ? readFile(path) : "(none)";
     }
@@ -67,22 +70,9 @@ std::vector<std::string> leftovers() {
     return found;
 }
 
-namespace {
-
-std::vector<std::string> filesOfTasksAndRuns() {
-    std::vector<std::string> paths = entriesOf("/var/lib/tavischeduler");
-    for (const std::string path : {kWorking, kPersistent, kPower, kCrontab, kStatus}) {
-        paths.push_back(path);
-    }
-    std::erase_if(paths, [](const std::string &path) { return !fs::is_regular_file(path); });
-    return paths;
-}
-
-} // namespace
-
 Snapshot::Snapshot() {
     for (const std::string &path : filesOfTasksAndRuns()) {
-        files_[path] = {readFile(path), statusOf(path.c_str()).st_mtim};
+        files_[path] = {readFile(path), fs::last_write_time(path)};
     }
 }
 
@@ -97,14 +87,11 @@ void Snapshot::restore() const {
         }
     }
     for (const auto &[path, file] : files_) {
-        writeFile(path, file.content);
-        const std::array<timespec, 2> times = {file.time, file.time};
-        utimensat(AT_FDCWD, path.c_str(), times.data(), 0);
+        writeFile(path, file.first);
+        fs::last_write_time(path, file.second);
     }
     // A new crontab is later than the old one: with the same calls whatever the second is.
-    const std::array<timespec, 2> later = {
-        {{.tv_sec = 0, .tv_nsec = UTIME_OMIT}, {.tv_sec = time(nullptr) + 60, .tv_nsec = 0}}};
-    utimensat(AT_FDCWD, kCrontab, later.data(), 0);
+    fs::last_write_time(kCrontab, fs::file_time_type::clock::now() + std::chrono::minutes(1));
 }
 
 Tally::~Tally() {
@@ -141,73 +128,42 @@ std::vector<size_t> upTo(size_t count) {
 }
 
 std::string listOfFreshProcess() {
-    std::array<int, 2> ends{};
-    if (pipe(ends.data()) != 0) {
-        return "no pipe";
-    }
-    const pid_t pid = fork();
-    if (pid == 0) {
+    const std::string path = "/home/list"; // where there is room
+    const int status = inChild([&] {
         TAVI_SCHED_TASK *list = nullptr;
-        std::vector<std::string> rows;
-        const bool listed = TAVISchedTaskListGet(&list, nullptr) >= 0;
+        std::multiset<std::string> rows;
+        if (TAVISchedTaskListGet(&list, nullptr) < 0) {
+            rows.insert("failed");
+        }
         for (const TAVI_SCHED_TASK *task = list; task; task = TAVISchedTaskNext(task)) {
-            rows.push_back(std::to_string(task->id) + " " + task->name + " " + task->command);
+            rows.insert(std::to_string(task->id) + " " + task->name + " " + task->command + "; ");
         }
-        std::sort(rows.begin(), rows.end());
-        std::string text = listed ? "" : "failed";
-        for (const std::string &row : rows) {
-            text += row + "; ";
-        }
-        _exit(write(ends[1], text.data(), text.size()) == static_cast<ssize_t>(text.size()) ? 0
-                                                                                            : 1);
-    }
-    close(ends[1]);
-    std::string text;
-    std::array<char, 4096> buffer{};
-    for (ssize_t count = 0; (count = read(ends[0], buffer.data(), buffer.size())) > 0;) {
-        text.append(buffer.data(), static_cast<size_t>(count));
-    }
-    close(ends[0]);
-    int status = -1;
-    waitpid(pid, &status, 0);
-    return status == 0 ? text : text + " (list: wait status " + std::to_string(status) + ")";
+        writeFile(path, std::accumulate(rows.begin(), rows.end(), std::string()));
+        return 0;
+    });
+    return status == 0 ? readFile(path) : "crashed";
 }
 
 int created(const char *name, const char *command) {
     const Task task = newTask(command);
-    if (!task) {
-        return 1;
-    }
     TAVISchedCTaskSetName(task.get(), name);
-    return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
+    return task && TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
 }
 
-int edited(const char *name, const std::string &command) {
+int edited(const char *name, const char *command) {
     TAVI_SCHED_TASK task{};
     if (TAVISchedTaskGetByID(2, &task) != 0) {
         return 1;
     }
     TAVISchedCTaskSetName(&task, name);
+    TAVISchedCTaskSetCommand(&task, command);
     task.runHour = 7;
-    if (!command.empty()) {
-        TAVISchedCTaskSetCommand(&task, command.c_str());
-    }
     return TAVISchedTaskEdit(&task) == 0 ? 0 : 1;
 }
 
-int powerCreated(uint32_t hour) {
-    const Task task = newTask();
-    if (!task) {
-        return 1;
-    }
-    task->backend = TAVI_SCHED_BACKEND_AUTOPOWER;
-    {
-        const OwnAllocations own;
-        TAVISchedTaskGetDefault(task.get());
-    }
-    TAVISchedCTaskSetAppArgs(task.get(), "poweroff");
-    task->runHour = hour;
-    return TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
+int powerCreated(int hour) {
+    const Task task = powerTask("poweroff", hour);
+    return task && TAVISchedTaskCreate(task.get()) == 0 ? 0 : 1;
 }
 
 } // namespace support

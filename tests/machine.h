@@ -1,9 +1,10 @@
-// A machine's task files as a whole: what they hold, what does not belong beside them, and the same
-// machine again for the next try.
+// What tests put on a machine, and its task files as a whole: what they hold, what does not belong
+// beside them, and the same machine again for the next try.
 #pragma once
 
 #include "support.h"
 
+#include <filesystem>
 #include <map>
 
 namespace support {
@@ -19,10 +20,38 @@ constexpr const char *kPower = "/usr/tavi/etc/auto_power";
 constexpr const char *kStatus = "/tmp/sched_status.sqlite";
 constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
 
+// A handler of changes of tasks, or of another plug-in, from the lines of a shell script.
+inline void addHandler(const std::string &name, const std::string &script, mode_t mode = 0755,
+                       const std::string &plugin = "task_scheduler") {
+    const std::string folder = "/usr/tavi/etc/plugins/" + plugin;
+    const std::string path = folder + "/" + name;
+    EXPECT_EQ(shell("mkdir -p " + folder), 0);
+    writeFile(path, "#!/bin/sh\n" + script + "\n");
+    chmod(path.c_str(), mode);
+}
+
+// A new power schedule of every day: "poweron" or "poweroff".
+inline Task powerTask(const char *kind, int hour = 0, int minute = 0) {
+    const OwnAllocations own;
+    Task task = newTask();
+    TAVISchedCTaskSetBackend(task.get(), TAVI_SCHED_BACKEND_AUTOPOWER);
+    TAVISchedTaskGetDefault(task.get());
+    TAVISchedCTaskSetAppArgs(task.get(), kind);
+    TAVISchedCTaskSetRunHour(task.get(), hour);
+    TAVISchedCTaskSetRunMin(task.get(), minute);
+    return task;
+}
+
+// The row of a run of task 1 that goes on, with which its every other run conflicts.
+inline void addRunning() {
+    query("INSERT INTO task_status (pid, timestamp, app, task_id, status_code) VALUES (" +
+          std::to_string(getpid()) + ", 1, '', 1, 2)");
+}
+
 // By path; a file that is not there is "(none)", and the crontab's lines are sorted: they may
-// change places.
+// change places. With "list", what a process that has just started lists.
 using State = std::map<std::string, std::string>;
-State stateNow();
+State stateNow(const std::string &list = "");
 
 // What is in the folders of these files and does not belong there.
 std::vector<std::string> leftovers();
@@ -34,11 +63,7 @@ class Snapshot {
     void restore() const;
 
   private:
-    struct File {
-        std::string content;
-        timespec time;
-    };
-    std::map<std::string, File> files_;
+    std::map<std::string, std::pair<std::string, std::filesystem::file_time_type>> files_;
 };
 
 // So many of something were tried, and how many held; told and checked when it ends.
@@ -64,21 +89,14 @@ std::vector<size_t> upTo(size_t count);
 // What a process that has just started lists: "id name command; ...", or "failed".
 std::string listOfFreshProcess();
 
-// Stores a task of that name, a power-off schedule: 0 or 1.
+// Stores a task of that name, task 2 with another one, a power-off schedule: 0 or 1.
 int created(const char *name, const char *command = "true");
-// Task 2 with another name, and a command when there is one.
-int edited(const char *name, const std::string &command = "");
-int powerCreated(uint32_t hour = 22);
+int edited(const char *name, const char *command = "true");
+int powerCreated(int hour = 22);
 
-// The result of a function in a process of its own, its exit status.
+// The result of a function in a process of its own.
 template <typename Function> int inChild(Function &&function) {
-    const pid_t pid = fork();
-    if (pid == 0) {
-        _exit(function());
-    }
-    int status = -1;
-    waitpid(pid, &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    return exitOf(start(function));
 }
 
 } // namespace support

@@ -1,5 +1,5 @@
 // Power-on and power-off schedules as tasks, next to ordinary tasks.
-#include "arrange.h"
+#include "machine.h"
 #include "tavisdk.h"
 
 namespace {
@@ -7,7 +7,6 @@ namespace {
 using namespace support;
 
 constexpr const char *kCheck = "/usr/tavi/bin/tavi_poweroff_feasible_check";
-constexpr const char *kConfiguration = "/usr/tavi/etc/auto_power";
 constexpr unsigned int kBackend = 1; // its row
 
 class Power : public SchedTest {
@@ -124,7 +123,7 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     // 263 must not become 7, a gap must not hide what is behind it.
     for (const std::string entry : {"000=1 2 3", "000=1 127 263 30", "000=-1 127 7 30",
                                     "000=1  2 3 4", "000=1 2 3 4 ", "001=1 2 3 4"}) {
-        writeFile(kConfiguration, "[power off]\n000=1 1 1 1\n[power on]\n" + entry + "\n");
+        writeFile(kPower, "[power off]\n000=1 1 1 1\n[power on]\n" + entry + "\n");
         EXPECT_EQ(failure(row_.list_get(&list, nullptr)), 0x4000U) << entry;
     }
 }
@@ -168,13 +167,13 @@ TEST_F(Power, WhatCannotBeLookedAtIsNotTakenForMissing) {
         EXPECT_EQ(TAVIAutoPowerConfGet(kind, 1, &entry), 0);
     }
     EXPECT_EQ(TAVIUpdateCrontab("true", 1, 1), 0);
-    for (const char *const path : {kConfiguration, "/var/run/crond.pid"}) {
+    for (const char *const path : {kPower, "/var/run/crond.pid"}) {
         EXPECT_EQ(symlink(path, path), 0); // a loop
     }
     EXPECT_EQ(failure(TAVIAutoPowerConfGet(TAVI_AUTOPOWER_KIND_ON, 1, &entry)), 0x2700U);
     EXPECT_EQ(failure(TAVIAutoPowerConfSet(TAVI_AUTOPOWER_KIND_ON, 1, &entry)), 0x2700U);
     EXPECT_EQ(failure(TAVIAutoPoweronSet()), 0x2700U);
-    EXPECT_TRUE(S_ISLNK(statusOf(kConfiguration).st_mode));
+    EXPECT_TRUE(S_ISLNK(statusOf(kPower).st_mode));
     EXPECT_EQ(failure(TAVIUpdateCrontab("true", 0, 1)), 0x2700U);
     EXPECT_THAT(lastLog(), HasSubstr("cron cannot be told: /var/run/crond.pid cannot be read"));
     EXPECT_EQ(readFile(kCrontab), kForeignCrontab);
@@ -194,15 +193,6 @@ TEST_F(Power, SchedulesAreWholeLinesThatCronTakes) {
     EXPECT_EQ(TAVIScheduleSet(&schedule, 1), 0);
     EXPECT_EQ(TAVIScheduleSet(&schedule, 0), 0); // not the one that only ends like it
     EXPECT_EQ(readFile(kCrontab), kForeignCrontab + ("15\t0\t*\t*\t*\troot\t" + longest + "\n"));
-}
-
-TEST_F(Power, AFullKindKeepsWhatItHas) {
-    std::vector<TAVIAUTOPOWER> entries(100, {0, 1, 2, 3});
-    TAVIAutoPowerConfSet(TAVI_AUTOPOWER_KIND_ON, 100, entries.data());
-    EXPECT_EQ(store("poweron", "1000000", 5, 5), 70010505);
-    EXPECT_THAT(readFile(kConfiguration), HasSubstr("\n100=1 1 5 5\n"));
-    EXPECT_EQ(TAVIAutoPowerConfGet(TAVI_AUTOPOWER_KIND_ON, 1000, entries.data()), 100);
-    EXPECT_EQ(listedIds().size(), 100U);
 }
 
 TEST_F(Power, WithoutAClockOnlyArmingFails) {

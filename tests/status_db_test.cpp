@@ -219,13 +219,12 @@ TEST_F(StatusDatabase, ManyMayOpenItFirst) {
         20000; // without, a hundred are over while the lock's holder waits for a core
     for (int round = 0; round < 20; ++round) {
         shell("rm -f /tmp/sched_status.sqlite*");
-        for (int i = 0; i < 8; ++i) {
-            if (fork() == 0) {
-                _exit(TAVISchedDBInit() ? 0 : 1);
-            }
+        std::vector<pid_t> openers(8);
+        for (pid_t &opener : openers) {
+            opener = start([] { return TAVISchedDBInit() ? 0 : 1; });
         }
-        for (int status = -1; wait(&status) > 0;) {
-            EXPECT_EQ(status, 0);
+        for (const pid_t opener : openers) {
+            EXPECT_EQ(exitOf(opener), 0);
         }
     }
     EXPECT_THAT(logs(), IsEmpty());

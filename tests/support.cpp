@@ -25,14 +25,30 @@ Fakes fakes;
 
 namespace {
 
+// One behind the other, each with its NUL.
+struct Lines {
+    std::atomic<size_t> length;
+    char text[4 << 20];
+
+    void add(const char *line) {
+        const size_t size = std::strlen(line) + 1;
+        std::memcpy(text + length.fetch_add(size), line, size);
+    }
+    std::vector<std::string> take() {
+        std::vector<std::string> lines;
+        std::istringstream stream(std::string(text, length.exchange(0)));
+        for (std::string line; std::getline(stream, line, '\0');) {
+            lines.push_back(line);
+        }
+        return lines;
+    }
+};
+
 // Shared with forked children.
 struct Journal {
-    std::atomic<size_t> logLength;
-    std::atomic<size_t> noticeLength;
+    Lines log, notices;
     std::atomic<size_t> pauseCount;
     long pauses[4096];
-    char log[4 << 20];
-    char notices[1 << 20];
 };
 
 Journal &journal() {
@@ -56,22 +72,16 @@ void recordPause(long microseconds) {
 } // namespace
 
 std::vector<std::string> logs(bool stable) {
-    std::vector<std::string> lines;
-    std::istringstream text(std::string(journal().log, journal().logLength.exchange(0)));
-    for (std::string line; std::getline(text, line, '\0');) {
-        static const std::regex number("(\\.(?:cpp|h)):\\d+");
-        lines.push_back(stable ? line : std::regex_replace(line, number, "$1:*"));
+    static const std::regex number("(\\.(?:cpp|h)):\\d+");
+    auto lines = journal().log.take();
+    for (std::string &line : lines) {
+        line = stable ? line : std::regex_replace(line, number, "$1:*");
     }
     return lines;
 }
 
 std::vector<std::string> notices() {
-    std::vector<std::string> lines;
-    std::istringstream text(std::string(journal().notices, journal().noticeLength.exchange(0)));
-    for (std::string line; std::getline(text, line, '\0');) {
-        lines.push_back(line);
-    }
-    return lines;
+    return journal().notices.take();
 }
 
 std::string lastLog(bool stable) {
@@ -117,12 +127,12 @@ std::string query(const std::string &sql) {
     return result;
 }
 
-void recorded(const std::string &sql, const char *untilKilled) {
+void recorded(const std::string &sql, bool untilKilled) {
     sqlite3 *database = nullptr;
     ASSERT_EQ(sqlite3_open("/var/lib/tavischeduler/runs.sqlite", &database), SQLITE_OK);
     EXPECT_EQ(sqlite3_exec(database, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK) << sql;
-    while (untilKilled) {
-        writeFile(untilKilled, "");
+    if (untilKilled) {
+        writeFile("/tmp/held", "");
         ::pause();
     }
     sqlite3_close(database);
@@ -130,6 +140,12 @@ void recorded(const std::string &sql, const char *untilKilled) {
 
 int shell(const std::string &command) {
     const int status = std::system(command.c_str());
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+int exitOf(pid_t pid) {
+    int status = -1;
+    waitpid(pid, &status, 0);
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
@@ -232,12 +248,7 @@ void syslog(int priority, const char *format, ...) {
         va_end(arguments);
     }
     auto &journal = support::journal();
-    const size_t size = std::strlen(line) + 1;
-    if (priority == LOG_INFO) {
-        std::memcpy(journal.notices + journal.noticeLength.fetch_add(size), line, size);
-    } else {
-        std::memcpy(journal.log + journal.logLength.fetch_add(size), line, size);
-    }
+    (priority == LOG_INFO ? journal.notices : journal.log).add(line);
     errno = savedErrno;
 }
 
@@ -278,16 +289,12 @@ int fsync(int fd) {
 } // extern "C"
 
 int main(int argc, char **argv) {
-    // Whoever starts this may ignore signals (nohup, a shell's background job); its processes may
-    // not.
+    // Whoever starts this may ignore signals; its processes may not.
     for (const int number : {SIGHUP, SIGINT, SIGQUIT, SIGPIPE, SIGTERM, SIGCHLD, SIGALRM}) {
         signal(number, SIG_DFL);
     }
     const char *const sandbox = std::getenv("TAVI_SANDBOX");
-    const bool onlyList = std::any_of(argv + 1, argv + argc, [](const char *argument) {
-        return std::strncmp(argument, "--gtest_list_tests", 18) == 0;
-    });
-    if (!onlyList && (!sandbox || std::strcmp(sandbox, "inside") != 0)) {
+    if (!sandbox || std::strcmp(sandbox, "inside") != 0) {
         const std::string self = std::filesystem::canonical("/proc/self/exe");
         std::vector<const char *> arguments(argv, argv + argc + 1);
         arguments[0] = self.c_str();

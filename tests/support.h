@@ -66,12 +66,22 @@ void writeFile(const std::string &path, const std::string &content);
 struct stat statusOf(const char *path);
 // Runs a shell command outside of the library; its exit status.
 int shell(const std::string &command);
+// Starts a process of a function that gives its exit status.
+template <typename Function> pid_t start(Function &&function) {
+    const pid_t pid = fork();
+    if (pid == 0) {
+        _exit(function());
+    }
+    return pid;
+}
+// Waits for a process; its exit status, or -1.
+int exitOf(pid_t pid);
 // Waits until a shell command succeeds, for two minutes at most.
 bool waitFor(const std::string &condition);
 // Executes on the status database; all values, each followed by a blank.
 std::string query(const std::string &sql);
-// Executes on the records of runs, and, with a path, makes that file and keeps the database open.
-void recorded(const std::string &sql, const char *untilKilled = nullptr);
+// Executes on the records of runs; makes /tmp/held and keeps the database open, if so.
+void recorded(const std::string &sql, bool untilKilled = false);
 // Waits until all detached children of this process have ended.
 void waitForChildren();
 // "2024-05-08 09:00" in local time.

@@ -64,8 +64,6 @@ TEST_F(TaskRecord, BadArgumentsAreNamed) {
     int (*const kCalls[])() = {
         [] { return TAVISchedMachineCheck(nullptr); },
         [] { return TAVISchedMachineCheckOf(nullptr, nullptr); },
-        [] { return TAVISchedTaskCheck(nullptr, nullptr); },
-        [] { return TAVISchedHashCheck(nullptr, nullptr, 0); },
         [] { return TAVISchedTaskNextId(nullptr); },
         [] { return TAVISchedDBOpenForReading(nullptr); },
         [] { return TAVISchedDBSetStatus(nullptr, 1, 0, 3, nullptr); },

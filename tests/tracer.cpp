@@ -4,20 +4,19 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <climits>
 #include <csignal>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
-#include <cstring>
 #include <elf.h>
 #include <fcntl.h>
+#include <filesystem>
+#include <fstream>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <set>
 #include <sys/prctl.h>
 #include <sys/ptrace.h>
-#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/uio.h>
 #include <sys/user.h>
@@ -28,6 +27,8 @@
 namespace tracer {
 
 namespace {
+
+namespace fs = std::filesystem;
 
 constexpr int kNone = -1;
 
@@ -122,41 +123,22 @@ void installFilter() {
 
 using Info = __ptrace_syscall_info;
 
-bool getInfo(pid_t pid, Info &info) {
-    return ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid, sizeof info, &info) >
-           0;
-}
-
-// A page at a time: what follows the text need not be there.
 std::string readText(pid_t pid, uint64_t address) {
-    constexpr uint64_t kPage = 4096;
+    std::ifstream memory("/proc/" + std::to_string(pid) + "/mem");
+    memory.seekg(static_cast<std::streamoff>(address));
     std::string text;
-    std::array<char, kPage> part{};
-    while (text.size() < PATH_MAX) {
-        iovec local{part.data(), kPage - address % kPage};
-        const iovec remote{reinterpret_cast<void *>(address), local.iov_len};
-        const ssize_t length = process_vm_readv(pid, &local, 1, &remote, 1, 0);
-        if (length <= 0) {
-            return "?";
-        }
-        const size_t size = strnlen(part.data(), static_cast<size_t>(length));
-        text.append(part.data(), size);
-        if (size < static_cast<size_t>(length)) {
-            break;
-        }
-        address += size;
-    }
+    std::getline(memory, text, '\0');
     return text;
 }
 
 std::string pathOfDescriptor(pid_t pid, uint64_t number) {
-    std::array<char, PATH_MAX> target{};
-    const std::string name =
-        "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(static_cast<int>(number));
-    return readlink(name.c_str(), target.data(), target.size() - 1) > 0 ? target.data() : "?";
+    std::error_code error;
+    return fs::read_symlink(
+        "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(static_cast<int>(number)), error);
 }
 
 #if defined(__x86_64__)
+constexpr bool kCanChange = true;
 bool setArgument(pid_t pid, int argument, uint64_t value) {
     constexpr std::array<size_t, 6> kOffsets = {offsetof(user, regs.rdi), offsetof(user, regs.rsi),
                                                 offsetof(user, regs.rdx), offsetof(user, regs.r10),
@@ -168,6 +150,7 @@ bool failCall(pid_t pid, int error) {
            ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.rax), -static_cast<long>(error)) == 0;
 }
 #elif defined(__aarch64__)
+constexpr bool kCanChange = true;
 bool setRegister(pid_t pid, int number, uint64_t value) {
     user_regs_struct registers{};
     iovec all{&registers, sizeof registers};
@@ -187,6 +170,7 @@ bool failCall(pid_t pid, int error) {
            setRegister(pid, 0, static_cast<uint64_t>(-static_cast<int64_t>(error)));
 }
 #else
+constexpr bool kCanChange = false;
 bool setArgument(pid_t, int, uint64_t) {
     return false;
 }
@@ -199,8 +183,7 @@ bool failCall(pid_t, int) {
 
 class Following {
   public:
-    Following(pid_t caller, const Plan &plan, const std::function<void(const Call &)> &onCall)
-        : caller_(caller), plan_(plan), onCall_(onCall), processes_{caller} {}
+    Following(pid_t caller, const Plan &plan) : caller_(caller), plan_(plan), processes_{caller} {}
 
     Run follow() {
         int status = 0;
@@ -220,47 +203,33 @@ class Following {
   private:
     // The signal to go on with.
     int onStop(pid_t pid, int status) {
-        const bool isNew = processes_.insert(pid).second;
-        const int signal = WSTOPSIG(status);
-        switch (status >> 16) {
-        case 0:
-            break;
-        case PTRACE_EVENT_SECCOMP:
+        const int event = status >> 16;
+        processes_.insert(pid);
+        if (event == PTRACE_EVENT_SECCOMP) {
             onCall(pid);
-            return 0;
-        case PTRACE_EVENT_FORK:
-        case PTRACE_EVENT_VFORK:
-        case PTRACE_EVENT_CLONE: {
+        } else if (event == PTRACE_EVENT_EXEC && pid != caller_) {
+            programs_.insert(pid);
+        } else if (event == PTRACE_EVENT_FORK || event == PTRACE_EVENT_VFORK ||
+                   event == PTRACE_EVENT_CLONE) {
             unsigned long child = 0;
             ptrace(PTRACE_GETEVENTMSG, pid, nullptr, &child);
-            fresh_.insert(static_cast<pid_t>(child));
             processes_.insert(static_cast<pid_t>(child));
             if (programs_.contains(pid)) {
                 programs_.insert(static_cast<pid_t>(child));
             }
-            return 0;
-        }
-        case PTRACE_EVENT_EXEC:
-            if (pid != caller_) {
-                programs_.insert(pid);
-            }
-            return 0;
-        default:
-            return 0;
-        }
-        if (signal == (SIGTRAP | 0x80)) {
+        } else if (WSTOPSIG(status) == (SIGTRAP | 0x80)) {
             cut_ = 0; // the shortened write has been done
             kill(processes_);
-            return 0;
+        } else if (event == 0) {
+            return WSTOPSIG(status);
         }
-        // A new process begins with a stop of the tracer's.
-        const bool first = fresh_.erase(pid) > 0 || isNew;
-        return signal == SIGSTOP && first ? 0 : signal;
+        return 0;
     }
 
     void onCall(pid_t pid) {
         Info info{};
-        const bool known = getInfo(pid, info);
+        const bool known = ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid,
+                                  sizeof info, &info) > 0;
         const auto kind = std::find_if(kKinds.begin(), kKinds.end(), [&](const Kind &one) {
             return static_cast<uint64_t>(one.number) == info.seccomp.nr;
         });
@@ -272,11 +241,7 @@ class Following {
             return;
         }
         ++run_.points;
-        if (onCall_) {
-            onCall_(call);
-        }
-        const bool isFirst = plan_.isPoint && !run_.acted && plan_.isPoint(call);
-        if (isFirst || run_.points == plan_.point) {
+        if (plan_.isPoint && plan_.isPoint(call, run_.points) && !run_.acted) {
             run_.call = call;
             act(*kind, pid, info);
         }
@@ -307,37 +272,29 @@ class Following {
 
     void act(const Kind &kind, pid_t pid, const Info &info) {
         run_.acted = true;
-        switch (plan_.act) {
-        case Act::Nothing:
-            break;
-        case Act::KillAll:
+        if (plan_.act == Act::KillAll) {
             kill(processes_);
-            break;
-        case Act::KillCaller:
+        } else if (plan_.act == Act::KillCaller) {
             kill({caller_});
-            break;
-        case Act::KillProgram:
+        } else if (plan_.act == Act::KillProgram) {
             kill({pid});
-            break;
-        case Act::HalfThenKillAll:
+        } else if (plan_.act == Act::Fail) {
+            run_.acted = failCall(pid, plan_.error);
+        } else if (plan_.act == Act::HalfThenKillAll) {
             run_.acted =
                 kind.length != kNone && setArgument(pid, kind.length, halfOf(kind, pid, info));
             cut_ = run_.acted ? pid : 0;
-            break;
-        case Act::Fail:
-            run_.acted = failCall(pid, plan_.error);
-            break;
         }
     }
 
     // Programs ask for more than there is.
     static uint64_t halfOf(const Kind &kind, pid_t pid, const Info &info) {
         const uint64_t length = info.seccomp.args[kind.length];
-        struct stat source {};
         const uint64_t from = info.seccomp.args[kind.number == __NR_copy_file_range ? 0 : 1];
-        const std::string path = "/proc/" + std::to_string(pid) + "/fd/" + std::to_string(from);
-        const bool copies = kind.length > 2 && stat(path.c_str(), &source) == 0;
-        return (copies ? std::min(length, static_cast<uint64_t>(source.st_size)) : length) / 2;
+        std::error_code error;
+        return kind.length > 2
+                   ? std::min(length, fs::file_size(pathOfDescriptor(pid, from), error)) / 2
+                   : length / 2;
     }
 
     static void kill(const std::set<pid_t> &processes) {
@@ -352,41 +309,32 @@ class Following {
 
     pid_t caller_;
     const Plan &plan_;
-    const std::function<void(const Call &)> &onCall_;
     std::set<pid_t> processes_;
     std::set<pid_t> programs_; // started by the caller, not forks of it
-    std::set<pid_t> fresh_;
-    pid_t cut_ = 0; // the process whose shortened write is being done
+    pid_t cut_ = 0;            // the process whose shortened write is being done
     Run run_;
 };
 
 } // namespace
 
-#if defined(__x86_64__) || defined(__aarch64__)
-const bool kCanChangeCalls = true;
-#else
-const bool kCanChangeCalls = false;
-#endif
+const bool kCanChangeCalls = kCanChange;
 
-Run run(const std::function<int()> &operation, const Plan &plan,
-        const std::function<void(const Call &)> &onCall) {
+Run run(const std::function<int()> &operation, const Plan &plan) {
     const pid_t caller = fork();
     if (caller == 0) {
-        ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
-        raise(SIGSTOP);
+        raise(SIGSTOP); // until it is followed
         installFilter();
         _exit(operation());
     }
-    int status = 0;
-    if (waitpid(caller, &status, 0) != caller || !WIFSTOPPED(status)) {
+    waitpid(caller, nullptr, WUNTRACED);
+    if (ptrace(PTRACE_SEIZE, caller, nullptr,
+               static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
+                                 PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP |
+                                 PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL)) != 0) {
         std::abort();
     }
-    ptrace(PTRACE_SETOPTIONS, caller, nullptr,
-           static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
-                             PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP | PTRACE_O_TRACESYSGOOD |
-                             PTRACE_O_EXITKILL));
-    ptrace(PTRACE_CONT, caller, nullptr, nullptr);
-    return Following(caller, plan, onCall).follow();
+    kill(caller, SIGCONT);
+    return Following(caller, plan).follow();
 }
 
 } // namespace tracer

@@ -18,7 +18,7 @@ enum class Calls {
               // and its forks also opens, reads and the start of programs
 };
 
-enum class Act { Nothing, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
+enum class Act { None, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
 
 struct Call {
     std::string name;
@@ -27,12 +27,17 @@ struct Call {
     bool isWrite = false; // of a length that can be cut short
 };
 
+// Whether to act at a call; the first that counts is 1.
+using Wanted = std::function<bool(const Call &, size_t)>;
+inline Wanted at(size_t point) {
+    return [point](const Call &, size_t number) { return number == point; };
+}
+
 struct Plan {
     Calls calls = Calls::Changing;
-    size_t point = 0; // from 1 on; 0 is never reached
-    Act act = Act::Nothing;
-    int error = 0;                               // for Fail
-    std::function<bool(const Call &)> isPoint{}; // the first for which it is true, instead
+    Act act = Act::None;
+    Wanted isPoint{}; // sees every call that counts before it is made; the first that it wants
+    int error = 0;    // for Fail
 };
 
 struct Run {
@@ -43,9 +48,7 @@ struct Run {
     bool crashed = false; // some process
 };
 
-// The operation's result is its process's exit status. `onCall` sees every call that counts before
-// it is made. Returns when all processes have ended.
-Run run(const std::function<int()> &operation, const Plan &plan,
-        const std::function<void(const Call &)> &onCall = {});
+// The operation's result is its process's exit status. Returns when all processes have ended.
+Run run(const std::function<int()> &operation, const Plan &plan = {});
 
 } // namespace tracer

@@ -1,5 +1,5 @@
 // What is wrong with a task before it is stored.
-#include "arrange.h"
+#include "machine.h"
 
 #include <cstring>
 #include <dlfcn.h>

@@ -1,15 +1,15 @@
 // The command line of tavisched, an argument a line: parsed and turned into a task, with the
 // commands' own work left out. A command is given what was typed, and for the rest the defaults; a
 // task becomes what it is to become; what is said can go to a terminal.
+#include "command_line.h"
 #include "commands/commands.h"
 #include "fuzz.h"
 #include "task_options.h"
+#include "tasks/tasks.h"
+#include "text/utf8.h"
+#include "waiting.h"
 
-// The command line is made once for many inputs, as that takes longer than to read one.
-#define main toolsMain
-#include "main.cpp"
-#undef main
-
+#include <algorithm>
 #include <iostream>
 #include <limits>
 #include <random>
@@ -180,6 +180,9 @@ int completeIds() {
 } // namespace tavisched
 
 namespace {
+
+using tavisched::commandFor;
+using tavisched::split;
 
 // ---- What is expected of a plain command line ----
 
@@ -413,17 +416,15 @@ std::vector<std::string> argumentsOf(const std::string &text) {
 
 // ---- Typing ----
 
-// As if nothing had been typed. The parser keeps a little of all that it reads.
-CommandLine &freshLine() {
+// Made once for many inputs, as that takes longer than to read one; but the parser keeps a little
+// of all that it reads.
+tavisched::CommandLine &commandLine() {
     constexpr int kMost = 1000;
-    static std::optional<CommandLine> line;
+    static std::optional<tavisched::CommandLine> line;
     static int typed = 0;
     if (typed++ % kMost == 0) {
         line.emplace();
     }
-    line->given = {};
-    line->command = nullptr;
-    line->verbose = false;
     return *line;
 }
 
@@ -432,7 +433,7 @@ int type(std::vector<std::string> arguments) {
     std::transform(arguments.begin(), arguments.end(), std::back_inserter(argv),
                    [](std::string &argument) { return argument.data(); });
     argv.push_back(nullptr);
-    return tavischedMain(freshLine(), static_cast<int>(argv.size()) - 1, argv.data());
+    return commandLine().run(static_cast<int>(argv.size()) - 1, argv.data());
 }
 
 } // namespace

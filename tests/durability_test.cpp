@@ -243,6 +243,17 @@ TEST_F(Durability, FullFileSystems) {
     }
 }
 
+// What a torn copy took is room for the restored one.
+TEST_F(Durability, LongerWorkingCopyWithoutRoom) {
+    const State old = stateNow(listOfFreshProcess());
+    Small small("/tmp");
+    cutOff(isCopyTo(kWorking));
+    writeFile(kWorking, std::string(100000, 'x'));
+    shell("rm /tmp/scheduled_tasks.tmp*");
+    small.fill(0, false);
+    EXPECT_EQ(stateNow(listOfFreshProcess()), old);
+}
+
 // A working copy that cannot be restored for lack of room is not read, and nothing is changed.
 TEST_F(Durability, TornWorkingCopyWithoutRoom) {
     const State old = stateNow(listOfFreshProcess());

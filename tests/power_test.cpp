@@ -202,6 +202,10 @@ TEST_F(Power, WithoutAClockOnlyArmingFails) {
     EXPECT_THAT(logs(), IsEmpty());
     EXPECT_EQ(store("poweron", "1000000", 5, 5), -1);
     EXPECT_THAT(logs(), Contains(HasSubstr("power-on cannot be armed: ")));
+    TAVI_SCHED_TASK task{};
+    EXPECT_EQ(TAVISchedTaskGetByID(60010505, &task), 0);
+    EXPECT_EQ(TAVISchedTaskEdit(&task), -1);
+    EXPECT_THAT(logs(), Contains(HasSubstr("sync hw autopower failed. [0x0900")));
     shell("mkdir /sys/class/rtc/rtc0");
 }
 

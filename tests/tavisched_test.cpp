@@ -24,7 +24,7 @@ class CommandLine : public SchedTest {
             GTEST_SKIP() << "needs several users";
         }
         shell("mkdir -p -m 755 /tmp/lock /usr/tavi/bin; rm -rf /sys/class/rtc/rtc0 2>/dev/null;"
-              "chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab;"
+              "chmod 755 /usr/tavi/etc; chmod 644 /etc/crontab; rm -f /etc/crontab2;"
               "cp -u '" TAVISCHED "' '" RUNNER "' /usr/tavi/bin; printf '#!/bin/sh\n' "
               "> /usr/tavi/bin/tavi_poweroff_feasible_check; chmod 755 /usr/tavi/bin/*;"
               "ln -sfn /usr/tavi/bin/tavischedtask /tmp/tavischedtask");
@@ -709,6 +709,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"chmod 775 .", "/usr/tavi/etc must belong to root", false},
         {"echo bad > /tmp/sched_status.sqlite", "no task runs without its status database", true},
         {"chmod 664 /etc/crontab", "cron ignores /etc/crontab, which must be", false},
+        {"ln /etc/crontab /etc/crontab2", "cron ignores /etc/crontab, which must be", false},
         // The lines are the last trace of a task that one of the files has lost, or both.
         {"truncate -s 0 $BOTH", "that no task asks for", false},
         {"rm scheduled_tasks", "lost when the machine restarts", true},

@@ -539,6 +539,12 @@ TEST_F(Records, NothingKeepsARunFromRunning) {
         EXPECT_THAT(logs(), Contains(HasSubstr(row.log)));
         if (row.recorded >= 0) {
             EXPECT_EQ(runs(ofTask(1)).size(), static_cast<size_t>(row.recorded));
+        } else {
+            const TAVI_SCHED_RUN_FILTER all = ofTask(1);
+            EXPECT_EQ(TAVISchedRunList(
+                          &all, [](auto...) { return 0; }, nullptr),
+                      -1);
+            EXPECT_EQ(PLATCErrGet(), 0x0900U);
         }
         EXPECT_EQ(inFolder(row.after), 0);
     }

@@ -58,6 +58,11 @@ TEST_F(StatusDatabase, RowsFromStartToEnd) {
     EXPECT_EQ(TAVISchedDBGetStatusByStatusID(db_, 9, &code, nullptr, 0), 0);
     EXPECT_EQ(code, 3);
     EXPECT_THAT(logs(), IsEmpty());
+    sqlite3_stmt *open = nullptr;
+    sqlite3_prepare_v2(db_, "SELECT 1", -1, &open, nullptr);
+    EXPECT_EQ(TAVISchedDBClose(db_), -1);
+    EXPECT_EQ(PLATCErrGet(), 0x0B00U);
+    sqlite3_finalize(open);
 }
 
 TEST_F(StatusDatabase, QuotesStayInValues) {

@@ -78,7 +78,8 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     } cases[] = {
         {"needs --command", {"add"}, "\"command\""},
         {"--command: it is empty", {"add --command ' '"}},
-        {"at most 12285", {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\""}},
+        {"at most 12285; put a longer one",
+         {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\""}},
         {"is not accepted; accepted: HH:MM", {"--at 23:60", "--at 9:5", "--at 24:00"}, "\"at\""},
         {"--yearly: ", {"--yearly 02-30", "--yearly 13-01"}},
         {"a day from 1 to 31", {"--monthly 32", "--monthly 0"}},
@@ -305,7 +306,8 @@ TEST_F(CommandLine, ShowsTasksForScripts) {
     EXPECT_LT(json.find("\"b\""), json.find("\"A\""));
     EXPECT_THAT(
         done("history 2 --json"),
-        MatchesRegex("\\{.*\"asked\": ?\"....-..-..T..:..:..[+-]..:..\".*\"task\": ?2,.*\\}\n"));
+        MatchesRegex(
+            "\\{.*\"asked\": ?\"....-..-..T..:..:..[+-]..:..\".*\"task\": ?2,.*\"waitedFor\": ?null.*\\}\n"));
     EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
     // What the web back end exchanges can be saved as it is.
     EXPECT_EQ(TAVISchedTaskSaveFromJson(done("export --web 2 | sed '1d;$d'").c_str(), 0), 2);
@@ -375,7 +377,7 @@ TEST_F(CommandLine, ShowsTheCalendar) {
 
 // Escapes in JSON mean the characters; elsewhere nothing of them reaches a terminal.
 TEST_F(CommandLine, EscapesWhatControlsTerminals) {
-    const std::string harm = "a\u001b\u009b\u007f\u202e\u200b\u00ad\ufeffb";
+    const std::string harm = "a\u001b\u009b\u007f\u202e\u200b\u00ad\ufeff\u00aeb";
     Task task = newTask("echo '\u200b'");
     TAVISchedCTaskSetName(task.get(), harm.c_str());
     TAVISchedCTaskSetApp(task.get(), harm.c_str());
@@ -386,7 +388,8 @@ TEST_F(CommandLine, EscapesWhatControlsTerminals) {
         EXPECT_THAT(run(command), Not(ContainsRegex("\u001b|\u009b|\u007f|\u202e|\u200b|\ufeff")))
             << command;
     }
-    EXPECT_THAT(done("list"), HasSubstr("a\\u001b\\u009b\\u007f\\u202e\\u200b\\u00ad\\ufeffb"));
+    EXPECT_THAT(done("list"),
+                HasSubstr("a\\u001b\\u009b\\u007f\\u202e\\u200b\\u00ad\\ufeff\u00aeb"));
     for (const char *const form : {"", " --web"}) {
         done("export" + std::string(form) + " > /tmp/all.json");
         const std::string before = machine();

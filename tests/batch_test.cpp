@@ -28,11 +28,12 @@ TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
     EXPECT_EQ(storedTask()->id, 2);
     Task third = storedTask("echo 3");
+    EXPECT_EQ(storedTask("echo 4")->id, 4);
     EXPECT_EQ(TAVISchedTaskRemove(2), 0);
     TAVISchedCTaskSetName(third.get(), "third");
     EXPECT_EQ(TAVISchedTaskEdit(third.get()), 0);
     EXPECT_EQ(TAVISchedTaskCreate(powerTask("poweroff", 22, 30).get()), 0);
-    EXPECT_THAT(listedIds(), ElementsAre(1, 3, 91272230));
+    EXPECT_THAT(listedIds(), ElementsAre(1, 3, 4, 91272230));
     TAVI_SCHED_TASK back{};
     EXPECT_EQ(TAVISchedTaskGetByID(2, &back), -1);
     EXPECT_EQ(TAVISchedTaskGetByID(3, &back), 0);
@@ -41,9 +42,10 @@ TEST_F(Batch, OnlyThisProcessSeesItUntilItIsStored) {
     EXPECT_EQ(stateNow(), before_);
     EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; ");
     ASSERT_EQ(TAVISchedChangeCommit(), 0);
-    EXPECT_EQ(listOfFreshProcess(), "1 Task 1 true; 3 third echo 3; 91272230 PowerOff task 0 ; ");
+    EXPECT_EQ(listOfFreshProcess(),
+              "1 Task 1 true; 3 third echo 3; 4 Task 4 echo 4; 91272230 PowerOff task 0 ; ");
     EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
-    EXPECT_THAT(readFile(kCrontab), HasSubstr("--run id=3\n"));
+    EXPECT_THAT(readFile(kCrontab), AllOf(HasSubstr("--run id=3\n"), HasSubstr("--run id=4\n")));
     EXPECT_THAT(readFile(kCrontab), HasSubstr("tavi_poweroff_feasible_check"));
 }
 

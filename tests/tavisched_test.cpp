@@ -78,8 +78,8 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     } cases[] = {
         {"needs --command", {"add"}, "\"command\""},
         {"--command: it is empty", {"add --command ' '"}},
-        {"at most 12285; put a longer one",
-         {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\""}},
+        {"at most 12285", {"add --command \"$(head -c 12286 /dev/zero | tr '\\0' x)\""}},
+        {"20000 bytes", {"add --command \"$(head -c 20000 /dev/zero | tr '\\0' x)\""}},
         {"is not accepted; accepted: HH:MM", {"--at 23:60", "--at 9:5", "--at 24:00"}, "\"at\""},
         {"--yearly: ", {"--yearly 02-30", "--yearly 13-01"}},
         {"a day from 1 to 31", {"--monthly 32", "--monthly 0"}},

@@ -91,6 +91,7 @@ TEST_F(Crontab, CronIsSignalledWhenItRuns) {
     int status = 0;
     EXPECT_EQ(waitpid(cron, &status, 0), cron);
     EXPECT_EQ(status, SIGHUP);
+    EXPECT_THAT(logs(), IsEmpty());
     EXPECT_EQ(SchedBackends[0].sync(), 0); // it is gone
     EXPECT_THAT(logs(true), ElementsAre(HasSubstr("tavischedule.cpp:245 Failed to hup crond.")));
 }

@@ -157,8 +157,6 @@ TEST_F(Convert, ChecksForeseeWhatComesBack) {
     EXPECT_STREQ(faults[10].key, "aa");
     EXPECT_EQ(TAVISchedHashCheck(hash_, nullptr, 0), 12);
     EXPECT_EQ(failure(TAVISchedHashCheck(hash_, nullptr, 1)), 0x0D00U);
-    EXPECT_EQ(failure(TAVISchedHashCheck(nullptr, nullptr, 0)), 0x0D00U);
-    EXPECT_EQ(failure(TAVISchedValueCheck("id", nullptr, faults)), 0x0D00U);
 }
 
 class Sort : public SchedTest {
@@ -194,7 +192,10 @@ TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
     EXPECT_EQ(result_, 0);
     EXPECT_EQ(sorted("Id", 1), "8b 9B 10b ");
     EXPECT_EQ(result_, -1);
+    TAVI_SCHED_TASK *none = nullptr;
+    EXPECT_EQ(TAVISchedTaskListSort(&none, "Id", 1), 0);
     EXPECT_THAT(logs(), IsEmpty());
+    EXPECT_EQ(failure(TAVISchedTaskListSortEx(&none, 0, 1)), 0x0D00U);
 }
 
 TEST_F(Sort, OutOfMemoryLeavesTheListAlone) {

@@ -82,6 +82,15 @@ int readById() {
     return result != 0 ? 1 : isWhole(task) ? 0 : 2;
 }
 
+int readJson() {
+    static std::array<char, json.size()> read;
+    const int result = TAVISchedTaskConvertToJsonById(3, read.data(), read.size());
+    if (result != 0 && PLATCErrGet() == 0) {
+        PLATCErrSetEx(TAVI_SCHED_ERR_MEMORY, "", 0);
+    }
+    return result != 0 ? 1 : std::strcmp(read.data(), json.data()) == 0 ? 0 : 2;
+}
+
 // ---- Programs ----
 
 constexpr const char *kSaid = "/home/said"; // not among the files whose calls fail
@@ -194,6 +203,8 @@ std::vector<Operation> operations(char suite) {
          exportTasks, faultsOfTool, nullptr, true},
         {"list", "f", listed},
         {"get", "f", readById},
+        {"get_json", "f", readJson,
+         [] { TAVISchedTaskConvertToJsonById(3, json.data(), json.size()); }},
         {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
         {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
         {"missed", "f", [] { return TAVISchedMissedRunsFind() == 0 ? 0 : 1; }, missRuns,

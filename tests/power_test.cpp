@@ -117,6 +117,7 @@ TEST_F(Power, WhatDoesNotFitIsRefused) {
     EXPECT_EQ(row_.list_get(&list, nullptr), -1);
     EXPECT_THAT(lastLog(), HasSubstr("taviautopower_get_from_psched failed."));
     EXPECT_EQ(row_.sync(), -1);
+    EXPECT_THAT(logs(), Contains(HasSubstr("Set Power Off Schedule ERROR! [0x0D00 ")));
     EXPECT_EQ(readFile(kCrontab), kForeignCrontab); // cron would ignore all of it
     EXPECT_EQ(row_.remove(90010203), -1);           // removed, but not applied
     EXPECT_THAT(logs().front(), HasSubstr("TAVIScheduleSet Error 3328"));

@@ -2,6 +2,9 @@
 #include "support.h"
 
 #include <cstring>
+#include <source_location>
+#include <type_traits>
+#include <utility>
 
 namespace {
 
@@ -50,9 +53,7 @@ TEST_F(TaskRecord, TextsAreCutToTheirOwnField) {
 }
 
 TEST_F(TaskRecord, BadArgumentsAreNamed) {
-    static char text[4] = "";
-    static int number = 0;
-    static const Task someTask = newTask();
+    char text[4] = "";
     EXPECT_EQ(failure(TAVISchedCTaskSetName(nullptr, nullptr)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedCTaskGetName(text, 0, nullptr)), 0x0D00U);
     EXPECT_EQ(failure(TAVISchedDateComp(nullptr, nullptr)), 0x0D00U);
@@ -61,23 +62,122 @@ TEST_F(TaskRecord, BadArgumentsAreNamed) {
     EXPECT_THAT(logs(), ElementsAre("tavischedsetter.h" + reason + "(((void *)0) != szVal)=[0]\n",
                                     "tavischedgetter.h" + reason + "(0 < cbBuf)=[0]\n",
                                     "sched_util.cpp" + reason + "(((void *)0) != pDate1)=[0]\n"));
-    int (*const kCalls[])() = {
-        [] { return TAVISchedMachineCheck(nullptr); },
-        [] { return TAVISchedMachineCheckOf(nullptr, nullptr); },
-        [] { return TAVISchedTaskNextId(nullptr); },
-        [] { return TAVISchedDBOpenForReading(nullptr); },
-        [] { return TAVISchedDBSetStatus(nullptr, 1, 0, 3, nullptr); },
-        [] { return TAVISchedDBGetStatusByTaskID(nullptr, 1, nullptr, nullptr, nullptr, 0); },
-        [] { return TAVISchedDBListStatus(nullptr, 1, nullptr, nullptr); },
-        [] { return TAVISchedRunGet(1, nullptr); },
-        [] { return SchedBackends[0].run(someTask.get(), &number, nullptr, 1); },
-        [] { return SchedBackends[1].run(someTask.get(), &number, nullptr, 1); },
-        [] { return SchedBackends[1].run(someTask.get(), nullptr, text, 1); },
-    };
-    for (const auto &call : kCalls) {
-        PLATCErrSetEx(0, "", 0);
-        EXPECT_EQ(failure(call()), 0x0D00U) << &call - kCalls;
+}
+
+// Each pointer given and each size above 0 is one that the function needs: with any of them missing
+// it refuses.
+template <typename Result, typename... Parameters> struct Needs {
+    Needs(Result (*function)(Parameters...), std::type_identity_t<Parameters>... given,
+          std::source_location row = std::source_location::current()) {
+        const auto refuses = [&](auto &argument) {
+            using Argument = std::remove_reference_t<decltype(argument)>;
+            if constexpr (std::is_pointer_v<Argument> || std::is_same_v<Argument, size_t>) {
+                if (const Argument kept = std::exchange(argument, Argument{})) {
+                    PLATCErrSetEx(0, "", 0);
+                    EXPECT_EQ(failure(static_cast<int>(function(given...))), 0x0D00U) << row.line();
+                    argument = kept;
+                }
+            }
+        };
+        (refuses(given), ...);
     }
+};
+template <typename Result, typename... Parameters, typename... Given>
+Needs(Result (*)(Parameters...), Given...) -> Needs<Result, Parameters...>;
+
+TEST_F(TaskRecord, WhatIsNeededMustBeGiven) {
+    char text[4] = "";
+    int number = 0;
+    int64_t moment = 0;
+    TAVI_SCHED_TASK task{};
+    TAVI_SCHED_TASK *list = &task;
+    TAVI_SCHED_DATE date{};
+    TAVI_SCHED_FAULT fault{};
+    TAVI_SCHED_STATUS status{};
+    TAVI_SCHED_FINDING *findings = nullptr;
+    TAVI_SCHED_PLUGIN plugin{};
+    PLATCSZHASH *hash = PLATCSzHashAlloc(16);
+    sqlite3 *database = TAVISchedDBInit();
+    const auto takeStatus = [](void *, const TAVI_SCHED_STATUS *) { return 0; };
+    const auto takeRun = [](void *, const TAVI_SCHED_RUN *) { return 0; };
+    const auto takeRemark = [](void *, const TAVI_SCHED_REMARK *) { return 0; };
+    TAVI_SCHED_SPAN span{};
+    TAVI_SCHED_RUN run{};
+    TAVI_SCHED_RUN_LIMITS limits{};
+
+#define TAVI_SCHED_SET_INT(X, field) Needs(TAVISchedCTaskSet##X, &task, 1);
+#define TAVI_SCHED_SET_FLAG TAVI_SCHED_SET_INT
+#define TAVI_SCHED_SET_TYPE(X, value) Needs(TAVISchedCTaskSet##X, &task);
+#define TAVI_SCHED_SET_TEXT(X, field) Needs(TAVISchedCTaskSet##X, &task, text);
+#include "tavischedsetter.h"
+#define TAVI_SCHED_GET_INT(X, field) Needs(TAVISchedCTaskGet##X, &number, &task);
+#define TAVI_SCHED_GET_TEXT(X, field) Needs(TAVISchedCTaskGet##X, text, 4, &task);
+#define TAVI_SCHED_IS(X, field, value) Needs(TAVISchedCTaskIs##X, &number, &task);
+#include "tavischedgetter.h"
+    Needs(TAVISchedEnumToValue, TAVISchedStateTable, text);
+    Needs(TAVISchedInitHashFromTask, &hash, &task);
+    Needs(TAVISchedInitTaskFromHash, hash, &task);
+    Needs(TAVISchedTaskCheck, &task, &fault);
+    Needs(TAVISchedValueCheck, "id", text, &fault);
+    Needs(TAVISchedHashCheck, hash, nullptr, 0);
+    Needs(TAVISchedDateGet, &date);
+    Needs(TAVISchedDateComp, &date, &date);
+    Needs(TAVISchedDateParse, text, &date);
+    Needs(TAVISchedTimeParse, text, &date);
+    Needs(TAVISchedDateNormalize, &date);
+    Needs(TAVISchedNextTriggerTime, &task);
+    Needs(TAVISchedTaskStarts, &task, 0, 1, &moment, 1);
+    Needs(TAVISchedTaskNextStart, &task, 0, &moment);
+    Needs(TAVISchedOffHours, nullptr, 0, 0, 1, &span, 1);
+    EXPECT_EQ(failure(TAVISchedOffHours(nullptr, 1, 0, 1, &span, 1)), 0x0D00U);
+    Needs(TAVISchedTaskRemarks, nullptr, 0, nullptr, 0, takeRemark, nullptr);
+    EXPECT_EQ(failure(TAVISchedTaskRemarks(nullptr, 1, nullptr, 0, takeRemark, nullptr)), 0x0D00U);
+    Needs(TAVISchedTaskFree, &task);
+    Needs(TAVISchedTaskGetDefault, &task);
+    Needs(TAVISchedTaskGetByID, 1, &task);
+    Needs(TAVISchedTaskLoad, 1, &task);
+    Needs(TAVISchedTaskEdit, &task);
+    Needs(TAVISchedTaskSave, &task);
+    Needs(TAVISchedTaskListGet, &list, nullptr);
+    Needs(TAVISchedTaskListGetOf, 1, &list, nullptr);
+    Needs(TAVISchedCrontabLine, &task, text, 4);
+    Needs(TAVISchedCrontabLineCheck, text, nullptr, text, 4);
+    Needs(TAVISchedTaskNextId, &number);
+    Needs(TAVISchedTaskCreateWithId, &task);
+    Needs(TAVISchedPowerOnCheck, text, 4);
+    Needs(TAVISchedTaskListSortEx, &list, 0, 1);
+    Needs(TAVISchedTaskListSort, &list, "id", 1);
+    Needs(TAVISchedDBOpenForReading, &database);
+    Needs(TAVISchedDBClose, database);
+    Needs(TAVISchedDBAddRecord, database, &task, nullptr);
+    Needs(TAVISchedDBSetStatus, database, 1, 0, 3, nullptr);
+    Needs(TAVISchedDBGetStatusByTaskID, database, 1, nullptr, &number, nullptr, 0);
+    Needs(TAVISchedDBGetStatusByStatusID, database, 1, &number, nullptr, 0);
+    Needs(TAVISchedDBIsTaskRunning, database, 1, &status);
+    Needs(TAVISchedDBIsAppRunning, database, text, &status);
+    Needs(TAVISchedDBListStatus, database, 1, takeStatus, nullptr);
+    Needs(TAVISchedDBListLastStatus, database, takeStatus, nullptr);
+    Needs(TAVISchedRunList, nullptr, takeRun, nullptr);
+    Needs(TAVISchedRunGet, 1, &run);
+    Needs(TAVISchedRunOutputRead, 1, &moment, text, 4, nullptr);
+    Needs(TAVISchedRunLimitsGet, &limits);
+    Needs(TAVISchedMachineCheck, &findings);
+    Needs(TAVISchedMachineCheckOf, nullptr, &findings);
+    Needs(TAVISchedTaskPluginInit, &plugin, text, &task, nullptr);
+    Needs(tavischedule_init, "tavischedule", SchedBackends);
+    Needs(taviautopower_init, "taviautopower", SchedBackends);
+    for (const TAVI_SCHED_BACKEND_RECORD *row = SchedBackends; row->name; ++row) {
+        Needs(row->list_get, &list, nullptr);
+        Needs(row->get_by_id, 1, &task);
+        Needs(row->create, &task);
+        Needs(row->edit, &task);
+        Needs(row->run, &task, &number, text, 4);
+        if (row->get_default) {
+            Needs(row->get_default, &task);
+        }
+    }
+    PLATCSzHashFree(hash);
+    TAVISchedDBClose(database);
 }
 
 TEST_F(TaskRecord, EnumerationsAndSelections) {

@@ -90,6 +90,28 @@ TEST_F(Starts, WhereTheClockIsChanged) {
     EXPECT_EQ(of(*powerTask("poweron", 2, 30), "2024-03-31 00:00", 1), "03-31 03:30s");
 }
 
+// The caller's time zone may have changed; nothing else has asked for it here.
+TEST_F(Starts, AreInTheZoneOfTheMoment) {
+    const Task task = taskOf({"1970-01-03 00:00", Daily, {}, {9, 0}, 0, 0, ""});
+    const auto next = [&](const char *zone) {
+        setenv("TZ", zone, 1);
+        int64_t start = 0;
+        EXPECT_EQ(TAVISchedTaskNextStart(task.get(), 86400, &start), 1);
+        return start;
+    };
+    const auto first = [&](const char *zone) {
+        setenv("TZ", zone, 1);
+        int64_t start = 0;
+        EXPECT_EQ(TAVISchedTaskStarts(task.get(), 86400, 3 * 86400, &start, 1), 1);
+        return start;
+    };
+    for (const int64_t hour : {1, 2}) {
+        const std::string zone = "AAA-" + std::to_string(hour);
+        EXPECT_EQ(next(zone.c_str()), 86400 + (9 - hour) * 3600);
+        EXPECT_EQ(first("BBB-3"), 86400 + 6 * 3600);
+    }
+}
+
 TEST_F(Starts, OfPowerSchedulesDisabledTasksAndInPieces) {
     Task task = newTask();
     task->startYear = 2030;

@@ -58,6 +58,9 @@ TEST_F(StatusDatabase, RowsFromStartToEnd) {
     EXPECT_EQ(TAVISchedDBGetStatusByStatusID(db_, 9, &code, nullptr, 0), 0);
     EXPECT_EQ(code, 3);
     EXPECT_THAT(logs(), IsEmpty());
+    query("CREATE TRIGGER t AFTER INSERT ON task_status BEGIN DELETE FROM task_status; END");
+    TAVI_SCHED_TASK task{};
+    EXPECT_EQ(failure(TAVISchedDBAddRecord(db_, &task, nullptr)), 0x0B00U);
     sqlite3_stmt *open = nullptr;
     sqlite3_prepare_v2(db_, "SELECT 1", -1, &open, nullptr);
     EXPECT_EQ(TAVISchedDBClose(db_), -1);

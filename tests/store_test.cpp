@@ -133,6 +133,11 @@ TEST_F(Store, ChangesOfATask) {
     EXPECT_EQ(TAVISchedTaskSave(task.get()), 0);     // -1 alone is a new task
     EXPECT_THAT(listedIds(), ElementsAre(-2, 1));
     EXPECT_EQ(failure(TAVISchedTaskLoad(-2, task.get())), 0x0D00U);
+    EXPECT_EQ(failure(TAVISchedTaskLoad(7, task.get())), 0x2000U);
+    EXPECT_THAT(lastLog(), HasSubstr("get task failed. [7] [0x2000 "));
+    task->backend = -9;
+    EXPECT_EQ(failure(TAVISchedTaskLoad(-1, task.get())), 0x2000U);
+    EXPECT_THAT(lastLog(), HasSubstr("get default task failed. [0x2000 "));
     EXPECT_EQ(TAVISchedTaskRemove(1), 0);
     EXPECT_THAT(listedIds(), ElementsAre(-2));
     const std::string crontab = readFile(kCrontab);
@@ -160,6 +165,11 @@ TEST_F(Store, FailuresTellTheirPlace) {
     EXPECT_EQ(SchedBackends[0].list_get(&list, nullptr), -1);
     EXPECT_EQ(PLATCErrorGetLine(), 56);
     EXPECT_EQ(list, nullptr);
+    shell("rm /tmp/scheduled_tasks && mkdir /tmp/scheduled_tasks");
+    EXPECT_EQ(SchedBackends[0].get_by_id(1, task.get()), -1);
+    shell("rmdir /tmp/scheduled_tasks");
+    EXPECT_THAT(logs(true),
+                Contains(HasSubstr("537 Get section [1] from [/tmp/scheduled_tasks] f")));
 }
 
 TEST_F(Store, StrangeWorkingCopiesAreRefused) {

@@ -147,6 +147,12 @@ TEST_F(Backend, HooksSeeOldAndNewFieldsAndCannotVeto) {
     EXPECT_EQ(TAVISchedTaskRemove(1), 0);
     const std::string removed = "10-fails task_remove p";
     EXPECT_EQ(readFile(kSeen), removed + "re" + old + "\n" + removed + "ost" + old + "\n");
+    chmod("/usr/tavi/etc/plugins/task_scheduler", 0777); // is as if it were not there
+    ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
+    logs();
+    EXPECT_EQ(TAVISchedTaskRemove(1), 0);
+    EXPECT_THAT(logs(), Each(HasSubstr("task_scheduler skipped")));
+    chmod("/usr/tavi/etc/plugins/task_scheduler", 0755);
 
     // A backend of its own: the hook fires for a creation that found none, after the fact.
     shell("rm /tmp/hooks");

@@ -131,6 +131,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"did you mean \"--yes\"?\n\"tavisched remove --help\"", {"rm 1 --ye"}, "null"},
         {"no command \"a\\u009b\\u007f\"", {"\"$(printf 'a\\302\\233\\177')\""}},
         {"a command is needed", {""}},
+        {"\"frob it\" is not expected", {"sync frob it"}},
     };
     shell("echo \"$(sed 's/^.1]/[3]/; s/^id=1/id=4/; s/Task 1/Task 4/' /tmp/scheduled_tasks)\" "
           "| tee -a $BOTH > /tmp/out");
@@ -665,6 +666,7 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_THAT(shown(70, "list", "xterm"), HasSubstr("\033[1mNAME"));
     // With a power schedule and long texts in it, nothing wraps, and what matters most stays.
     TAVISchedTaskRemove(1);
+    EXPECT_EQ(done("calendar"), "There are no tasks to show; --all shows all.\n");
     done("add --power off --at 23:00 --weekly weekdays");
     done("add --name 'A name that is rather long, longer than others' --command x --every 3");
     EXPECT_THAT(shown(80, "list"), AllOf(HasSubstr("STATE"), HasSubstr("OWNER")));

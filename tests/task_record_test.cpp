@@ -2,7 +2,6 @@
 #include "support.h"
 
 #include <cstring>
-#include <source_location>
 #include <type_traits>
 #include <utility>
 
@@ -68,13 +67,13 @@ TEST_F(TaskRecord, BadArgumentsAreNamed) {
 // it refuses.
 template <typename Result, typename... Parameters> struct Needs {
     Needs(Result (*function)(Parameters...), std::type_identity_t<Parameters>... given,
-          std::source_location row = std::source_location::current()) {
+          int line = __builtin_LINE()) {
         const auto refuses = [&](auto &argument) {
             using Argument = std::remove_reference_t<decltype(argument)>;
             if constexpr (std::is_pointer_v<Argument> || std::is_same_v<Argument, size_t>) {
                 if (const Argument kept = std::exchange(argument, Argument{})) {
                     PLATCErrSetEx(0, "", 0);
-                    EXPECT_EQ(failure(static_cast<int>(function(given...))), 0x0D00U) << row.line();
+                    EXPECT_EQ(failure(static_cast<int>(function(given...))), 0x0D00U) << line;
                     argument = kept;
                 }
             }

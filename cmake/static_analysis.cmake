@@ -1,6 +1,6 @@
 # The target "tidy": clang-tidy on every C++ source of the tree. A source is looked at anew when it or a header of ours
 # that it includes changed, and when clang-tidy or its rules did. Needs a tree in which each source is compiled alone,
-# but for the tests: eight of them at a time are read as one, as GoogleTest takes longer to read than all of them.
+# but for the tests: many of them are read as one, as GoogleTest takes longer to read than all of them.
 find_program(CLANG_TIDY NAMES clang-tidy-22 clang-tidy) # from 21 on it does not walk through the standard library
 set(analysed)
 
@@ -22,7 +22,8 @@ endfunction()
 # The analyzer of paths takes eight times what all other checks of the tests take together, and sanitizers run there.
 function(analyse_bundles target count)
     get_target_property(folder ${target} BINARY_DIR)
-    math(EXPR last "(${count} - 1) / 8")
+    get_target_property(size ${target} UNITY_BUILD_BATCH_SIZE)
+    math(EXPR last "(${count} - 1) / ${size}")
     foreach(bundle RANGE ${last})
         analyse(${folder}/CMakeFiles/${target}.dir/Unity/unity_${bundle}_cxx.cxx ${target}/${bundle}
             --checks=-clang-analyzer-*,-bugprone-suspicious-include)

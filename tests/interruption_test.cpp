@@ -41,11 +41,11 @@ int editedName() {
     return edited("a name of quite another length than the one it had");
 }
 
-std::array<char, 160 << 10> json; // of task 3, changed
+std::array<char, 160 << 10> jsonOf3; // of task 3, changed
 
 // What is no JSON sets no code. Where the stored task cannot be read, a new one is made.
 int saved(int create = 0) {
-    const int id = TAVISchedTaskSaveFromJson(json.data(), create);
+    const int id = TAVISchedTaskSaveFromJson(jsonOf3.data(), create);
     if (id == -1 && PLATCErrGet() == 0) {
         PLATCErrSetEx(TAVI_SCHED_ERR_BAD_FORMAT, "", 0);
     }
@@ -83,12 +83,12 @@ int readById() {
 }
 
 int readJson() {
-    static std::array<char, json.size()> read;
+    static std::array<char, jsonOf3.size()> read;
     const int result = TAVISchedTaskConvertToJsonById(3, read.data(), read.size());
     if (result != 0 && PLATCErrGet() == 0) {
         PLATCErrSetEx(TAVI_SCHED_ERR_MEMORY, "", 0);
     }
-    return result != 0 ? 1 : std::strcmp(read.data(), json.data()) == 0 ? 0 : 2;
+    return result != 0 ? 1 : std::strcmp(read.data(), jsonOf3.data()) == 0 ? 0 : 2;
 }
 
 // ---- Programs ----
@@ -204,7 +204,7 @@ std::vector<Operation> operations(char suite) {
         {"list", "f", listed},
         {"get", "f", readById},
         {"get_json", "f", readJson,
-         [] { TAVISchedTaskConvertToJsonById(3, json.data(), json.size()); }},
+         [] { TAVISchedTaskConvertToJsonById(3, jsonOf3.data(), jsonOf3.size()); }},
         {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
         {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
         {"missed", "f", [] { return TAVISchedMissedRunsFind() == 0 ? 0 : 1; }, missRuns,
@@ -257,7 +257,7 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
         TAVI_SCHED_TASK task{};
         TAVISchedTaskGetByID(3, &task);
         task.runMin = 17;
-        ASSERT_EQ(TAVISchedTaskConvertToJson(&task, json.data(), json.size()), 0);
+        ASSERT_EQ(TAVISchedTaskConvertToJson(&task, jsonOf3.data(), jsonOf3.size()), 0);
         writeFile("/run/crond.pid", std::to_string(getpid()));
         GetParam().prepare();
         start_.emplace();

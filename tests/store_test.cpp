@@ -172,6 +172,23 @@ TEST_F(Store, FailuresTellTheirPlace) {
                 Contains(HasSubstr("537 Get section [1] from [/tmp/scheduled_tasks] f")));
 }
 
+// A program that says it has copied need not have.
+TEST_F(Store, CopiesAreLookedAt) {
+    Task task = storedTask();
+    const std::string before = readFile(kWorking);
+    writeFile("/run/cp", "#!/bin/sh\nhead -c 20 \"$2\" > \"$3\"\n");
+    ASSERT_EQ(shell("chmod 755 /run/cp && mount -n --bind /run/cp /bin/cp"), 0);
+    for (int call = 0; call < 2; ++call) {
+        EXPECT_EQ(failure(TAVISchedTaskEdit(task.get())), 0x0B00U);
+        shell("sed -i 's/head.*/case $2 in *.tmp.*) head -c 20 \"$2\" > \"$3\";; *) cat \"$2\" > "
+              "\"$3\"; esac/' /run/cp");
+    }
+    shell("umount -n /bin/cp");
+    EXPECT_EQ(readFile(kWorking), before);
+    EXPECT_EQ(readFile(kPersistent), before);
+    EXPECT_EQ(readFile(kCrontab), std::string(kForeignCrontab) + kOwnLine);
+}
+
 TEST_F(Store, StrangeWorkingCopiesAreRefused) {
     storeIds("1");
     const std::string planted = readFile(kWorking);

@@ -835,6 +835,9 @@ TEST_F(CommandLine, SaysForWhatItWaits) {
     EXPECT_THAT(
         readFile("/tmp/second"),
         ContainsRegex("waiting for process [0-9]+ \\(tavisched\\), which changes tasks\ntask 2 "));
+    addHandler("slow", "/usr/tavi/bin/tavisched disable 2 >> /tmp/first 2>&1");
+    done("edit 1 --at 06:00");
+    EXPECT_THAT(readFile("/tmp/first"), HasSubstr("plug-in handler, cannot make another one"));
 }
 
 TEST_F(CommandLine, SaysWhatStandsInItsWay) {

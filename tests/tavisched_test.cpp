@@ -686,6 +686,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
     const struct {
         const char *harm, *found;
         bool repaired;
+        int problems = 1;
     } cases[] = {
         {"rm /run/crond.pid", "cron is not running", false},
         {"echo 999999 > /run/crond.pid", "cron is not running", false},
@@ -701,7 +702,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},
         {"touch /tmp/scheduled_tasks.tmp.999999", "whose process is gone", true},
         {"mount -n -t tmpfs -o size=4k small $PWD; cp -a /run/etc/scheduled_tasks $PWD",
-         "the file system of /usr/tavi/etc has no room left (bytes)", false},
+         "the file system of /usr/tavi/etc has no room left (bytes)", false, 3},
         {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},
         {"chown bin /tmp/lock", "/tmp/lock must belong to root", true},
         {"rm -r /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
@@ -723,18 +724,19 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"sed -i /id=1/d /etc/crontab", "lacks a task's line", true},
         {"echo '# /tmp/tavischedtask' >> /etc/crontab", "that no task asks for", true},
         {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "has other power-off lines", true},
-        {"printf x >> /etc/crontab", "has no line feed", false},
+        {"printf x >> /etc/crontab", "has no line feed", false, 2},
         {"sed -i '1i60 * * * * root x' /etc/crontab", "for its line 1: the minute \"60\"", false},
         {"rm /etc/crontab", "cannot be read", false},
         {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
-        {"sed -i 's/^run hour=.*/run hour=x/' $BOTH", "can be read: \"run hour\": \"x\"", false},
-        {"sed -i '/^cmd=/d' $BOTH", "\"cmd\" is missing", false},
+        {"sed -i 's/^run hour=.*/run hour=x/' $BOTH", "can be read: \"run hour\": \"x\"", false, 2},
+        {"sed -i '/^cmd=/d' $BOTH", "\"cmd\" is missing", false, 2},
         {"sed -i 's/^owner=.*/owner=54321/' $BOTH", "no user with the id 54321", false},
         {"sed -i 's/^\\[1]/[5]/' $BOTH", "section [5] of /tmp/scheduled_tasks says that", false},
-        {"sed -i 's/^\\[1]/[1/' $BOTH", "line 1: damaged header: [1", false},
+        {"sed -i 's/^\\[1]/[1/' $BOTH", "line 1: damaged header: [1", false, 2},
         {"echo \"$(cat scheduled_tasks)\" | tee -a $BOTH > /run/x", "[1] stands more than", false},
-        {"sed -i 's/^type=daily/type=Daily/' $BOTH", "not read as it is written: \"type\"", false},
-        {"echo '001=1 127 23 0' >> auto_power", "is there more than once", true},
+        {"sed -i 's/^type=daily/type=Daily/' $BOTH", "not read as it is written: \"type\"", false,
+         3},
+        {"echo '001=1 127 23 0' >> auto_power", "is there more than once", true, 2},
         {"echo '000=bad' >> auto_power", "power schedules cannot be read", false},
         {"install -Dm 775 /bin/true $HANDLERS/a", "task_scheduler/a is skipped: it must", false},
         {"mkdir -p $HANDLERS; echo '#!/bin/sh' > $HANDLERS/b; echo text > $HANDLERS/README",
@@ -758,6 +760,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         shell("rm -rf /run/etc; cp -a /usr/tavi/etc /run");
         shell("cd /usr/tavi/etc; { " + std::string(c.harm) + "; } 2> /dev/null");
         EXPECT_THAT(failed("check"), AllOf(HasSubstr("problem: "), HasSubstr(c.found))) << c.harm;
+        EXPECT_EQ(shell("exit $(grep -c problem: /tmp/out)"), c.problems) << c.harm;
         const std::string said = ended(c.repaired ? 0 : 1, "check --repair");
         EXPECT_TRUE(!c.repaired || said.find("repaired: ") != std::string::npos) << c.harm;
         // Nothing was lost by it, and cron's file is as good as before.

@@ -123,7 +123,7 @@ std::string faultsOfTool(int answer) {
 constexpr const char *kRan = "/home/ran";
 
 int ran(int32_t id) {
-    return TAVISchedTaskRun(id, 0, 0) == 0 ? 0 : 1;
+    return -TAVISchedTaskRun(id, 0, 0);
 }
 
 void runOther() {
@@ -188,11 +188,11 @@ std::vector<Operation> operations(char suite) {
     std::vector<Operation> all = {
         {"create", "kf", [] { return created("new"); }},
         {"edit", "kf", editedName},
-        {"remove", "kf", [] { return TAVISchedTaskRemove(2) == 0 ? 0 : 1; }},
+        {"remove", "kf", [] { return -TAVISchedTaskRemove(2); }},
         {"save", "kf", [] { return saved(); }, [] {}, nullptr, [] { return saved(1); }},
         {.name = "batch", .suites = "ktf", .run = batchDone, .isBatch = true},
         {.name = "power", .suites = "kf", .run = [] { return powerCreated(); }, .isPower = true},
-        {"sync", "ktf", [] { return TAVISchedTaskSync() == 0 ? 0 : 1; }},
+        {"sync", "ktf", [] { return -TAVISchedTaskSync(); }},
         {"first_create", "ktf", [] { return created("new"); },
          [] { shell("rm -r /tmp/* /usr/tavi/etc/*; sed -i /tavi/d /etc/crontab"); }},
         {"create_with_differing_files", "kt", [] { return created("new"); },
@@ -207,8 +207,7 @@ std::vector<Operation> operations(char suite) {
          [] { TAVISchedTaskConvertToJsonById(3, jsonOf3.data(), jsonOf3.size()); }},
         {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
         {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
-        {"missed", "f", [] { return TAVISchedMissedRunsFind() == 0 ? 0 : 1; }, missRuns,
-         faultsOfMissed}};
+        {"missed", "f", [] { return -TAVISchedMissedRunsFind(); }, missRuns, faultsOfMissed}};
     std::erase_if(
         all, [&](const Operation &operation) { return !std::strchr(operation.suites, suite); });
     return all;

@@ -243,31 +243,27 @@ TEST_F(Durability, FullFileSystems) {
     }
 }
 
-// What a torn copy took is room for the restored one.
-TEST_F(Durability, LongerWorkingCopyWithoutRoom) {
-    const State old = stateNow(listOfFreshProcess());
-    Small small("/tmp");
-    cutOff(isCopyTo(kWorking));
-    writeFile(kWorking, std::string(100000, 'x'));
-    shell("rm /tmp/scheduled_tasks.tmp*");
-    small.fill(0, false);
-    EXPECT_EQ(stateNow(listOfFreshProcess()), old);
-}
-
-// A working copy that cannot be restored for lack of room is not read, and nothing is changed.
+// What a torn copy took is room for the restored one. A working copy that cannot be restored for
+// lack of room is not read, and nothing is changed.
 TEST_F(Durability, TornWorkingCopyWithoutRoom) {
     const State old = stateNow(listOfFreshProcess());
     Small small("/tmp");
-    cutOff(isCopyTo(kWorking));
-    writeFile(kWorking, "");
-    shell("rm /tmp/scheduled_tasks.tmp*"); // that would be room enough
-    small.fill(0, false);
+    const auto tear = [&](size_t size) {
+        small.free();
+        cutOff(isCopyTo(kWorking));
+        writeFile(kWorking, std::string(size, 'x'));
+        shell("rm /tmp/scheduled_tasks.tmp*"); // that would be room enough
+        small.fill(0, false);
+    };
+    tear(100000);
+    EXPECT_EQ(stateNow(listOfFreshProcess()), old);
+    tear(0);
     EXPECT_EQ(listOfFreshProcess(), old.at("list"));
     EXPECT_EQ(inChild([] {
                   TAVI_SCHED_TASK task{};
-                  return TAVISchedTaskGetByID(3, &task) == 0 && task.id == 3 ? 0 : 1;
+                  return TAVISchedTaskGetByID(3, &task) + task.id;
               }),
-              0);
+              3);
     const std::string persistent = readFile(kPersistent);
     EXPECT_EQ(inChild([] { return created("new"); }), 1);
     EXPECT_EQ(readFile(kPersistent), persistent);

@@ -108,7 +108,6 @@ TEST_F(Durability, LossOfPower) {
              return call.name.starts_with("rename") && call.path == kRecord;
          }}};
     size_t state = 0;
-    Tally tally("durability: loss of power");
     for (const auto &[moment, isWanted] : moments) {
         for (const auto &[persistentLoss, losePersistent] : losses) {
             for (const auto &[workingLoss, loseWorking] : losses) {
@@ -125,9 +124,9 @@ TEST_F(Durability, LossOfPower) {
                     const std::string &list = wanted.at("list");
                     const bool isRight =
                         answer == 0 && stateNow(list) == wanted && listOfFreshProcess() == list;
-                    tally.add(std::string(moment) + ", persistent file " + persistentLoss +
-                                  ", working copy " + workingLoss + ", then " + name,
-                              isRight ? "" : std::to_string(answer));
+                    expectNone(isRight ? "" : std::to_string(answer),
+                               std::string(moment) + ", persistent file " + persistentLoss +
+                                   ", working copy " + workingLoss + ", then " + name);
                 }
             }
         }
@@ -212,8 +211,6 @@ void expectWholeChanges(const Snapshot &start, const std::string &folder, bool i
     const State stored = stateNow(listOfFreshProcess());
     start.restore();
     Small small(folder);
-    Tally tally(std::string("durability: ") + (isBatch ? "batch" : "edit") + " with " + folder +
-                " full of " + (inodes ? "inodes" : "bytes"));
     bool done = false;
     for (size_t rest = 0; rest < 60 && !done; rest += kStep) {
         small.free();
@@ -229,7 +226,7 @@ void expectWholeChanges(const Snapshot &start, const std::string &folder, bool i
             now[kCrontab] = stored.at(kCrontab);
         }
         const bool isRight = now == (answer == 0 ? stored : old) && fullList == now.at("list");
-        tally.add(std::to_string(rest) + " left", isRight ? "" : std::to_string(answer));
+        expectNone(isRight ? "" : std::to_string(answer), folder + " with " + std::to_string(rest));
     }
     EXPECT_TRUE(done);
 }

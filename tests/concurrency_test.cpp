@@ -146,12 +146,6 @@ void moveIn() {
     unlink(kWorking);
 }
 
-// Takes all the room, and gives it back.
-void fillAndFree() {
-    writeFile("/tmp/filler", std::string(300000, 'x'));
-    unlink("/tmp/filler");
-}
-
 void plantRunner() {
     writeFile(kRunner, "#!/bin/sh\ntouch /evil\n");
     chmod(kRunner, 0755);
@@ -226,29 +220,6 @@ TEST_F(LocalUser, NeverGivesRootATask) {
                               linesWith("id=1", kCrontab) == 1));
         });
     }
-}
-
-TEST_F(LocalUser, FillsAndFreesTmp) {
-    ASSERT_EQ(shell("mount -n -t tmpfs -o size=256k,mode=1777 small /tmp"), 0);
-    for (const char *const name : {"one", "two", "three"}) {
-        ASSERT_EQ(created(name, std::string(3000, 'x').c_str()), 0);
-    }
-    std::set<int> wanted = {1, 2, 3};
-    tryOften("/tmp filled and freed", fillAndFree, [&](long) {
-        const Task task = newTask();
-        if (task && TAVISchedTaskCreate(task.get()) == 0) {
-            wanted.insert(task->id);
-        }
-        const bool isRight = listedIds() == std::vector<int>(wanted.begin(), wanted.end());
-        if (wanted.size() > 6 && TAVISchedTaskRemove(*wanted.rbegin()) == 0) {
-            wanted.erase(*wanted.rbegin());
-        }
-        return isRight;
-    });
-    unlink("/tmp/filler");
-    EXPECT_EQ(readFile(kWorking), readFile(kPersistent));
-    EXPECT_THAT(leftovers(), IsEmpty());
-    shell("umount -n -l /tmp");
 }
 
 TEST_F(LocalUser, PlantsARunner) {

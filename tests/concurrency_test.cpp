@@ -135,12 +135,9 @@ std::string plantedTask() {
            "cmd=dG91Y2ggL2V2aWw=\nowner=0\nstate=enabled\ntype=daily\n";
 }
 
-void putAndTakeAway() {
+void plantTask() {
     writeFile(kWorking, plantedTask());
     unlink(kWorking);
-}
-
-void moveIn() {
     writeFile("/tmp/mine", plantedTask());
     rename("/tmp/mine", kWorking);
     unlink(kWorking);
@@ -203,23 +200,16 @@ class LocalUser : public SchedTest {
 
 // Root stores a machine's first task while the user is at it.
 TEST_F(LocalUser, NeverGivesRootATask) {
-    const struct {
-        const char *what;
-        void (*attack)();
-    } cases[] = {{"a task file put and taken away", putAndTakeAway},
-                 {"a task file moved in", moveIn}};
-    for (const auto &row : cases) {
-        tryOften(row.what, row.attack, [](long number) {
-            unlink(kWorking);
-            unlink(kPersistent);
-            writeFile(kCrontab, kForeignCrontab);
-            const bool done = (number % 4 == 3 ? addByTool() : created("root's")) == 0;
-            return linesWith("id=7", kCrontab) == 0 && !isRootsAndPlanted(kWorking) &&
-                   !isRootsAndPlanted(kPersistent) &&
-                   (!done || (linesWith("name=root's", kPersistent) == 1 &&
-                              linesWith("id=1", kCrontab) == 1));
-        });
-    }
+    tryOften("a task planted", plantTask, [](long number) {
+        unlink(kWorking);
+        unlink(kPersistent);
+        writeFile(kCrontab, kForeignCrontab);
+        const bool done = (number % 4 == 3 ? addByTool() : created("root's")) == 0;
+        return linesWith("id=7", kCrontab) == 0 && !isRootsAndPlanted(kWorking) &&
+               !isRootsAndPlanted(kPersistent) &&
+               (!done ||
+                (linesWith("name=root's", kPersistent) == 1 && linesWith("id=1", kCrontab) == 1));
+    });
 }
 
 TEST_F(LocalUser, PlantsARunner) {

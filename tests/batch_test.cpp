@@ -15,10 +15,6 @@ class Batch : public SchedTest {
         storedTask();
         before_ = stateNow();
     }
-    void TearDown() override {
-        TAVISchedChangeRollback();
-        SchedTest::TearDown();
-    }
 
     State before_;
 };

@@ -159,28 +159,24 @@ TEST_F(Convert, ChecksForeseeWhatComesBack) {
     EXPECT_EQ(failure(TAVISchedHashCheck(hash_, nullptr, 1)), 0x0D00U);
 }
 
-class Sort : public SchedTest {
-  protected:
-    // Sorts three tasks that lie in memory in this order, listed back to front; their names.
-    std::string sorted(const char *key, int direction) {
-        const char *const names[] = {"b", "B", "b"};
-        for (int i = 0; i < 3; ++i) {
-            tasks_[i].id = 10 - i;
-            TAVISchedCTaskSetName(&tasks_[i], names[i]);
-            tasks_[i].next = i == 0 ? nullptr : &tasks_[i - 1];
-        }
-        TAVI_SCHED_TASK *list = &tasks_[2];
-        result_ = TAVISchedTaskListSort(&list, key, direction);
-        std::string order;
-        for (const TAVI_SCHED_TASK *task = list; task; task = task->next) {
-            order += std::to_string(task->id) + task->name + " ";
-        }
-        return order;
-    }
+using Sort = SchedTest;
 
-    std::vector<TAVI_SCHED_TASK> tasks_{3};
-    int result_ = 0;
-};
+// Sorts three tasks that lie in memory in this order, listed back to front; their names.
+std::string sorted(const char *key, int direction) {
+    std::vector<TAVI_SCHED_TASK> tasks(3);
+    const char *const names[] = {"b", "B", "b"};
+    for (int i = 0; i < 3; ++i) {
+        tasks[i].id = 10 - i;
+        TAVISchedCTaskSetName(&tasks[i], names[i]);
+        tasks[i].next = i == 0 ? nullptr : &tasks[i - 1];
+    }
+    TAVI_SCHED_TASK *list = &tasks[2];
+    std::string order = TAVISchedTaskListSort(&list, key, direction) == 0 ? "" : "failed: ";
+    for (const TAVI_SCHED_TASK *task = list; task; task = task->next) {
+        order += std::to_string(task->id) + task->name + " ";
+    }
+    return order;
+}
 
 TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
     EXPECT_EQ(sorted("name", 1), "9B 8b 10b ");
@@ -189,9 +185,7 @@ TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
         EXPECT_EQ(sorted(key, 1), "10b 9B 8b ") << key;
         EXPECT_EQ(sorted(key, 0), "8b 9B 10b ") << key;
     }
-    EXPECT_EQ(result_, 0);
-    EXPECT_EQ(sorted("Id", 1), "8b 9B 10b ");
-    EXPECT_EQ(result_, -1);
+    EXPECT_EQ(sorted("Id", 1), "failed: 8b 9B 10b ");
     TAVI_SCHED_TASK *none = nullptr;
     EXPECT_EQ(TAVISchedTaskListSort(&none, "Id", 1), 0);
     EXPECT_THAT(logs(), IsEmpty());
@@ -200,8 +194,8 @@ TEST_F(Sort, TextsByBytesStableAndNumbersByPlace) {
 
 TEST_F(Sort, OutOfMemoryLeavesTheListAlone) {
     faults().callocFails = 3 * sizeof(void *);
-    EXPECT_EQ(sorted("name", 1), "8b 9B 10b ");
-    EXPECT_EQ(failure(result_), 0x0100U);
+    EXPECT_EQ(sorted("name", 1), "failed: 8b 9B 10b ");
+    EXPECT_EQ(PLATCErrGet(), 0x0100U);
     EXPECT_EQ(PLATCErrorGetLine(), 67);
     EXPECT_THAT(lastLog(true), HasSubstr("cpp:66 calloc [3] failed. Cannot allocate memory"));
 }

@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <cstdlib>
 #include <ctime>
-#include <dlfcn.h>
 #include <fcntl.h>
 #include <new>
 #include <pwd.h>
@@ -41,10 +40,6 @@ __attribute__((constructor)) void begin() {
     getpwuid(0); // for which the C library crashes without memory, at first
     present = static_cast<Faults *>(memory);
     present->file = file;
-}
-
-template <typename Function> Function next(Function, const char *name) {
-    return reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
 }
 
 bool fails(Fault kind) {
@@ -95,7 +90,7 @@ using support::fails;
 using support::Fault;
 using support::faults;
 using support::isOutOfMemory;
-using support::next;
+using support::original;
 
 extern "C" {
 
@@ -123,7 +118,7 @@ void *calloc(size_t count, size_t size) noexcept {
 
 pid_t waitpid(pid_t pid, int *status, int options) {
     int ended = 0;
-    const pid_t result = next(waitpid, "waitpid")(pid, &ended, options);
+    const pid_t result = original(waitpid, "waitpid")(pid, &ended, options);
     if (result > 0 && fails(Fault::Wait)) {
         errno = ECHILD;
         return -1;
@@ -138,12 +133,12 @@ int posix_spawn(pid_t *pid, const char *path, const posix_spawn_file_actions_t *
                 const posix_spawnattr_t *attributes, char *const *argv, char *const *envp) {
     return fails(Fault::Spawn)
                ? EAGAIN
-               : next(posix_spawn, "posix_spawn")(pid, path, actions, attributes, argv, envp);
+               : original(posix_spawn, "posix_spawn")(pid, path, actions, attributes, argv, envp);
 }
 
 tm *localtime_r(const time_t *time, tm *local) noexcept {
     errno = EOVERFLOW;
-    return fails(Fault::Time) ? nullptr : next(localtime_r, "localtime_r")(time, local);
+    return fails(Fault::Time) ? nullptr : original(localtime_r, "localtime_r")(time, local);
 }
 
 tm *localtime(const time_t *time) noexcept {
@@ -154,7 +149,7 @@ tm *localtime(const time_t *time) noexcept {
 
 time_t mktime(tm *local) noexcept {
     errno = EOVERFLOW;
-    return fails(Fault::Time) ? -1 : next(mktime, "mktime")(local);
+    return fails(Fault::Time) ? -1 : original(mktime, "mktime")(local);
 }
 
 int sqlite3_open_v2(const char *path, sqlite3 **database, int flags, const char *vfs) {
@@ -162,7 +157,7 @@ int sqlite3_open_v2(const char *path, sqlite3 **database, int flags, const char 
         *database = nullptr;
         return SQLITE_CANTOPEN;
     }
-    const int result = next(sqlite3_open_v2, "sqlite3_open_v2")(path, database, flags, vfs);
+    const int result = original(sqlite3_open_v2, "sqlite3_open_v2")(path, database, flags, vfs);
     if (!*database) {
         return result;
     }

@@ -6,6 +6,7 @@
 #include <array>
 #include <atomic>
 #include <cstddef>
+#include <dlfcn.h>
 
 namespace support {
 
@@ -38,6 +39,11 @@ void fail(Fault kind, size_t call = 1, bool isLasting = false);
 // To be called in a process before it becomes a program in which calls are to fail, with the path
 // of the library.
 void letProgramFail(const char *library);
+
+// The system's own function of that name.
+template <typename Function> Function original(Function, const char *name) {
+    return reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
+}
 
 // What is called while it lives does not count.
 class OwnAllocations {

@@ -133,15 +133,10 @@ void runOther() {
 
 std::string recordsOf(int32_t id) {
     std::string text;
-    TAVI_SCHED_RUN_FILTER filter{};
-    filter.taskId = id;
-    const auto take = [](void *to, const TAVI_SCHED_RUN *run) {
-        *static_cast<std::string *>(to) += std::to_string(run->taskId) + ":" +
-                                           std::to_string(run->due) + ":" +
-                                           std::to_string(run->result) + " ";
-        return 0;
-    };
-    EXPECT_GE(TAVISchedRunList(&filter, take, &text), 0);
+    for (const TAVI_SCHED_RUN &run : runs(ofTask(id))) {
+        text += std::to_string(run.taskId) + ":" + std::to_string(run.due) + ":" +
+                std::to_string(run.result) + " ";
+    }
     return text;
 }
 
@@ -267,9 +262,8 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
     }
 
     // Goes through points, each time from the start.
-    void tryAll(const char *what, const std::vector<size_t> &points, End end,
+    void tryAll(const std::string &what, const std::vector<size_t> &points, End end,
                 const std::function<Try(size_t)> &tryAt) {
-        Tally tally(std::string(GetParam().name) + ", " + what);
         for (const size_t point : points) {
             start_->restore();
             unlink(kRan);
@@ -281,8 +275,8 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
                 tried.answer = 0;
             }
             if (tried.acted) {
-                tally.add(std::to_string(point) + " " + tried.where + " " + said,
-                          faultsAfter(tried.answer, end));
+                expectNone(faultsAfter(tried.answer, end),
+                           what + std::to_string(point) + " " + tried.where + " " + said);
             }
         }
     }

@@ -17,7 +17,6 @@ constexpr size_t kStep = 1;
 #endif
 
 constexpr const char *kPower = "/usr/tavi/etc/auto_power";
-constexpr const char *kStatus = "/tmp/sched_status.sqlite";
 constexpr const char *kRecord = "/usr/tavi/etc/scheduled_tasks.journal";
 
 // A handler of changes of tasks, or of another plug-in, from the lines of a shell script.
@@ -48,6 +47,10 @@ inline void addRunning() {
           std::to_string(getpid()) + ", 1, '', 1, 2)");
 }
 
+// The runs on record of a task, or with -1 of all; those that are wanted, the newest first.
+TAVI_SCHED_RUN_FILTER ofTask(int32_t id);
+std::vector<TAVI_SCHED_RUN> runs(TAVI_SCHED_RUN_FILTER filter);
+
 // By path; a file that is not there is "(none)", and the crontab's lines are sorted: they may
 // change places. With "list", what a process that has just started lists.
 using State = std::map<std::string, std::string>;
@@ -66,20 +69,8 @@ class Snapshot {
     std::map<std::string, std::pair<std::string, std::filesystem::file_time_type>> files_;
 };
 
-// So many of something were tried, and how many held; told and checked when it ends.
-class Tally {
-  public:
-    explicit Tally(std::string what) : what_(std::move(what)) {}
-    ~Tally();
-    Tally(const Tally &) = delete;
-    Tally &operator=(const Tally &) = delete;
-    // "" when it held and left nothing; of others a few are shown, with what the library logged.
-    void add(const std::string &where, std::string fault);
-
-  private:
-    std::string what_;
-    size_t tried_ = 0, held_ = 0;
-};
+// At one of many points nothing is wrong, and nothing left; else it tells what the library logged.
+void expectNone(std::string faults, const std::string &where);
 
 // Of these points those that a test takes: all with TAVI_TEST_ALL, else at most so many.
 std::vector<size_t> chosen(const std::vector<size_t> &points, size_t most);

@@ -243,14 +243,12 @@ TEST_F(Platform, ProgramsAndProcesses) {
     }
     // Nothing that the caller is sent is eaten.
     writeFile("/tmp/input", "line\n");
-    const int own = dup(0);
-    close(0);
-    EXPECT_EQ(open("/tmp/input", O_RDONLY), 0);
     const char *const reads[] = {"-c", "read line && exit 4; exit 5", nullptr};
-    EXPECT_EQ(PLATCExec("/bin/sh", reads), 5);
-    EXPECT_EQ(lseek(0, 0, SEEK_CUR), 0);
-    dup2(own, 0);
-    close(own);
+    const auto readInput = [&] {
+        dup2(open("/tmp/input", O_RDONLY), 0);
+        return PLATCExec("/bin/sh", reads) + static_cast<int>(lseek(0, 0, SEEK_CUR));
+    };
+    EXPECT_EQ(inChild(readInput), 5);
     const pid_t child = startZombie();
     EXPECT_EQ(PLATCProcAlive(child), 0);
     waitpid(child, nullptr, 0);

@@ -8,7 +8,6 @@
 #include <cstdarg>
 #include <cstdlib>
 #include <cstring>
-#include <dlfcn.h>
 #include <filesystem>
 #include <fstream>
 #include <regex>
@@ -55,10 +54,6 @@ Journal &journal() {
     static auto *const shared = static_cast<Journal *>(
         mmap(nullptr, sizeof(Journal), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
     return *shared;
-}
-
-template <typename Function> Function next(const char *name) {
-    return reinterpret_cast<Function>(dlsym(RTLD_NEXT, name));
 }
 
 std::vector<std::string> calledOnFiles;
@@ -253,8 +248,9 @@ void syslog(int priority, const char *format, ...) {
 }
 
 long sysconf(int name) noexcept {
-    static auto *const real = support::next<long (*)(int)>("sysconf");
-    return name == _SC_CLK_TCK && fakes.clockTicks > 0 ? fakes.clockTicks : real(name);
+    return name == _SC_CLK_TCK && fakes.clockTicks > 0
+               ? fakes.clockTicks
+               : support::original(sysconf, "sysconf")(name);
 }
 
 unsigned int sleep(unsigned int seconds) {
@@ -269,10 +265,9 @@ int usleep(useconds_t microseconds) {
 
 int rename(const char *from, const char *to) noexcept {
     const support::OwnAllocations own;
-    auto *const real = support::next<int (*)(const char *, const char *)>("rename");
     support::calledOnFiles.push_back("rename " + std::string(from) + " " + to);
     errno = EXDEV;
-    return fakes.renameFails ? -1 : real(from, to);
+    return fakes.renameFails ? -1 : support::original(rename, "rename")(from, to);
 }
 
 int fsync(int fd) {
@@ -283,7 +278,7 @@ int fsync(int fd) {
     const bool fails =
         fakes.fsyncFails || (fakes.folderFsyncFails && std::filesystem::is_directory(path, error));
     errno = EIO;
-    return fails ? -1 : support::next<int (*)(int)>("fsync")(fd);
+    return fails ? -1 : support::original(fsync, "fsync")(fd);
 }
 
 } // extern "C"

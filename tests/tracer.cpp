@@ -14,6 +14,7 @@
 #include <fstream>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
+#include <map>
 #include <set>
 #include <sys/prctl.h>
 #include <sys/ptrace.h>
@@ -32,74 +33,54 @@ namespace fs = std::filesystem;
 
 constexpr int kNone = -1;
 
+// Calls that have the same in the same places.
 struct Kind {
-    const char *name;
-    long number;
     int path = kNone;       // the argument that is a path
     int descriptor = kNone; // or a descriptor
     int length = kNone;     // the argument that says how much is written
     int flags = kNone;      // an open's flags
     bool onlyFailing = false;
+    std::map<long, const char *> names{}; // by number
 };
 
+#define CALL(name)                                                                                 \
+    { __NR_##name, #name }
 // Not every machine has the older ones.
 const std::vector<Kind> kKinds = {
 #ifdef __NR_open
-    {.name = "open", .number = __NR_open, .path = 0, .flags = 1},
-    {.name = "creat", .number = __NR_creat, .path = 0},
-    {.name = "rename", .number = __NR_rename, .path = 0},
-    {.name = "link", .number = __NR_link, .path = 0},
-    {.name = "symlink", .number = __NR_symlink, .path = 1},
-    {.name = "unlink", .number = __NR_unlink, .path = 0},
-    {.name = "mkdir", .number = __NR_mkdir, .path = 0},
-    {.name = "rmdir", .number = __NR_rmdir, .path = 0},
-    {.name = "chmod", .number = __NR_chmod, .path = 0},
-    {.name = "chown", .number = __NR_chown, .path = 0},
-    {.name = "access", .number = __NR_access, .path = 0, .onlyFailing = true},
-    {.name = "fork", .number = __NR_fork, .onlyFailing = true},
-    {.name = "vfork", .number = __NR_vfork, .onlyFailing = true},
+    {.path = 0, .flags = 1, .names = {CALL(open)}},
+    {.path = 0,
+     .names = {CALL(creat), CALL(rename), CALL(link), CALL(unlink), CALL(mkdir), CALL(rmdir),
+               CALL(chmod), CALL(chown)}},
+    {.path = 1, .names = {CALL(symlink)}},
+    {.path = 0, .onlyFailing = true, .names = {CALL(access)}},
+    {.onlyFailing = true, .names = {CALL(fork), CALL(vfork)}},
 #endif
 #ifdef __NR_renameat
-    {.name = "renameat", .number = __NR_renameat, .path = 1},
+    {.path = 1, .names = {CALL(renameat)}},
 #endif
-    {.name = "openat", .number = __NR_openat, .path = 1, .flags = 2},
-    {.name = "write", .number = __NR_write, .descriptor = 0, .length = 2},
-    {.name = "pwrite", .number = __NR_pwrite64, .descriptor = 0, .length = 2},
-    {.name = "writev", .number = __NR_writev, .descriptor = 0},
-    {.name = "copy_file_range", .number = __NR_copy_file_range, .descriptor = 2, .length = 4},
-    {.name = "sendfile", .number = __NR_sendfile, .descriptor = 0, .length = 3},
-    {.name = "fallocate", .number = __NR_fallocate, .descriptor = 0},
-    {.name = "renameat2", .number = __NR_renameat2, .path = 1},
-    {.name = "linkat", .number = __NR_linkat, .path = 1},
-    {.name = "symlinkat", .number = __NR_symlinkat, .path = 2},
-    {.name = "unlinkat", .number = __NR_unlinkat, .path = 1},
-    {.name = "mkdirat", .number = __NR_mkdirat, .path = 1},
-    {.name = "truncate", .number = __NR_truncate, .path = 0},
-    {.name = "ftruncate", .number = __NR_ftruncate, .descriptor = 0},
-    {.name = "fchmod", .number = __NR_fchmod, .descriptor = 0},
-    {.name = "fchmodat", .number = __NR_fchmodat, .path = 1},
-    {.name = "fchown", .number = __NR_fchown, .descriptor = 0},
-    {.name = "fchownat", .number = __NR_fchownat, .path = 1},
-    {.name = "utimensat", .number = __NR_utimensat, .descriptor = 0},
-    {.name = "fsync", .number = __NR_fsync, .descriptor = 0},
-    {.name = "fdatasync", .number = __NR_fdatasync, .descriptor = 0},
-    {.name = "read", .number = __NR_read, .descriptor = 0, .onlyFailing = true},
-    {.name = "pread", .number = __NR_pread64, .descriptor = 0, .onlyFailing = true},
-    {.name = "fstat", .number = __NR_fstat, .descriptor = 0, .onlyFailing = true},
-    {.name = "newfstatat",
-     .number = __NR_newfstatat,
-     .path = 1,
-     .descriptor = 0,
-     .onlyFailing = true},
-    {.name = "faccessat", .number = __NR_faccessat, .path = 1, .onlyFailing = true},
-    {.name = "getdents64", .number = __NR_getdents64, .descriptor = 0, .onlyFailing = true},
+    {.path = 1, .flags = 2, .names = {CALL(openat)}},
+    {.path = 1,
+     .names = {CALL(renameat2), CALL(linkat), CALL(unlinkat), CALL(mkdirat), CALL(fchmodat),
+               CALL(fchownat)}},
+    {.path = 2, .names = {CALL(symlinkat)}},
+    {.path = 0, .names = {CALL(truncate)}},
+    {.descriptor = 0, .length = 2, .names = {CALL(write), CALL(pwrite64)}},
+    {.descriptor = 0, .length = 3, .names = {CALL(sendfile)}},
+    {.descriptor = 2, .length = 4, .names = {CALL(copy_file_range)}},
+    {.descriptor = 0,
+     .names = {CALL(writev), CALL(fallocate), CALL(ftruncate), CALL(fchmod), CALL(fchown),
+               CALL(utimensat), CALL(fsync), CALL(fdatasync)}},
+    {.descriptor = 0,
+     .onlyFailing = true,
+     .names = {CALL(read), CALL(pread64), CALL(fstat), CALL(getdents64), CALL(flock)}},
+    {.path = 1, .descriptor = 0, .onlyFailing = true, .names = {CALL(newfstatat), CALL(faccessat)}},
 #ifndef __SANITIZE_ADDRESS__ // which itself looks with it whether memory is there
-    {.name = "pipe2", .number = __NR_pipe2, .onlyFailing = true},
+    {.onlyFailing = true, .names = {CALL(pipe2)}},
 #endif
-    {.name = "flock", .number = __NR_flock, .descriptor = 0, .onlyFailing = true},
-    {.name = "clone", .number = __NR_clone, .onlyFailing = true},
-    {.name = "clone3", .number = __NR_clone3, .onlyFailing = true},
+    {.onlyFailing = true, .names = {CALL(clone), CALL(clone3)}},
 };
+#undef CALL
 
 // ---- The filter ----
 
@@ -107,9 +88,11 @@ void installFilter() {
     std::vector<sock_filter> program = {
         BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr))};
     for (const Kind &kind : kKinds) {
-        program.push_back(
-            BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(kind.number), 0, 1));
-        program.push_back(BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRACE));
+        for (const auto &[number, name] : kind.names) {
+            program.push_back(
+                BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(number), 0, 1));
+            program.push_back(BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRACE));
+        }
     }
     program.push_back(BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW));
     const sock_fprog filter{.len = static_cast<unsigned short>(program.size()),
@@ -231,7 +214,7 @@ class Following {
         const bool known = ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), pid,
                                   sizeof info, &info) > 0;
         const auto kind = std::find_if(kKinds.begin(), kKinds.end(), [&](const Kind &one) {
-            return static_cast<uint64_t>(one.number) == info.seccomp.nr;
+            return one.names.contains(static_cast<long>(info.seccomp.nr));
         });
         if (!known || kind == kKinds.end() || !counts(*kind, pid, info)) {
             return;
@@ -248,14 +231,10 @@ class Following {
     }
 
     bool counts(const Kind &kind, pid_t pid, const Info &info) const {
-        const bool failing = plan_.calls == Calls::Failing;
-        const uint64_t *const arguments = info.seccomp.args;
         const bool changes =
-            kind.flags == kNone || (arguments[kind.flags] & (O_CREAT | O_TRUNC)) != 0;
-        if (kind.onlyFailing || !changes) {
-            return failing && !programs_.contains(pid);
-        }
-        return true;
+            !kind.onlyFailing &&
+            (kind.flags == kNone || (info.seccomp.args[kind.flags] & (O_CREAT | O_TRUNC)) != 0);
+        return changes || (plan_.calls == Calls::Failing && !programs_.contains(pid));
     }
 
     Call describe(const Kind &kind, pid_t pid, const Info &info) const {
@@ -264,7 +243,7 @@ class Following {
         if (path.empty() && kind.descriptor != kNone) {
             path = pathOfDescriptor(pid, arguments[kind.descriptor]);
         }
-        return {.name = kind.name,
+        return {.name = kind.names.at(static_cast<long>(info.seccomp.nr)),
                 .path = std::move(path),
                 .isPrograms = programs_.contains(pid),
                 .isWrite = kind.length != kNone};
@@ -274,10 +253,8 @@ class Following {
         run_.acted = true;
         if (plan_.act == Act::KillAll) {
             kill(processes_);
-        } else if (plan_.act == Act::KillCaller) {
-            kill({caller_});
-        } else if (plan_.act == Act::KillProgram) {
-            kill({pid});
+        } else if (plan_.act == Act::KillCaller || plan_.act == Act::KillProgram) {
+            kill({plan_.act == Act::KillCaller ? caller_ : pid});
         } else if (plan_.act == Act::Fail) {
             run_.acted = failCall(pid, plan_.error);
         } else if (plan_.act == Act::HalfThenKillAll) {
@@ -290,7 +267,7 @@ class Following {
     // Programs ask for more than there is.
     static uint64_t halfOf(const Kind &kind, pid_t pid, const Info &info) {
         const uint64_t length = info.seccomp.args[kind.length];
-        const uint64_t from = info.seccomp.args[kind.number == __NR_copy_file_range ? 0 : 1];
+        const uint64_t from = info.seccomp.args[info.seccomp.nr == __NR_copy_file_range ? 0 : 1];
         std::error_code error;
         return kind.length > 2
                    ? std::min(length, fs::file_size(pathOfDescriptor(pid, from), error)) / 2

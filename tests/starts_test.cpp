@@ -93,22 +93,14 @@ TEST_F(Starts, WhereTheClockIsChanged) {
 // The caller's time zone may have changed; nothing else has asked for it here.
 TEST_F(Starts, AreInTheZoneOfTheMoment) {
     const Task task = taskOf({"1970-01-03 00:00", Daily, {}, {9, 0}, 0, 0, ""});
-    const auto next = [&](const char *zone) {
-        setenv("TZ", zone, 1);
-        int64_t start = 0;
-        EXPECT_EQ(TAVISchedTaskNextStart(task.get(), 86400, &start), 1);
-        return start;
-    };
-    const auto first = [&](const char *zone) {
-        setenv("TZ", zone, 1);
-        int64_t start = 0;
-        EXPECT_EQ(TAVISchedTaskStarts(task.get(), 86400, 3 * 86400, &start, 1), 1);
-        return start;
-    };
-    for (const int64_t hour : {1, 2}) {
-        const std::string zone = "AAA-" + std::to_string(hour);
-        EXPECT_EQ(next(zone.c_str()), 86400 + (9 - hour) * 3600);
-        EXPECT_EQ(first("BBB-3"), 86400 + 6 * 3600);
+    for (const int hour : {1, 2}) {
+        int64_t next = 0, first = 0;
+        setenv("TZ", ("AAA-" + std::to_string(hour)).c_str(), 1);
+        EXPECT_EQ(TAVISchedTaskNextStart(task.get(), 86400, &next), 1);
+        setenv("TZ", "BBB-3", 1);
+        EXPECT_EQ(TAVISchedTaskStarts(task.get(), 86400, 3 * 86400, &first, 1), 1);
+        EXPECT_EQ(next, 86400 + (9 - hour) * 3600);
+        EXPECT_EQ(first, 86400 + 6 * 3600);
     }
 }
 

@@ -203,16 +203,11 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
     EXPECT_EQ(task.canRunTaskSameTime, 1);
     done("edit 1 --no-overlap --monthly 3 --every 2");
     EXPECT_EQ(done("show 1 | sed '/^First day/s/ 20.*/ x/; s/ 20..-..-03 / x /'"),
-              "Task 1: Größe\n"
-              "Kind           task (tavischedule)\n"
-              "State          enabled\n"
+              "Task 1: Größe\nKind           task (tavischedule)\nState          enabled\n"
               "Schedule       monthly on day 3 at 23:15 every 2 h until 23:15\n"
-              "Next run       x 23:15\n"
-              "Last run       none on record\n"
-              "Owner          daemon (1)\n"
-              "Command        echo a\n               b\n"
-              "Action         -\n"
-              "Application    a.b\n  name         -\n  arguments    -\n"
+              "Next run       x 23:15\nLast run       none on record\n"
+              "Owner          daemon (1)\nCommand        echo a\n               b\n"
+              "Action         -\nApplication    a.b\n  name         -\n  arguments    -\n"
               "Overlap        waits while an earlier run goes on, may start while another task of "
               "its application runs\n"
               "Web            may be listed, edited, renamed, given another owner, run, deleted\n"

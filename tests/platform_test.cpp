@@ -1,5 +1,6 @@
 // The portable platform where the library's own tests do not reach.
 #include "machine.h"
+#include "platplugin.h"
 #include "tavisdk.h"
 
 #include <algorithm>
@@ -215,6 +216,10 @@ TEST_F(Platform, WritersFlushBeforeAndAfterTheRename) {
 }
 
 TEST_F(Platform, WritersRemoveWhatDeadOnesLeft) {
+    PLATPLUGIN *plugin = nullptr;
+    EXPECT_EQ(PLATPluginInit("any", "thing", &plugin), 0);
+    EXPECT_EQ(failure(PLATPluginAction(6, plugin)), 0x0D00U); // no phase
+    EXPECT_EQ(PLATPluginExit(&plugin), 0);
     const pid_t child = startZombie();
     const std::string dead = "." + std::to_string(child);
     const std::string left = dead + ".aB3dEf";

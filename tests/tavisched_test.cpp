@@ -364,7 +364,8 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     EXPECT_THAT(dry, Not(HasSubstr("same")));
     EXPECT_THAT(run("check"), HasSubstr("note: task 3 (Task 3): task 1, of the same application"));
     const char *const note = "\"problem\": false,\"task\": 3,\"what\": \"task 3 (Task 3): its runs";
-    EXPECT_THAT(failed("check --json"), AllOf(HasSubstr(note), HasSubstr("\"problem\": true")));
+    EXPECT_THAT(failed("check --json"), AllOf(HasSubstr(note), HasSubstr("\"problem\": true"),
+                                              ContainsRegex("\"advice\": \"[a-z]")));
     shell("rm /tmp/tavischedtask");
     EXPECT_THAT(run("check --repair --json"), HasSubstr("{\"repaired\": \""));
 }
@@ -383,6 +384,7 @@ TEST_F(CommandLine, ShowsTheCalendar) {
     }
     EXPECT_THAT(done("calendar --days 2 --past 0"), HasSubstr("\nA column is 1 h."));
     EXPECT_THAT(done("calendar --days 90"), ContainsRegex("\n3 same .*22222"));
+    EXPECT_EQ(done("calendar --json | sed -n '/\"days\"/,/]/p' | grep -c T00:00"), "8\n");
     const std::string json = done("calendar --json");
     EXPECT_THAT(json, Not(ContainsRegex("2, *\n *71270700"))); // both at 07:00
     for (const char *const part : {"\"result\": \"exit 3\"", "T05:00:00", "\"power\": \"off\"",

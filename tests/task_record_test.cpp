@@ -2,10 +2,10 @@
 #include "support.h"
 
 #include <cstring>
-#include <iterator>
 #include <set>
 #include <tuple>
 #include <type_traits>
+#include <utility>
 
 namespace {
 

@@ -37,14 +37,15 @@ class Page:
                                    "dispatchEvent(new Event('cockpit-style'))", name)
 
     def find(self, selector):
-        return self.driver.find_element(By.CSS_SELECTOR, selector)
+        """Waits for it, as a view is drawn a moment after the click that leads there."""
+        return machine.until(lambda: self.all(selector), f"there is {selector}")[0]
 
     def all(self, selector):
         return self.driver.find_elements(By.CSS_SELECTOR, selector)
 
     def text(self, selector="body"):
         try:
-            return self.find(selector).text
+            return self.driver.find_element(By.CSS_SELECTOR, selector).text
         except (NoSuchElementException, StaleElementReferenceException):
             return ""
 
@@ -74,7 +75,8 @@ class Page:
         machine.until(lambda: not self.all("dialog"), "the question is over")
 
     def field(self, title):
-        label = self.driver.find_element(By.XPATH, f"//label[normalize-space(text())='{title}']")
+        labels = By.XPATH, f"//label[normalize-space(text())='{title}']"
+        label = machine.until(lambda: self.driver.find_elements(*labels), f"there is {title!r}")[0]
         control = label.get_attribute("for")
         return self.find(f"#{control}") if control else label.find_element(By.CSS_SELECTOR, "input, select")
 

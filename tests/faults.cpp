@@ -1,4 +1,4 @@
-// Functions of the system that fail when they are told to.
+// The clock, and functions of the system that fail when they are told to.
 #include "faults.h"
 
 #include <cerrno>
@@ -26,7 +26,8 @@ Faults *present = &none;
 // A program that is started for the tests has theirs, but what it starts itself is another one.
 __attribute__((constructor)) void begin() {
     const char *const inherited = std::getenv(kVariable);
-    const int file = inherited ? std::atoi(inherited) : memfd_create("faults", 0);
+    const int file =
+        inherited ? open(inherited, O_RDWR | O_CLOEXEC) : memfd_create("faults", MFD_CLOEXEC);
     void *const memory =
         ftruncate(file, sizeof(Faults)) == 0
             ? mmap(nullptr, sizeof(Faults), PROT_READ | PROT_WRITE, MAP_SHARED, file, 0)
@@ -34,12 +35,21 @@ __attribute__((constructor)) void begin() {
     if (memory == MAP_FAILED) {
         std::abort();
     }
-    fcntl(file, F_SETFD, FD_CLOEXEC);
     unsetenv(kVariable);
     unsetenv("LD_PRELOAD");
     getpwuid(0); // for which the C library crashes without memory, at first
     present = static_cast<Faults *>(memory);
-    present->file = file;
+    if (!inherited) {
+        present->owner = getpid();
+        present->file = file;
+    }
+}
+
+constexpr const char *kLibrary = "/home/faults.so"; // in which there is no blank
+
+std::string placeFor(const char *library) {
+    (void)!symlink(library, kLibrary);
+    return "/proc/" + std::to_string(faults().owner) + "/fd/" + std::to_string(faults().file);
 }
 
 bool fails(Fault kind) {
@@ -75,13 +85,14 @@ void fail(Fault kind, size_t call, bool isLasting) {
     all.kind = kind;
 }
 
-void letProgramFail(const char *library) {
+void shareWithProgram(const char *library) {
     const OwnAllocations own;
-    fcntl(faults().file, F_SETFD, 0);
-    setenv(kVariable, std::to_string(faults().file).c_str(), 1);
-    constexpr const char *kName = "/home/faults.so"; // in which there is no blank
-    (void)!symlink(library, kName);
-    setenv("LD_PRELOAD", kName, 1);
+    setenv(kVariable, placeFor(library).c_str(), 1);
+    setenv("LD_PRELOAD", kLibrary, 1);
+}
+
+std::string sharedInShell(const char *library) {
+    return std::string(kVariable) + "=" + placeFor(library) + " LD_PRELOAD=" + kLibrary + " ";
 }
 
 } // namespace support
@@ -134,6 +145,13 @@ int posix_spawn(pid_t *pid, const char *path, const posix_spawn_file_actions_t *
     return fails(Fault::Spawn)
                ? EAGAIN
                : original(posix_spawn, "posix_spawn")(pid, path, actions, attributes, argv, envp);
+}
+
+time_t time(time_t *result) noexcept {
+    timespec clock{};
+    clock_gettime(CLOCK_REALTIME, &clock);
+    const time_t now = faults().now != 0 ? faults().now.load() : clock.tv_sec;
+    return result ? *result = now : now;
 }
 
 tm *localtime_r(const time_t *time, tm *local) noexcept {

@@ -101,7 +101,7 @@ template <typename... Arguments> int tool(Arguments... arguments) {
     dup2(null, 1);
     dup2(open(kSaid, O_WRONLY | O_CREAT | O_TRUNC, 0600), 2);
     if (faults().kind != Fault::None) {
-        letProgramFail(FAULTS);
+        shareWithProgram(FAULTS);
     }
     return execl(TAVISCHED, TAVISCHED, arguments..., nullptr);
 }
@@ -165,9 +165,9 @@ std::string findMissed() {
 
 // Two days later, and one of the runs is known.
 void missRuns() {
-    *fakes.now += 2 * 86400;
+    faults().now += 2 * 86400;
     query("INSERT INTO task_status (pid, timestamp, task_id, status_code) VALUES (1, " +
-          std::to_string(*fakes.now / 86400 * 86400 - 86400) + ", 2, 3)");
+          std::to_string(faults().now / 86400 * 86400 - 86400) + ", 2, 3)");
     const Snapshot before;
     missedRuns = findMissed();
     before.restore();
@@ -243,7 +243,7 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
         setenv("ASAN_OPTIONS",
                "abort_on_error=1:detect_leaks=0:verify_asan_link_order=0:alloc_dealloc_mismatch=0",
                1);
-        fakes.now = time(nullptr);
+        faults().now = time(nullptr);
         ASSERT_EQ(created("one"), 0);
         ASSERT_EQ(created("two"), 0);
         ASSERT_EQ(created("three", "printf x >> /home/ran"), 0);

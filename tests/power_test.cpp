@@ -14,7 +14,7 @@ class Power : public SchedTest {
     void SetUp() override {
         SchedTest::SetUp();
         ASSERT_EQ(TAVISchedBackendInit(), 0);
-        fakes.now = at("2024-05-08 09:00"); // a Wednesday
+        faults().now = at("2024-05-08 09:00"); // a Wednesday
         ASSERT_EQ(shell("mountpoint -q /sys/class || { mount -n -t tmpfs class /sys/class && "
                         "mkdir -p /sys/class/rtc/rtc0; }; : > /sys/class/rtc/rtc0/wakealarm"),
                   0);
@@ -149,7 +149,7 @@ TEST_F(Power, EntriesAsTheyAreApplied) {
     };
     setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1); // summer begins on Sunday, 31 March
     tzset();
-    fakes.now = at("2024-03-30 09:00");
+    faults().now = at("2024-03-30 09:00");
     for (const auto &c : cases) {
         writeFile(kCrontab, kForeignCrontab);
         writeFile("/sys/class/rtc/rtc0/wakealarm", "");

@@ -360,7 +360,7 @@ TEST_F(Records, AnIdThatIsGivenAgain) {
 }
 
 TEST_F(Records, MissedTimes) {
-    fakes.now = at("2024-05-08 07:00");
+    faults().now = at("2024-05-08 07:00");
     Task task = newTask("true");
     task->type = TAVI_SCHED_TYPE_DAILY;
     task->runHour = 8;
@@ -369,7 +369,7 @@ TEST_F(Records, MissedTimes) {
     ASSERT_EQ(TAVISchedTaskCreate(task.get()), 0);
     // What is known to be missed after a look at that moment, which starts and changes take too.
     const auto missed = [](const char *moment, int (*look)() = TAVISchedMissedRunsFind) {
-        fakes.now = at(moment);
+        faults().now = at(moment);
         EXPECT_EQ(look(), 0);
         std::string times;
         for (const TAVI_SCHED_RUN &run : runs(ofTask(1))) {
@@ -381,12 +381,12 @@ TEST_F(Records, MissedTimes) {
         return times;
     };
     const auto change = [&](const char *moment) {
-        fakes.now = at(moment);
+        faults().now = at(moment);
         EXPECT_EQ(TAVISchedTaskEdit(task.get()), 0);
     };
     EXPECT_EQ(missed("2024-05-08 07:00", TAVISchedStart), "");
     // cron starts it at 8, and not at 10.
-    fakes.now = at("2024-05-08 08:00");
+    faults().now = at("2024-05-08 08:00");
     ASSERT_EQ(TAVISchedTaskRun(1, 1, 1), 0);
     waitForChildren();
     EXPECT_EQ(missed("2024-05-08 10:02"), ""); // it may be on its way
@@ -410,7 +410,7 @@ TEST_F(Records, MissedTimes) {
     change("2024-07-04 07:01");
     EXPECT_THAT(missed("2024-07-04 07:02"), StartsWith("01 07:00 "));
     EXPECT_THAT(missed("2024-07-04 07:05"), StartsWith("04 07:00 01 07:00 "));
-    fakes.now = at("2024-07-05 07:00") + 30;
+    faults().now = at("2024-07-05 07:00") + 30;
     EXPECT_EQ(TAVISchedTaskEdit(task.get()) + TAVISchedTaskRun(1, 1, 1), 0);
     waitForChildren();
     EXPECT_TRUE(newest().due == at("2024-07-05 07:00") * 1000 && newest().mode == 1);
@@ -421,7 +421,7 @@ TEST_F(Records, MissedTimes) {
     // Records that went were no missed times.
     writeFile(kLimits, "[limits]\nruns_per_task=1\n");
     for (const char *const moment : {"2024-07-07 07:00", "2024-07-08 07:00"}) {
-        fakes.now = at(moment);
+        faults().now = at(moment);
         EXPECT_EQ(TAVISchedTaskRun(1, 1, 1), 0);
         waitForChildren();
     }
@@ -469,7 +469,7 @@ TEST_F(Records, LimitsAndPruning) {
 
 // What cron asks for in vain has records where that is asked for.
 TEST_F(Records, OfWhatIsSkipped) {
-    fakes.now = at("2024-05-15 08:31"); // it is due at midnight
+    faults().now = at("2024-05-15 08:31"); // it is due at midnight
     Task task = storedTask();
     for (const char *const skipped : {"0", "1"}) {
         writeFile(kLimits, std::string("[limits]\nskipped=") + skipped + "\n");

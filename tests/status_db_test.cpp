@@ -33,7 +33,7 @@ class StatusDatabase : public SchedTest {
 };
 
 TEST_F(StatusDatabase, RowsFromStartToEnd) {
-    fakes.now = 1700000000;
+    faults().now = 1700000000;
     EXPECT_EQ(addRow("007", 5), 1);
     EXPECT_EQ(query("SELECT * FROM task_status"),
               "1 " + std::to_string(getpid()) + " 1700000000 7 5 2 - ");
@@ -47,7 +47,7 @@ TEST_F(StatusDatabase, RowsFromStartToEnd) {
     EXPECT_EQ(TAVISchedDBGetStatusByStatusID(db_, 1, &code, comment, sizeof comment), 1);
     EXPECT_EQ(code, 7);
     EXPECT_STREQ(comment, "12");
-    fakes.now = 1700000060;
+    faults().now = 1700000060;
     addRow("", 5);
     EXPECT_EQ(TAVISchedDBSetStatus(db_, 2, 0, 3, ""), 0);
     EXPECT_EQ(TAVISchedDBGetStatusByTaskID(db_, 5, &since, &code, comment, sizeof comment), 1);

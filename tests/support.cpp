@@ -194,7 +194,7 @@ std::string resultOf(unsigned int backend, const Task &task, size_t room) {
 }
 
 Task taskOf(const When &row) {
-    fakes.now = at(row.now);
+    faults().now = at(row.now);
     Task task = newTask();
     task->type = row.type;
     task->startYear = row.start[0];
@@ -215,6 +215,8 @@ void SchedTest::SetUp() {
     writeFile(kCrontab, kForeignCrontab);
     symlink(RUNNER, "/tmp/tavischedtask");
     setenv("TZ", "UTC", 1);
+    unlink("/etc/localtime"); // the machine's time zone, as programs have it
+    symlink("/usr/share/zoneinfo/UTC", "/etc/localtime");
     logs();
     notices();
     pauses();
@@ -225,13 +227,6 @@ void SchedTest::SetUp() {
 using support::fakes;
 
 extern "C" {
-
-time_t time(time_t *result) noexcept {
-    timespec clock{};
-    clock_gettime(CLOCK_REALTIME, &clock);
-    const time_t now = fakes.now.value_or(clock.tv_sec);
-    return result ? *result = now : now;
-}
 
 void syslog(int priority, const char *format, ...) {
     const int savedErrno = errno; // also for %m

@@ -7,6 +7,7 @@
 #include "platc.h"
 #include "tavischeduler.h"
 
+#include <csignal>
 #include <ctime>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -35,7 +36,6 @@ constexpr const char *kOwnLine = "0\t0\t*\t*\t*\troot\t/tmp/tavischedtask --run 
 
 // What the functions that this program defines do; copied into forked children.
 struct Fakes {
-    std::optional<time_t> now; // what time() answers
     bool renameFails = false;
     bool fsyncFails = false;
     bool folderFsyncFails = false;
@@ -116,6 +116,8 @@ class SchedTest : public testing::Test {
     void SetUp() override;
     void TearDown() override {
         fakes = {};
+        faults().now = 0;
+        signal(SIGHUP, SIG_DFL);
         fail(Fault::None);
     }
 };

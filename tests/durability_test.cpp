@@ -151,6 +151,25 @@ TEST_F(Durability, TornRecord) {
     }
 }
 
+// Of a file that differed there is a copy beside the record; without it nothing is put back.
+TEST_F(Durability, UnreadableCopyBesideTheRecord) {
+    writeFile(kPersistent, readFile(kPersistent) + "[9]\nname=of the file alone\n");
+    const State old = stateNow();
+    cutOff(isCopyTo(kWorking));
+    const std::string copy = std::string(kPersistent) + ".journal.persistent";
+    shell("mv " + copy + " /run/aside; mkdir " + copy);
+    const State cut = stateNow();
+    logs();
+    EXPECT_EQ(listOfFreshProcess(), "91270500 PowerOff task 0 ; ");
+    EXPECT_THAT(logs(), Contains(HasSubstr(copy + " cannot be read")));
+    EXPECT_EQ(stateNow(), cut);
+    shell("rmdir " + copy + "; mv /run/aside " + copy);
+    logs();
+    EXPECT_THAT(listOfFreshProcess(), HasSubstr("1 one"));
+    EXPECT_EQ(stateNow(), old);
+    EXPECT_THAT(logs(), Contains(testing::ContainsRegex("is taken back, process [1-9]")));
+}
+
 // ---- Full file systems ----
 
 // A small file system over a folder, with what was in it.

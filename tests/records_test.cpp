@@ -373,6 +373,7 @@ TEST_F(Records, MissedTimes) {
         EXPECT_EQ(look(), 0);
         std::string times;
         for (const TAVI_SCHED_RUN &run : runs(ofTask(1))) {
+            EXPECT_TRUE(run.result != TAVI_SCHED_RUN_MISSED || run.ended <= faults().now * 1000);
             const time_t due = run.due / 1000;
             std::array<char, 32> text{};
             strftime(text.data(), text.size(), "%d %H:%M ", localtime(&due));
@@ -417,6 +418,8 @@ TEST_F(Records, MissedTimes) {
     EXPECT_THAT(missed("2024-07-05 07:05"), StartsWith("04 07:00 "));
     change("2024-07-06 07:01");
     query("UPDATE task_status SET timestamp=timestamp+86400");
+    EXPECT_THAT(missed("2024-07-06 07:05"), StartsWith("04 07:00 "));
+    recorded("UPDATE runs SET result=40 WHERE result=-1"); // none is awaited any more
     EXPECT_THAT(missed("2024-07-06 07:05"), StartsWith("04 07:00 "));
     // Records that went were no missed times.
     writeFile(kLimits, "[limits]\nruns_per_task=1\n");

@@ -359,10 +359,12 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     EXPECT_THAT(dry, AllOf(HasSubstr("\"runMinute\": 1,"), HasSubstr("machine off")));
     EXPECT_THAT(dry, Not(HasSubstr("same")));
     EXPECT_THAT(run("check"), HasSubstr("note: task 3 (Task 3): task 1, of the same application"));
-    const char *const note = "\"problem\": false,\"task\": 3,\"what\": \"task 3 (Task 3): its runs";
+    const char *const note =
+        "\"canRepair\": false,\"problem\": false,\"task\": 3,\"what\": \"task 3 (Task 3): its runs";
     EXPECT_THAT(failed("check --json"), AllOf(HasSubstr(note), HasSubstr("\"problem\": true"),
                                               ContainsRegex("\"advice\": \"[a-z]")));
     shell("rm /tmp/tavischedtask");
+    EXPECT_THAT(run("check --json"), HasSubstr("\"canRepair\": true,\"problem\": true"));
     EXPECT_THAT(run("check --repair --json"), HasSubstr("{\"repaired\": \""));
 }
 
@@ -765,6 +767,9 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
         const std::string filter = " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'";
         EXPECT_EQ(ended(0, "history " + (options + filter), fixed), results);
     }
+    EXPECT_EQ(ended(0, "disable 7", fixed),
+              "task 7 (Past): once on 2024-03-01 at 00:00, disabled\n");
+    EXPECT_THAT(ended(2, "enable 7", fixed), HasSubstr("has passed"));
 }
 
 TEST_F(CommandLine, FitsTheTerminal) {

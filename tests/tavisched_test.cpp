@@ -159,7 +159,7 @@ TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
         {"--weekly fri-mon", "Sun, Mon, Fri, Sat 00:00", "0\t0\t*\t*\t0,1,5,6"},
         {"--weekly weekdays,sat", "Mon-Sat 00:00", "0\t0\t*\t*\t1,2,3,4,5,6"},
         {"--weekly daily", "daily 00:00", "0\t0\t*\t*\t*"},
-        {"--weekly 'fri, MON' --at 22:00", "Mon, Fri 22:00", "0\t22\t*\t*\t1,5"},
+        {"--weekly 'fri , MON' --at 22:00", "Mon, Fri 22:00", "0\t22\t*\t*\t1,5"},
         {"--weekly Sun,Mon,Tue,Thu --at 7:05", "Sun-Tue, Thu 07:05", "5\t7\t*\t*\t0,1,2,4"},
         {"--daily --at 08:00 --every 4 --until 20", "daily 08:00 every 4 h until 20:00",
          "0\t8,12,16,20\t*\t*\t*"},
@@ -258,6 +258,7 @@ TEST_F(CommandLine, PowerSchedulesAreEditedAndRefused) {
         EXPECT_THAT(failed(change), HasSubstr("power schedules")) << change;
     }
     done("edit 1 --at 01:00");
+    done("export 1 | tavisched import -");
     EXPECT_EQ(readFile(kPower), damaged);
 }
 
@@ -268,8 +269,8 @@ TEST_F(CommandLine, NeverMakesALineThatCronRejects) {
     EXPECT_THAT(refused("enable 1"), HasSubstr("for the line of task 1 (Task 1): the hour \"99\""));
     // Enabled by hand in both files, so that the next rewrite would make the line.
     shell("sed -i '0,/state=disabled/s//state=enabled/' $BOTH");
-    for (const char *const change :
-         {"add --command y", "sync", "edit 2 --at 1:00", "remove 2 --yes"}) {
+    for (const char *const change : {"add --command y", "add --command y --dry-run", "sync",
+                                     "edit 2 --at 1:00", "remove 2 --yes"}) {
         EXPECT_THAT(refused(change), HasSubstr("first \"tavisched disable 1\"")) << change;
         EXPECT_THAT(readFile(kCrontab), Not(HasSubstr("id=1\n")));
     }
@@ -354,6 +355,7 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     for (const char *const how : {" --dry-run", ""}) {
         EXPECT_THAT(done(std::string("edit 1 --daily --at 05:00") + how), HasSubstr(off)) << how;
     }
+    EXPECT_THAT(done("disable 1; tavisched enable 1"), HasSubstr(off));
     EXPECT_THAT(done("add --command x --at 5:00 --app a"), AllOf(HasSubstr(off), HasSubstr(meets)));
     const std::string dry = done("edit 3 --at 05:01 --dry-run --json");
     EXPECT_THAT(dry, AllOf(HasSubstr("\"runMinute\": 1,"), HasSubstr("machine off")));
@@ -370,7 +372,7 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
 
 // Escapes in JSON mean the characters; elsewhere nothing of them reaches a terminal.
 TEST_F(CommandLine, EscapesWhatControlsTerminals) {
-    const std::string harm = "a\u001b\u009b\u007f\u202e\u200b\u00ad\ufeff\u00aeb";
+    const std::string harm = "a\u001b\u009b\u007f\u202e\u200b\u00ad\ufeff\u034f\ufe0f\u00aeb";
     Task task = newTask("echo '\u200b'");
     TAVISchedCTaskSetName(task.get(), harm.c_str());
     TAVISchedCTaskSetApp(task.get(), harm.c_str());
@@ -381,8 +383,9 @@ TEST_F(CommandLine, EscapesWhatControlsTerminals) {
         EXPECT_THAT(run(command), Not(ContainsRegex("\u001b|\u009b|\u007f|\u202e|\u200b|\ufeff")))
             << command;
     }
-    EXPECT_THAT(done("list"),
-                HasSubstr("a\\u001b\\u009b\\u007f\\u202e\\u200b\\u00ad\\ufeff\u00aeb"));
+    EXPECT_THAT(
+        done("list"),
+        HasSubstr("a\\u001b\\u009b\\u007f\\u202e\\u200b\\u00ad\\ufeff\\u034f\ufe0f\u00aeb"));
     for (const char *const form : {"", " --web"}) {
         done("export" + std::string(form) + " > /tmp/all.json");
         const std::string before = machine();
@@ -524,7 +527,9 @@ TEST_F(CommandLine, RunsNowAndFollows) {
                                                  " -  [a-z]+  killed by signal 9\n"));
     EXPECT_THAT(done("show 3"), ContainsRegex("RESULT\n6  3  Task 3 .*\n[1-5]  3  Task 3 .* 9\n$"));
     EXPECT_EQ(done("history 6"), "There are no runs of task 6 (Task 6) on record.\n");
-    EXPECT_THAT(done("history --limit 1 --json"), HasSubstr("\"statusCode\""));
+    done("remove 2 --yes");
+    done("add --command x");
+    EXPECT_THAT(run("log 2 --run 2"), HasSubstr("run 2 is of a removed task, Task 2\n"));
     shell("pkill -x sleep");
 }
 
@@ -807,8 +812,10 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_THAT(shown(80, "list"), AllOf(HasSubstr("STATE"), HasSubstr("OWNER")));
     EXPECT_THAT(shown(40, "list"), AllOf(HasSubstr("90622300"), HasSubstr("NEXT RUN")));
     EXPECT_THAT(done("list"), HasSubstr("90622300  PowerOff task 0  enabled  Mon-Fri 23:00  "));
-    const std::pair<const char *, int> narrowest[] = {
-        {"list", 40}, {"calendar --days 30", 30}, {"calendar --hours", 30}};
+    const std::pair<const char *, int> narrowest[] = {{"list", 40},
+                                                      {"calendar --days 30", 30},
+                                                      {"calendar --days 1 --past 0", 30},
+                                                      {"calendar --hours", 30}};
     for (const auto &[what, narrow] : narrowest) {
         for (const int columns : {narrow, 80, 200}) {
             EXPECT_TRUE(fits(columns, what)) << readFile("/tmp/out");

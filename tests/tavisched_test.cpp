@@ -68,6 +68,24 @@ class CommandLine : public SchedTest {
     int status_ = -1;
 };
 
+// Each command's example can be typed as it is, one after the other.
+TEST_F(CommandLine, ExamplesOfTheHelpWork) {
+    shell("echo alice:x:4747:4747::/:/bin/sh >> /etc/passwd");
+    for (int i = 0; i < 4; ++i) {
+        done("add --command 'echo x'");
+    }
+    run("run 3 --wait");
+    shell(
+        "cd /tmp; for c in $(tavisched --help | sed -n '/^Subc/,/^$/s/^  \\([a-z]*\\)  .*/\\1/p'); do"
+        " tavisched $c --help | sed -n '/^Example:/{n;p}' > example; [ -s example ] &&"
+        " sh example > /dev/null 2>&1 < /dev/null; echo $c $?; done > /tmp/out;"
+        "sed -i /^alice:/d /etc/passwd");
+    EXPECT_EQ(readFile("/tmp/out"),
+              "list 0\nshow 0\nnext 0\ncalendar 0\nhistory 0\nlog 0\nexport 0\nadd 0\nedit 0\n"
+              "enable 0\ndisable 0\nremove 0\nimport 0\nrun 0\nstop 2\nsync 0\ncheck 0\n");
+    EXPECT_THAT(done("list"), ContainsRegex("3  Task 3 .* ok just now\n4  Task 4 .*\n5  Backup "));
+}
+
 TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
     done("add --command true --at 08:00 --every 4 --until 20");
     done("add --power off --at 23:00 --weekly Mon");
@@ -425,6 +443,12 @@ TEST_F(CommandLine, ExportAndImportGiveTheSameTasks) {
     EXPECT_EQ(done("import /tmp/web.json"),
               "task 4 (Пример \"x\"), was 90022301\ntask 5 (Task 2), was 2\n"
               "task 90022300 (PowerOff task 0)\n");
+    // Whoever needs a new id gets none that a later one of the file has.
+    done("export > /tmp/five.json");
+    done("remove 2 3 --yes");
+    EXPECT_THAT(
+        done("import /tmp/five.json"),
+        HasSubstr("task 6 (Пример \"x\"), was 1\ntask 2 (Task 2)\ntask 3 (Task 9)\ntask 7 "));
     // A section that cannot be read keeps its id.
     shell("sed -i 's/^run hour=0/run hour=x/' $BOTH");
     EXPECT_THAT(done("import /tmp/all.json"), HasSubstr(", was 1\n"));

@@ -94,14 +94,22 @@ std::vector<Planned> planAll(std::vector<Imported> &&imported, const Tasks &task
     return planned;
 }
 
-void store(Change &change, const Planned &planned) {
+// They come first, as what gets a new id would take theirs.
+void storeThoseThatKeepTheirIds(Change &change, std::vector<Planned> &all) {
+    for (Planned &planned : all) {
+        if (planned.fate == Fate::CreateWithId && !change.createWithId(*planned.imported.task)) {
+            planned.fate = Fate::Create; // a section that cannot be read has the id
+        }
+    }
+}
+
+void storeOther(Change &change, const Planned &planned) {
     TAVI_SCHED_TASK &task = *planned.imported.task;
     switch (planned.fate) {
     case Fate::Create:
         change.create(task);
         break;
     case Fate::CreateWithId:
-        change.createWithId(task);
         break;
     case Fate::Replace:
         change.edit(task, *planned.present);
@@ -145,9 +153,11 @@ int importTasks(const ImportOptions &options) {
     }
     {
         Change change;
-        for (const Planned &planned : planAll(parseImport(text), change.tasks(), options.replace)) {
+        std::vector<Planned> all = planAll(parseImport(text), change.tasks(), options.replace);
+        storeThoseThatKeepTheirIds(change, all);
+        for (const Planned &planned : all) {
             const int32_t wanted = planned.imported.task->id;
-            store(change, planned);
+            storeOther(change, planned);
             lines.push_back(toldAfter(planned, wanted));
         }
         change.commit();

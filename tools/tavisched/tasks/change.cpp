@@ -159,15 +159,16 @@ void Change::create(TAVI_SCHED_TASK &task) {
     stored(task);
 }
 
-void Change::createWithId(TAVI_SCHED_TASK &task) {
+bool Change::createWithId(TAVI_SCHED_TASK &task) {
     if (TAVISchedTaskCreateWithId(&task) == 0) {
         stored(task);
-    } else if (PLATCErrGet() == TAVI_SCHED_ERR_INVALID_ARGUMENT) {
-        requireUnknown(task.id, tasks_);
-        create(task);
-    } else {
+        return true;
+    }
+    if (PLATCErrGet() != TAVI_SCHED_ERR_INVALID_ARGUMENT) {
         fail(task, "stored");
     }
+    requireUnknown(task.id, tasks_);
+    return false;
 }
 
 void Change::edit(TAVI_SCHED_TASK &task, const TAVI_SCHED_TASK &before) {

@@ -33,8 +33,8 @@ class Change {
 
     // Each is refused or fails with what the task is called, and then nothing is stored.
     void create(TAVI_SCHED_TASK &task);
-    // Under the task's id, or another one when that is not free.
-    void createWithId(TAVI_SCHED_TASK &task);
+    // Under the task's id; false when a section that cannot be read has it.
+    bool createWithId(TAVI_SCHED_TASK &task);
     // `before` is one of tasks(). A power schedule gets another id.
     void edit(TAVI_SCHED_TASK &task, const TAVI_SCHED_TASK &before);
     void remove(const TAVI_SCHED_TASK &task);

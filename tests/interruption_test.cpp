@@ -1,7 +1,7 @@
 // Operations that are cut off, or meet calls that fail: at every system call that changes a file
-// all processes, the caller alone or a started program alone are killed, or a write is cut short;
-// or a call of some kind fails. Afterwards the tasks are as they were or as they are to be, in
-// every file, and runs are told of as they were.
+// all processes, the caller alone or a started program alone are killed; or a call of some kind
+// fails. Afterwards the tasks are as they were or as they are to be, in every file, and runs are
+// told of as they were.
 #include "machine.h"
 #include "tracer.h"
 
@@ -350,9 +350,7 @@ TEST_P(Interruption, Killed) {
     } rows[] = {{"all processes killed", Act::KillAll, [](const Call &) { return true; }},
                 // With no program there, the caller is all.
                 {"caller killed", Act::KillCaller, isPrograms},
-                {"program killed", Act::KillProgram, isPrograms},
-                {"half a write", Act::HalfThenKillAll,
-                 [](const Call &call) { return tracer::kCanChangeCalls && call.isWrite; }}};
+                {"program killed", Act::KillProgram, isPrograms}};
     for (const auto &row : rows) {
         tryAll(row.what, pointsOf(tracer::Calls::Changing, kMostKills, row.concerned), End::Cut,
                [&](size_t point) {
@@ -470,7 +468,7 @@ TEST_P(Failing, Calls) {
     std::vector<size_t> counts(faults().calls.begin(), faults().calls.end());
     fail(Fault::None);
     for (const auto &row : rows) {
-        if (row.fault == Fault::None && tracer::kCanChangeCalls) {
+        if (row.fault == Fault::None && tracer::kCanFailCalls) {
             tryAll(row.what, pointsOf(tracer::Calls::Failing, 2 * kMost, isOurs), End::Failure,
                    failSystemCall);
             continue;

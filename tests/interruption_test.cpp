@@ -342,20 +342,18 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
 constexpr size_t kMostKills = kStep == 1 ? 99 : 3;
 
 TEST_P(Interruption, Killed) {
-    const auto isPrograms = [](const Call &call) { return call.isPrograms; };
-    const struct {
-        const char *what;
-        Act act;
-        std::function<bool(const Call &)> concerned;
-    } rows[] = {{"all processes killed", Act::KillAll, [](const Call &) { return true; }},
-                // With no program there, the caller is all.
-                {"caller killed", Act::KillCaller, isPrograms},
-                {"program killed", Act::KillProgram, isPrograms}};
-    for (const auto &row : rows) {
-        tryAll(row.what, pointsOf(tracer::Calls::Changing, kMostKills, row.concerned), End::Cut,
-               [&](size_t point) {
+    const std::pair<const char *, Act> rows[] = {
+        {"all processes killed", Act::KillAll},
+        {"caller killed", Act::KillCaller}, // with no program there, the caller is all
+        {"program killed", Act::KillProgram}};
+    for (const auto &[what, act] : rows) {
+        const auto isConcerned = [act = act](const Call &call) {
+            return act == Act::KillAll || call.isPrograms;
+        };
+        tryAll(what, pointsOf(tracer::Calls::Changing, kMostKills, isConcerned), End::Cut,
+               [act = act](size_t point) {
                    return tryOf(
-                       tracer::run(GetParam().run, {.act = row.act, .isPoint = tracer::at(point)}));
+                       tracer::run(GetParam().run, {.act = act, .isPoint = tracer::at(point)}));
                });
     }
 }
@@ -468,7 +466,7 @@ TEST_P(Failing, Calls) {
     std::vector<size_t> counts(faults().calls.begin(), faults().calls.end());
     fail(Fault::None);
     for (const auto &row : rows) {
-        if (row.fault == Fault::None && tracer::kCanFailCalls) {
+        if (row.fault == Fault::None) {
             tryAll(row.what, pointsOf(tracer::Calls::Failing, 2 * kMost, isOurs), End::Failure,
                    failSystemCall);
             continue;

@@ -183,8 +183,6 @@ TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
     }
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
     EXPECT_THAT(done("add --command x"), HasSubstr("Note: no schedule was given, so it is daily"));
-    EXPECT_THAT(done("add --command x --at 22:00 --every 4"),
-                HasSubstr("Note: it runs once a day, at 22:00, as 4 hours later is after hour"));
     EXPECT_THAT(done("add --power off --dry-run --at 23:00"),
                 HasSubstr("Schedule: daily 23:00\nWhat happens: cron runs the power-off check"));
 }
@@ -195,12 +193,7 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
               "task 1 (Größe): Mon 22:00, disabled\n");
     EXPECT_THAT(done("edit 1 --at 23:15 --enabled --owner 1"),
                 HasSubstr("task 1 (Größe): Mon 23:15, next run 2"));
-    TAVI_SCHED_TASK task{};
-    ASSERT_EQ(TAVISchedTaskGetByID(1, &task), 0);
-    EXPECT_STREQ(task.command, "echo a\nb");
-    EXPECT_STREQ(task.app, "a.b");
-    EXPECT_EQ(task.owner, 1U);
-    EXPECT_EQ(task.canRunTaskSameTime, 1);
+    EXPECT_THAT(done("show 1"), HasSubstr("Overlap        may start while an earlier run goes on"));
     done("edit 1 --no-overlap --monthly 3 --every 2");
     EXPECT_EQ(done("show 1 | sed '/^First day/s/ 20.*/ x/; s/ 20..-..-03 / x /'"),
               "Task 1: Größe\nKind           task (tavischedule)\nState          enabled\n"
@@ -312,10 +305,8 @@ TEST_F(CommandLine, ShowsTasksForScripts) {
     done("add --name b --command 'echo \"1\"' --weekly Mon --at 05:00 --owner bin --disabled");
     done("add --name A --command x --once 2099-12-24");
     const std::string json = done("list --json --sort name --reverse");
-    for (const char *const member : {"\"command\": \"echo \\\"1\\\"\",", "\"lastRun\": null,",
-                                     "\"nextRun\": null,", "\"nextRun\": \"2099-12-24 00:00\","}) {
-        EXPECT_THAT(json, HasSubstr(member));
-    }
+    EXPECT_THAT(json, AllOf(HasSubstr("\"command\": \"echo \\\"1\\\"\","),
+                            HasSubstr("\"lastRun\": null,"), HasSubstr("\"nextRun\": null,")));
     EXPECT_LT(json.find("\"b\""), json.find("\"A\""));
     EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
     // What the web back end exchanges can be saved as it is.
@@ -337,9 +328,8 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     EXPECT_THAT(done("next 1 -n 1 --json"),
                 MatchesRegex("\\{.*\"owner\": \"root\",\"power\": null,\"task\": 1,\"time\": "
                              "\"2098-03-04T05:00:00[+-]..:..\"\\}\n"));
-    EXPECT_THAT(run("show 1 --json | tee /tmp/task.json"),
+    EXPECT_THAT(run("show 1 --json"),
                 ContainsRegex("\"starts\": *\n? *\\[\n.*-04T05.*\n.*\n.*\n.*\n.*-08T05"));
-    EXPECT_THAT(done("import --replace /tmp/task.json"), HasSubstr("overwritten"));
     // What is remarkable is told before and after.
     const char *const off = "Note: its runs fall into hours in which the power schedules have the";
     const char *const meets = "Note: task 1, of the same application, starts in the same minute";
@@ -480,11 +470,9 @@ TEST_F(CommandLine, ImportsAllOrNothing) {
         {to("run hour", R"(\\"99\\")"),
          "element 1, member \"run hour\": 99; accepted: 0 to 23\n  element 2, member"},
         {R"(s/"cmd": "..eQ/"cmd": "\\"e/)", "element 2, member \"cmd\": \"e==\" is not the base64"},
-        {R"(s/"week": .*/"week": "\\"11\\""/)", "element 1, member \"week\": \"11\"; accepted"},
         {to("listable", "1"), "accepted: a string whose text is a JSON string"},
         {R"(s/"type"/"typ"/)", "member \"typ\": no task has it"},
         {R"(/"name"/d)", "element 1, member \"name\": it is missing"},
-        {"/owner name/d;" + to("owner", R"(\\"54321\\")"), "no user with the id 54321"},
         {to("id", R"(\\"7x\\")"), "\"7x\" would be stored as \"7\""},
         {to("app", R"(\\"a\\\\u0000\\")"), "member \"app\": it holds a NUL"},
         {"$d", "is no JSON"},
@@ -787,16 +775,18 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_THAT(readFile("/tmp/out"), HasSubstr("A column is 1 h."));
 }
 
+// What keeps tasks from running is told by every command that has to do with them.
 TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
     const struct {
         const char *harm, *found;
         bool repaired;
         int problems = 1;
+        int listed = -1; // how a list ends, where it is told there too
     } cases[] = {
-        {"rm /run/crond.pid", "cron is not running", false},
+        {"rm /run/crond.pid", "cron is not running", false, 1, 0},
         {"echo 999999 > /run/crond.pid", "cron is not running", false},
         {"rm /tmp/tavischedtask", "tavischedtask is missing", true},
-        {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true},
+        {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true, 1, 0},
         {"chown -h bin /tmp/tavischedtask", "belongs to another user", true},
         {"cd ..; mkdir -m 775 g; chgrp bin g; cp bin/tavischedtask g; ln -sf $PWD/g/tavischedtask "
          "/tmp",
@@ -813,7 +803,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"rm -r /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
         {"chmod 777 /tmp/lock", "/tmp/lock must belong to root", true},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
-        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
+        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true, 1, 1},
         {"chmod 666 /tmp/scheduled_tasks", "as root runs what it says", true},
         {"mkfifo /tmp/f; mv /tmp/f /tmp/scheduled_tasks", "as root runs what it says", true},
         {"chown bin scheduled_tasks", "etc/scheduled_tasks must belong to root", false},
@@ -825,12 +815,15 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"truncate -s 0 $BOTH", "that no task asks for", false},
         {"rm scheduled_tasks", "lost when the machine restarts", true},
         {"sed -i s/daily/weekly/ scheduled_tasks", "differ", false},
+        {"tavisched add --command x > /run/x; sed -i '1,/^.2]/{/2]/!d}' /tmp/scheduled_tasks",
+         "outlives a restart, differ", false, 2, 1},
         {"touch scheduled_tasks.bak", "put aside", false},
         {"sed -i /id=1/d /etc/crontab", "lacks a task's line", true},
         {"echo '# /tmp/tavischedtask' >> /etc/crontab", "that no task asks for", true},
         {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "has other power-off lines", true},
         {"printf x >> /etc/crontab", "has no line feed", false, 2},
-        {"sed -i '1i60 * * * * root x' /etc/crontab", "for its line 1: the minute \"60\"", false},
+        {"sed -i '1i60 * * * * root x' /etc/crontab", "for its line 1: the minute \"60\"", false, 1,
+         0},
         {"rm /etc/crontab", "cannot be read", false},
         {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
         {"sed -i 's/^run hour=.*/run hour=x/' $BOTH", "can be read: \"run hour\": \"x\"", false, 2},
@@ -864,47 +857,27 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         ASSERT_THAT(done("check"), AllOf(HasSubstr("All is well."), Not(HasSubstr("aside"))));
         shell("rm -rf /run/etc; cp -a /usr/tavi/etc /run");
         shell("cd /usr/tavi/etc; { " + std::string(c.harm) + "; } 2> /dev/null");
+        for (const char *const command :
+             {"list", "add --command x", "edit 1 --at 1:00", "enable 1", "sync"}) {
+            if (c.listed >= 0) {
+                const bool succeeds = c.listed == 0 && command != "sync"s;
+                const std::string said = ended(succeeds ? 0 : 1, command);
+                EXPECT_THAT(said, ContainsRegex(c.found + "[^\n]*; [a-z\"]"s)) << command;
+                EXPECT_LE(std::count(said.begin(), said.end(), '\n'), 4) << said;
+            }
+        }
         failed("check");
-        EXPECT_EQ(shell("exit $(grep ^problem: /tmp/out | tee /tmp/problems | wc -l)"), c.problems);
+        EXPECT_EQ(shell("exit $(grep ^problem: /tmp/out | tee /tmp/problems | wc -l)"), c.problems)
+            << c.harm;
         EXPECT_THAT(readFile("/tmp/problems"), HasSubstr(c.found)) << c.harm;
         const std::string said = ended(c.repaired ? 0 : 1, "check --repair");
         EXPECT_TRUE(!c.repaired || said.find("repaired: ") != std::string::npos) << c.harm;
         // Nothing was lost by it, and cron's file is as good as before.
         EXPECT_THAT(said, Not(HasSubstr("the hour")));
         EXPECT_TRUE(!c.repaired || done("list").find("Task 1") != std::string::npos) << c.harm;
-        EXPECT_THAT(readFile(kCrontab), HasSubstr(c.repaired ? "id=1\n" : "")) << c.harm;
+        const bool isKept = c.repaired || c.listed >= 0;
+        EXPECT_THAT(readFile(kCrontab), HasSubstr(isKept ? "id=1\n" : "")) << c.harm;
         shell("umount -n /usr/tavi/etc 2>/dev/null");
-    }
-}
-
-TEST_F(CommandLine, TellsWhenNothingRuns) {
-    const struct {
-        const char *harm, *said;
-        int listStatus;
-    } cases[] = {
-        {"rm /run/crond.pid", "warning: cron is not running, so that no task runs; start it: ", 0},
-        {"ln -sfn /nowhere /tmp/tavischedtask",
-         "tavischedtask is missing, so that no task runs; \"tavisched check --repair\"", 0},
-        {"sed -i '1i60 * * * * root x' /etc/crontab",
-         "warning: cron ignores all of /etc/crontab for its line 1: the minute \"60\"", 0},
-        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing or empty; \"", 1},
-        {"sed -i '/^.2]/,$d' /tmp/scheduled_tasks", "outlives a restart, differ; compare them", 1},
-    };
-    for (const auto &c : cases) {
-        SetUp();
-        done("add --command x");
-        done("add --command x");
-        shell(c.harm);
-        for (const char *const command :
-             {"list", "add --command x", "edit 1 --at 1:00", "enable 1", "sync"}) {
-            const bool reports = c.listStatus != 0 || std::string(command) == "sync";
-            const std::string said = ended(reports ? 1 : 0, command);
-            EXPECT_THAT(said, HasSubstr(c.said)) << command;
-            EXPECT_LE(std::count(said.begin(), said.end(), '\n'), 4) << said;
-        }
-        // What only one of the files has is not taken out of the crontab.
-        run("check --repair");
-        EXPECT_THAT(readFile(kCrontab), HasSubstr("id=2\n")) << c.harm;
     }
 }
 

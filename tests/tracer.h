@@ -8,9 +8,6 @@
 
 namespace tracer {
 
-// False where the tracer does not know the registers: kills alone work there.
-extern const bool kCanFailCalls;
-
 // Which calls count.
 enum class Calls {
     Changing, // those that change files, folders or their attributes, and flushes

@@ -3,7 +3,6 @@
 
 #include <atomic>
 #include <chrono>
-#include <csignal>
 #include <functional>
 #include <grp.h>
 #include <set>
@@ -128,15 +127,14 @@ TEST_F(Concurrency, HandlersReadAndChangeTasksButInABatch) {
 // ---- Another user ----
 
 // What somebody would like root to run.
-std::string plantedTask() {
-    return "[7]\nid=7\nrun hour=1\nrun min=2\nname=planted\napp=\napp name=\naction=\n"
-           "cmd=dG91Y2ggL2V2aWw=\nowner=0\nstate=enabled\ntype=daily\n";
-}
+constexpr const char *kPlanted =
+    "[7]\nid=7\nrun hour=1\nrun min=2\nname=planted\napp=\napp name=\n"
+    "action=\ncmd=dG91Y2ggL2V2aWw=\nowner=0\nstate=enabled\ntype=daily\n";
 
 void plantTask() {
-    writeFile(kWorking, plantedTask());
+    writeFile(kWorking, kPlanted);
     unlink(kWorking);
-    writeFile("/tmp/mine", plantedTask());
+    writeFile("/tmp/mine", kPlanted);
     rename("/tmp/mine", kWorking);
     unlink(kWorking);
 }

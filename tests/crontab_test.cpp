@@ -1,7 +1,6 @@
 // The schedule backend's lines of /etc/crontab, and that Debian's cron starts tasks from them.
 #include "support.h"
 
-#include <csignal>
 #include <cstring>
 
 namespace {

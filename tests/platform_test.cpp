@@ -4,7 +4,6 @@
 #include "tavisdk.h"
 
 #include <algorithm>
-#include <csignal>
 #include <fcntl.h>
 
 namespace {

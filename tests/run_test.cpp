@@ -2,7 +2,6 @@
 #include "machine.h"
 
 #include <array>
-#include <csignal>
 #include <fcntl.h>
 #include <grp.h>
 #include <sys/file.h>

@@ -1,7 +1,6 @@
 // The command line for people, from outside: what it accepts, refuses, stores, shows and repairs.
 #include "machine.h"
 
-#include <csignal>
 #include <sys/prctl.h>
 
 namespace {

@@ -3,8 +3,6 @@
 #include "machine.h"
 #include "tracer.h"
 
-#include <filesystem>
-#include <functional>
 #include <sys/statvfs.h>
 
 namespace {

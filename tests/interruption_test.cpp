@@ -1,14 +1,13 @@
 // Operations that are cut off, or meet calls that fail: at every system call that changes a file
-// all processes, the caller alone or a started program alone are killed, or a write is cut short;
-// or a call of some kind fails. Afterwards the tasks are as they were or as they are to be, in
-// every file, and runs are told of as they were.
+// all processes, the caller alone or a started program alone are killed; or a call of some kind
+// fails. Afterwards the tasks are as they were or as they are to be, in every file, and runs are
+// told of as they were.
 #include "machine.h"
 #include "tracer.h"
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <csignal>
 #include <cstring>
 #include <fcntl.h>
 #include <functional>
@@ -342,22 +341,18 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
 constexpr size_t kMostKills = kStep == 1 ? 99 : 3;
 
 TEST_P(Interruption, Killed) {
-    const auto isPrograms = [](const Call &call) { return call.isPrograms; };
-    const struct {
-        const char *what;
-        Act act;
-        std::function<bool(const Call &)> concerned;
-    } rows[] = {{"all processes killed", Act::KillAll, [](const Call &) { return true; }},
-                // With no program there, the caller is all.
-                {"caller killed", Act::KillCaller, isPrograms},
-                {"program killed", Act::KillProgram, isPrograms},
-                {"half a write", Act::HalfThenKillAll,
-                 [](const Call &call) { return tracer::kCanChangeCalls && call.isWrite; }}};
-    for (const auto &row : rows) {
-        tryAll(row.what, pointsOf(tracer::Calls::Changing, kMostKills, row.concerned), End::Cut,
-               [&](size_t point) {
+    const std::pair<const char *, Act> rows[] = {
+        {"all processes killed", Act::KillAll},
+        {"caller killed", Act::KillCaller}, // with no program there, the caller is all
+        {"program killed", Act::KillProgram}};
+    for (const auto &[what, act] : rows) {
+        const auto isConcerned = [act = act](const Call &call) {
+            return act == Act::KillAll || call.isPrograms;
+        };
+        tryAll(what, pointsOf(tracer::Calls::Changing, kMostKills, isConcerned), End::Cut,
+               [act = act](size_t point) {
                    return tryOf(
-                       tracer::run(GetParam().run, {.act = row.act, .isPoint = tracer::at(point)}));
+                       tracer::run(GetParam().run, {.act = act, .isPoint = tracer::at(point)}));
                });
     }
 }
@@ -470,7 +465,7 @@ TEST_P(Failing, Calls) {
     std::vector<size_t> counts(faults().calls.begin(), faults().calls.end());
     fail(Fault::None);
     for (const auto &row : rows) {
-        if (row.fault == Fault::None && tracer::kCanChangeCalls) {
+        if (row.fault == Fault::None) {
             tryAll(row.what, pointsOf(tracer::Calls::Failing, 2 * kMost, isOurs), End::Failure,
                    failSystemCall);
             continue;

@@ -4,7 +4,6 @@
 #include "tavisdk.h"
 
 #include <algorithm>
-#include <csignal>
 #include <fcntl.h>
 
 namespace {
@@ -260,38 +259,6 @@ TEST_F(Platform, ProgramsAndProcesses) {
     EXPECT_EQ(PLATCProcAlive(child), 0);
     EXPECT_EQ(PLATCProcAlive(getpid()), 1);
     EXPECT_EQ(PLATCProcAlive(0), 0);
-}
-
-// A caller that captures its output must not hang on the child, nor see its own output twice.
-TEST_F(Platform, DetachedChildren) {
-    int output[2];
-    ASSERT_EQ(pipe(output), 0);
-    fflush(stdout);
-    const pid_t caller = start([&] {
-        dup2(output[1], 1);
-        close(output[0]);
-        close(output[1]);
-        printf("once");
-        if (PLATCProcForkChildNoWait() == 0) {
-            writeFile("/tmp/detached", std::to_string(getpid()) + "\n");
-            pause();
-        }
-        return fflush(stdout);
-    });
-    close(output[1]);
-    char text[16] = "";
-    EXPECT_EQ(read(output[0], text, sizeof text), 4);
-    EXPECT_EQ(read(output[0], text, sizeof text), 0);
-    close(output[0]);
-    EXPECT_EQ(exitOf(caller), 0);
-    EXPECT_TRUE(waitFor("grep -qs . /tmp/detached"));
-    const int child = std::stoi(readFile("/tmp/detached"));
-    EXPECT_EQ(PLATCProcAlive(child), 1);
-    EXPECT_NE(getsid(child), getsid(0));
-    const std::string files = "/proc/" + std::to_string(child) + "/fd/[012]";
-    EXPECT_EQ(shell("test \"$(readlink " + files + " | sort -u)\" = /dev/null"), 0);
-    kill(child, SIGKILL);
-    waitForChildren();
 }
 
 } // namespace

@@ -1,6 +1,5 @@
 // What the tests share: a clean machine for each test, the log lines of the library, and control
-// over time, pauses and failing calls. The test program defines those functions itself, so that the
-// shared library binds to them.
+// over pauses and calls on files, which the test program defines itself.
 #pragma once
 
 #include "faults.h"

@@ -1,7 +1,6 @@
 // The command line for people, from outside: what it accepts, refuses, stores, shows and repairs.
 #include "machine.h"
 
-#include <csignal>
 #include <sys/prctl.h>
 
 namespace {
@@ -201,8 +200,6 @@ TEST_F(CommandLine, SchedulesInWordsAndInTheCrontab) {
     }
     EXPECT_THAT(done("check"), HasSubstr("All is well."));
     EXPECT_THAT(done("add --command x"), HasSubstr("Note: no schedule was given, so it is daily"));
-    EXPECT_THAT(done("add --command x --at 22:00 --every 4"),
-                HasSubstr("Note: it runs once a day, at 22:00, as 4 hours later is after hour"));
     EXPECT_THAT(done("add --power off --dry-run --at 23:00"),
                 HasSubstr("Schedule: daily 23:00\nWhat happens: cron runs the power-off check"));
 }
@@ -213,12 +210,7 @@ TEST_F(CommandLine, EditsKeepWhatIsLeftOut) {
               "task 1 (Größe): Mon 22:00, disabled\n");
     EXPECT_THAT(done("edit 1 --at 23:15 --enabled --owner 1"),
                 HasSubstr("task 1 (Größe): Mon 23:15, next run 2"));
-    TAVI_SCHED_TASK task{};
-    ASSERT_EQ(TAVISchedTaskGetByID(1, &task), 0);
-    EXPECT_STREQ(task.command, "echo a\nb");
-    EXPECT_STREQ(task.app, "a.b");
-    EXPECT_EQ(task.owner, 1U);
-    EXPECT_EQ(task.canRunTaskSameTime, 1);
+    EXPECT_THAT(done("show 1"), HasSubstr("Overlap        may start while an earlier run goes on"));
     done("edit 1 --no-overlap --monthly 3 --every 2");
     EXPECT_EQ(done("show 1 | sed '/^First day/s/ 20.*/ x/; s/ 20..-..-03 / x /'"),
               "Task 1: Größe\nKind           task (tavischedule)\nState          enabled\n"
@@ -329,18 +321,11 @@ TEST_F(CommandLine, AsksBeforeItRemoves) {
 
 TEST_F(CommandLine, ShowsTasksForScripts) {
     done("add --name b --command 'echo \"1\"' --weekly Mon --at 05:00 --owner bin --disabled");
-    done("add --name A --command 'exit 3' --once 2099-12-24");
-    run("run 2 --wait");
+    done("add --name A --command x --once 2099-12-24");
     const std::string json = done("list --json --sort name --reverse");
-    for (const char *const member : {"\"command\": \"echo \\\"1\\\"\",", "\"lastRun\": null,",
-                                     "\"nextRun\": null,", "\"nextRun\": \"2099-12-24 00:00\","}) {
-        EXPECT_THAT(json, HasSubstr(member));
-    }
+    EXPECT_THAT(json, AllOf(HasSubstr("\"command\": \"echo \\\"1\\\"\","),
+                            HasSubstr("\"lastRun\": null,"), HasSubstr("\"nextRun\": null,")));
     EXPECT_LT(json.find("\"b\""), json.find("\"A\""));
-    EXPECT_THAT(
-        done("history 2 --json"),
-        MatchesRegex(
-            "\\{.*\"asked\": ?\"....-..-..T..:..:..[+-]..:..\".*\"task\": ?2,.*\"waitedFor\": ?null.*\\}\n"));
     EXPECT_EQ(done("complete-ids"), "1\tb\n2\tA\n");
     // What the web back end exchanges can be saved as it is.
     EXPECT_EQ(TAVISchedTaskSaveFromJson(done("export --web 2 | sed '1d;$d'").c_str(), 0), 2);
@@ -355,18 +340,14 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     EXPECT_THAT(run("list"), AllOf(HasSubstr("daily 05:00  2098-03-04 05:00  "),
                                    HasSubstr("once on 2098-02-30 at 00:00  never  ")));
     EXPECT_THAT(done("show 2"), ContainsRegex("Next run +never\n(.*\n)+Note +it will never"));
-    EXPECT_THAT(done("next 1 2 -n 2"),
-                HasSubstr("\nTue 2098-03-04 05:00  1  late  root\nWed 2098-03-05 05:00  1  late"));
     EXPECT_THAT(done("next 1 --until 7d"), HasSubstr("Nothing will run until then."));
     EXPECT_EQ(done("next --until 24h | awk 'NR > 1 { print $4 }' | sort -u | xargs"),
               "71270700 91270400\n");
     EXPECT_THAT(done("next 1 -n 1 --json"),
                 MatchesRegex("\\{.*\"owner\": \"root\",\"power\": null,\"task\": 1,\"time\": "
                              "\"2098-03-04T05:00:00[+-]..:..\"\\}\n"));
-    EXPECT_THAT(run("show 1 --json | tee /tmp/task.json"),
-                AllOf(ContainsRegex("\"nextStart\": \"2098-03-04T05.*\n +\"notes\": \\[\\],"),
-                      ContainsRegex("\"starts\": *\n? *\\[\n.*-04T05.*\n.*\n.*\n.*\n.*-08T05")));
-    EXPECT_THAT(done("import --replace /tmp/task.json"), HasSubstr("overwritten"));
+    EXPECT_THAT(run("show 1 --json"),
+                ContainsRegex("\"starts\": *\n? *\\[\n.*-04T05.*\n.*\n.*\n.*\n.*-08T05"));
     // What is remarkable is told before and after.
     const char *const off = "Note: its runs fall into hours in which the power schedules have the";
     const char *const meets = "Note: task 1, of the same application, starts in the same minute";
@@ -515,11 +496,9 @@ TEST_F(CommandLine, ImportsAllOrNothing) {
         {to("run hour", R"(\\"99\\")"),
          "element 1, member \"run hour\": 99; accepted: 0 to 23\n  element 2, member"},
         {R"(s/"cmd": "..eQ/"cmd": "\\"e/)", "element 2, member \"cmd\": \"e==\" is not the base64"},
-        {R"(s/"week": .*/"week": "\\"11\\""/)", "element 1, member \"week\": \"11\"; accepted"},
         {to("listable", "1"), "accepted: a string whose text is a JSON string"},
         {R"(s/"type"/"typ"/)", "member \"typ\": no task has it"},
         {R"(/"name"/d)", "element 1, member \"name\": it is missing"},
-        {"/owner name/d;" + to("owner", R"(\\"54321\\")"), "no user with the id 54321"},
         {to("id", R"(\\"7x\\")"), "\"7x\" would be stored as \"7\""},
         {to("app", R"(\\"a\\\\u0000\\")"), "member \"app\": it holds a NUL"},
         {"$d", "is no JSON"},
@@ -547,8 +526,6 @@ TEST_F(CommandLine, RunsNowAndFollows) {
     EXPECT_EQ(readFile("/tmp/ran"), "none 0022\n"); // nothing of the caller's
     ended(128 + 9, "run 3 --wait");
     EXPECT_EQ(done("run 1"), "task 1 (Task 1): started\n");
-    EXPECT_THAT(done("history 3"), ContainsRegex("\n6  3  Task 3  2[-: 0-9]+  2[-: 0-9]+  [0-9]+ s "
-                                                 " -  [a-z]+  killed by signal 9\n"));
     EXPECT_THAT(done("show 3"), ContainsRegex("RESULT\n6  3  Task 3 .*\n[1-5]  3  Task 3 .* 9\n$"));
     EXPECT_EQ(done("history 6"), "There are no runs of task 6 (Task 6) on record.\n");
     done("remove 2 --yes");
@@ -622,25 +599,26 @@ TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
     const std::string fixed = sharedInShell(FAULTS);
     writeFile(kPower, kOffFrom4To7);
     faults().now = at("2024-02-01 12:00");
-    for (const char *const task : {"Backup --at 22:00 --owner bin --app Web",
-                                   "'Grüße, lang wie ein Satz' --at 00:30 --every 2",
-                                   "Once --once 2024-04-02 --at 22:00 --app Web",
-                                   "Scan --at 04:30 --every 6", "Quiet --monthly 9 --disabled",
-                                   "Ghost --owner ghost --at 07:00", "Past --once 2024-03-01"}) {
+    for (const char *const task :
+         {"Backup --at 22:00 --owner bin --app Web",
+          "'Grüße, lang wie ein Satz' --at 00:30 --every 2 --until 12",
+          "Once --once 2024-04-02 --at 22:00 --app Web", "Scan --at 04:30 --every 6",
+          "Quiet --monthly 9 --disabled --owner ghost", "Past --once 2024-03-01"}) {
         ended(0, "add --command true --name "s + task, fixed);
     }
     shell("sed -i /^ghost:/d /etc/passwd");
     faults().now = at("2024-03-30 21:40");
     run("run 5 --wait", fixed); // makes the database
     recorded("DELETE FROM runs; WITH given(task, age, result, number, lasted, waited, waited_for) "
-             "AS (VALUES (1, 7205, 3, 0, 3725, 0, 0), (2, 185, 7, 2, 70, 0, 0),"
-             " (2, 99999, 34, 0, 0, 90, 9), (3, -5, 40, 0, 0, 0, 0), (4, 365, 2, 0, 0, 0, 0),"
-             " (5, 180000, 6, 9, 0, 0, 0), (6, 5, 37, 0, 0, 0, 0), (7, 5, 3, 0, 0, 0, 0)), "
+             "AS (VALUES (1, 7295, 3, 0, 3725, 90, 8), (2, 185, 7, 2, 70, 0, 0),"
+             " (2, 99999, 34, 0, 0, 0, 9), (3, -5, 40, 0, 0, 0, 0), (4, 365, 2, 0, 0, 0, 0),"
+             " (5, 5, 37, 0, 0, 0, 0), (6, 180000, 6, 9, 0, 0, 0)), "
              "timed AS (SELECT *, 1000 * (" +
              std::to_string(faults().now) +
              " - age) AS asked FROM given) "
              "INSERT INTO runs SELECT NULL, task, 0, task = 1, 0, result, number, 0, asked,"
-             " iif(result < 32, asked, 0), iif(result = 2, 0, asked + 1000 * lasted),"
+             " iif(result < 32, asked + 1000 * waited, 0),"
+             " iif(result = 2, 0, asked + 1000 * (waited + lasted)),"
              " 1000 * lasted, iif(waited, asked, 0), waited, waited_for, 0, 1, 0, '', 'x'"
              " FROM timed");
     const Texts cases = {
@@ -650,111 +628,93 @@ TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
        2  Grüße, lang wie ein Sa…  enabled   daily 00:30 every 2 h u…  2024-03-31 00:30  root   ^[31mfailed: exit 2 3 min ago^[0m
        3  Once                     enabled   once on 2024-04-02 at 2…  2024-04-02 22:00  root   ^[31mmissed just now^[0m
        4  Scan                     enabled   daily 04:30 every 6 h u…  2024-03-31 04:30  root   ^[31mfailed: interrupted 6 m…^[0m
-       5  Quiet                    ^[2mdisabled^[0m  monthly on day 9 at 00:…  -                 root   ^[31mfailed: killed by signa…^[0m
-       6  Ghost                    enabled   daily 07:00               2024-03-31 07:00  4646   ^[31mfailed: not started: no…^[0m
-       7  Past                     done      once on 2024-03-01 at 0…  never             root   ^[32mok just now^[0m
+       5  Quiet                    ^[2mdisabled^[0m  monthly on day 9 at 00:…  -                 4646   ^[31mfailed: not started: no…^[0m
+       6  Past                     done      once on 2024-03-01 at 0…  never             root   ^[31mfailed: killed by signa…^[0m
 71270700  PowerOn task 0           enabled   daily 07:00               2024-03-31 07:00  root   -
 91270400  PowerOff task 0          enabled   daily 04:00               2024-03-31 04:00  root   -
 )"},
-        {"next 2 4 --until 12h", R"(
+        {"next 2 4 --number 4", R"(
 ^[1mSTART^[0m                 ^[1mID^[0m  ^[1mNAME^[0m                      ^[1mOWNER^[0m
 Sun 2024-03-31 00:30   2  Grüße, lang wie ein Satz  root
 Sun 2024-03-31 04:30   2  Grüße, lang wie ein Satz  root
 Sun 2024-03-31 04:30   4  Scan                      root
 Sun 2024-03-31 06:30   2  Grüße, lang wie ein Satz  root
-Sun 2024-03-31 08:30   2  Grüße, lang wie ein Satz  root
-Sun 2024-03-31 10:30   2  Grüße, lang wie ein Satz  root
-Sun 2024-03-31 10:30   4  Scan                      root
 )"},
         {"history", R"(
 ^[1mRUN^[0m  ^[1mTASK^[0m  ^[1mNAME^[0m  ^[1mSTART^[0m                ^[1mEND^[0m                  ^[1mDURATION^[0m    ^[1mWAITED^[0m      ^[1mSTARTED BY^[0m  ^[1mRESULT^[0m
   4     3  x     2024-03-30 22:40:05  2024-03-30 22:40:05  -           -           root        ^[31mmissed^[0m
-  8     7  x     2024-03-30 22:39:55  2024-03-30 22:39:55  0 s         -           root        ^[32mok^[0m
-  7     6  x     2024-03-30 22:39:55  2024-03-30 22:39:55  -           -           root        ^[31mnot started: no such user^[0m
+  6     5  x     2024-03-30 22:39:55  2024-03-30 22:39:55  -           -           root        ^[31mnot started: no such user^[0m
   2     2  x     2024-03-30 22:36:55  2024-03-30 22:38:05  1 min 10 s  -           root        ^[31mexit 2^[0m
   5     4  x     2024-03-30 22:33:55  -                    -           -           root        ^[31minterrupted^[0m
-  1     1  x     2024-03-30 20:39:55  2024-03-30 21:42:00  1 h 2 min   -           cron        ^[32mok^[0m
-  3     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           1 min 30 s  root        ^[31mgiven up, task 9 was run…^[0m
-  6     5  x     2024-03-28 20:40:00  2024-03-28 20:40:00  0 s         -           root        ^[31mkilled by signal 9^[0m
+  1     1  x     2024-03-30 20:39:55  2024-03-30 21:42:00  1 h 2 min   1 min 30 s  cron        ^[32mok^[0m
+  3     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           -           root        ^[31mgiven up, task 9 was run…^[0m
+  7     6  x     2024-03-28 20:40:00  2024-03-28 20:40:00  0 s         -           root        ^[31mkilled by signal 9^[0m
 )"},
-        {"history 2 --json",
-         R"J({"asked":"2024-03-30T22:36:55+01:00","byCron":false,"due":null,"duration":70.0,
-"end":"2024-03-30T22:38:05+01:00","name":"x","number":2,"outputKept":0,"outputSize":0,
-"owner":"root","pid":1,"result":"exit2","run":2,"start":"2024-03-30T22:36:55+01:00",
-"startedBy":"root","statusCode":7,"task":2,"taskRemoved":false,"waited":0,"waitedFor":null,
-"waitingSince":null}{"asked":"2024-03-29T18:53:21+01:00","byCron":false,"due":null,
-"duration":null,"end":"2024-03-29T18:53:21+01:00","name":"x","number":0,"outputKept":0,
-"outputSize":0,"owner":"root","pid":1,"result":"givenup,task9wasrunning","run":3,"start":null,
-"startedBy":"root","statusCode":34,"task":2,"taskRemoved":false,"waited":90,"waitedFor":9,
-"waitingSince":"2024-03-29T18:53:21+01:00"})J"},
+        {"history 1 --json",
+         R"J({"asked":"2024-03-30T20:38:25+01:00","byCron":true,"due":null,"duration":3725.0,
+"end":"2024-03-30T21:42:00+01:00","name":"x","number":0,"outputKept":0,"outputSize":0,
+"owner":"root","pid":1,"result":"ok","run":1,"start":"2024-03-30T20:39:55+01:00",
+"startedBy":null,"statusCode":3,"task":1,"taskRemoved":false,"waited":90,"waitedFor":8,
+"waitingSince":"2024-03-30T20:38:25+01:00"})J"},
         {"calendar --days 2", R"(
                            ^[1mFri 2024-03-29          Sat 2024-03-30          Sun 2024-03-31^[0m
                            ^[2m0  3  6  9  12 15 18 21 0  3  6  9  12 15 18 21 0  3  6  9  12 15 18 21^[0m
 ^[2mnow^[0m                                                                      v
 1 Backup                   ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m             ^[32m+^[0m   ^[2m│^[0m   ^[2m░░░^[0m               ^[1mo^[0m
-2 Grüße, lang wie ein Satz ^[2m│^[0m   ^[2m░░░^[0m           ^[31mx^[0m     ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[1mo^[0m   ^[31m!^[0m^[2m░^[0m^[31m!^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m
+2 Grüße, lang wie ein Satz ^[2m│^[0m   ^[2m░░░^[0m           ^[31mx^[0m     ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[1mo^[0m   ^[31m!^[0m^[2m░^[0m^[31m!^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m
 3 Once                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31m?^[0m ^[2m│^[0m   ^[2m░░░^[0m
 4 Scan                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[2m│^[0m   ^[31m!^[0m^[2m░░^[0m   ^[1mo^[0m     ^[1mo^[0m     ^[1mo^[0m
-5 Quiet                    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m
-6 Ghost                    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[2m│^[0m   ^[2m░░░^[0m^[31m!^[0m
-7 Past                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[32m+^[0m ^[2m│^[0m   ^[2m░░░^[0m
+5 Quiet                    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[2m│^[0m   ^[2m░░░^[0m
+6 Past                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m
 71270700 PowerOn task 0    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m^[1mo^[0m
 91270400 PowerOff task 0   ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[1mo^[0m^[2m░░^[0m
-^[2msame minute^[0m                                                                    *     *     *     *
+^[2msame minute^[0m                                                                    *     *
 
 A column is 1 h.  o start  + ok  x failed  ? missed  ! start while the machine is off  ░ machine off
 Same minute: Sun 2024-03-31 04:30, tasks 2 4
 Same minute: Sun 2024-03-31 10:30, tasks 2 4
-Same minute: Sun 2024-03-31 16:30, tasks 2 4
-and 1 more, which --json lists
 )"},
         {"calendar --days 15 --past 0", R"(
                            Sa 30 Su 31 Mo 01 Tu 02 We 03 Th 04 Fr 05 Sa 06 Su 07 Mo 08 Tu 09 We 10 Th 11 Fr 12 Sa 13
                            0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12
 now                             v
 1 Backup                   │░   +│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o
-2 Grüße, lang wie ein Satz │░   xo!22222!22222!22222!22222!22222!22222!22222!22222!22222!22222!22222!22222!22222!2222
+2 Grüße, lang wie ein Satz │░   xo!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o
 3 Once                     │░   ?│░    │░    │░   o│░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
 4 Scan                     │░   x│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo
-5 Quiet                    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
-6 Ghost                    │░   x│!    │!    │!    │!    │!    │!    │!    │!    │!    │!    │!    │!    │!    │!
-7 Past                     │░   +│░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
+5 Quiet                    │░   x│░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
+6 Past                     │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
 71270700 PowerOn task 0    │░    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o
 91270400 PowerOff task 0   │░    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o
-same minute                       ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** ** **
+same minute                       **    **    **  * **    **    **    **    **    **    **    **    **    **    **
 
 A column is 4 h.  o start  2 several, # ten or more  + ok  x failed  ? missed  ! start while the machine is off
 ░ machine off
 Same minute: Sun 2024-03-31 04:30, tasks 2 4
 Same minute: Sun 2024-03-31 10:30, tasks 2 4
-Same minute: Sun 2024-03-31 16:30, tasks 2 4
-and 54 more, which --json lists
+Same minute: Mon 2024-04-01 04:30, tasks 2 4
+and 26 more, which --json lists
 )"},
         {"calendar --days 2 --past 0 --json",
          R"J({"busy":[{"tasks":[2,4],"time":"2024-03-31T04:30:00+02:00"},{"tasks":[2,4],
-"time":"2024-03-31T10:30:00+02:00"},{"tasks":[2,4],"time":"2024-03-31T16:30:00+02:00"},
-{"tasks":[2,4],"time":"2024-03-31T22:30:00+02:00"}],"days":["2024-03-30T00:00:00+01:00",
+"time":"2024-03-31T10:30:00+02:00"}],"days":["2024-03-30T00:00:00+01:00",
 "2024-03-31T00:00:00+01:00"],"from":"2024-03-30T00:00:00+01:00",
 "now":"2024-03-30T22:40:00+01:00","off":[{"from":"2024-03-30T04:00:00+01:00",
 "until":"2024-03-30T07:00:00+01:00"},{"from":"2024-03-31T04:00:00+02:00",
 "until":"2024-03-31T07:00:00+02:00"}],"tasks":[{"id":1,"name":"Backup","owner":"bin",
 "power":null,"runs":[...],"schedule":"daily22:00","starts":["2024-03-31T22:00:00+02:00"],
 "state":"enabled"},{"id":2,"name":"Grüße,langwieeinSatz","owner":"root","power":null,
-"runs":[...],"schedule":"daily00:30every2huntil23:30","starts":["2024-03-31T00:30:00+01:00",
+"runs":[...],"schedule":"daily00:30every2huntil12:30","starts":["2024-03-31T00:30:00+01:00",
 "2024-03-31T04:30:00+02:00","2024-03-31T06:30:00+02:00","2024-03-31T08:30:00+02:00",
-"2024-03-31T10:30:00+02:00","2024-03-31T12:30:00+02:00","2024-03-31T14:30:00+02:00",
-"2024-03-31T16:30:00+02:00","2024-03-31T18:30:00+02:00","2024-03-31T20:30:00+02:00",
-"2024-03-31T22:30:00+02:00"],"state":"enabled"},{"id":3,"name":"Once","owner":"root",
-"power":null,"runs":[...],"schedule":"onceon2024-04-02at22:00","starts":[],"state":"enabled"},
-{"id":4,"name":"Scan","owner":"root","power":null,"runs":[...],
+"2024-03-31T10:30:00+02:00","2024-03-31T12:30:00+02:00"],"state":"enabled"},{"id":3,
+"name":"Once","owner":"root","power":null,"runs":[...],"schedule":"onceon2024-04-02at22:00",
+"starts":[],"state":"enabled"},{"id":4,"name":"Scan","owner":"root","power":null,"runs":[...],
 "schedule":"daily04:30every6huntil23:30","starts":["2024-03-31T04:30:00+02:00",
 "2024-03-31T10:30:00+02:00","2024-03-31T16:30:00+02:00","2024-03-31T22:30:00+02:00"],
-"state":"enabled"},{"id":5,"name":"Quiet","owner":"root","power":null,"runs":[],
-"schedule":"monthlyonday9at00:00","starts":[],"state":"disabled"},{"id":6,"name":"Ghost",
-"owner":"4646","power":null,"runs":[...],"schedule":"daily07:00",
-"starts":["2024-03-31T07:00:00+02:00"],"state":"enabled"},{"id":7,"name":"Past","owner":"root",
-"power":null,"runs":[...],"schedule":"onceon2024-03-01at00:00","starts":[],"state":"enabled"},
-{"id":71270700,"name":"PowerOntask0","owner":"root","power":"on","runs":[],
+"state":"enabled"},{"id":5,"name":"Quiet","owner":"4646","power":null,"runs":[...],
+"schedule":"monthlyonday9at00:00","starts":[],"state":"disabled"},{"id":6,"name":"Past",
+"owner":"root","power":null,"runs":[],"schedule":"onceon2024-03-01at00:00","starts":[],
+"state":"enabled"},{"id":71270700,"name":"PowerOntask0","owner":"root","power":"on","runs":[],
 "schedule":"daily07:00","starts":["2024-03-31T07:00:00+02:00"],"state":"enabled"},
 {"id":91270400,"name":"PowerOfftask0","owner":"root","power":"off","runs":[],
 "schedule":"daily04:00","starts":["2024-03-31T04:00:00+02:00"],"state":"enabled"}],
@@ -796,9 +756,9 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
         const std::string filter = " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'";
         EXPECT_EQ(ended(0, "history " + (options + filter), fixed), results);
     }
-    EXPECT_EQ(ended(0, "disable 7", fixed),
-              "task 7 (Past): once on 2024-03-01 at 00:00, disabled\n");
-    EXPECT_THAT(ended(2, "enable 7", fixed), HasSubstr("has passed"));
+    EXPECT_EQ(ended(0, "disable 6", fixed),
+              "task 6 (Past): once on 2024-03-01 at 00:00, disabled\n");
+    EXPECT_THAT(ended(2, "enable 6", fixed), HasSubstr("has passed"));
 }
 
 TEST_F(CommandLine, FitsTheTerminal) {
@@ -808,9 +768,9 @@ TEST_F(CommandLine, FitsTheTerminal) {
     Task hidden = newTask();
     TAVISchedCTaskSetListable(hidden.get(), 0);
     ASSERT_EQ(TAVISchedTaskCreate(hidden.get()), 0);
-    const auto shown = [](int columns, const std::string &what, const char *terminal = "dumb") {
-        shell("script -qec 'stty cols " + std::to_string(columns) + "; TERM=" + terminal +
-              " tavisched " + what + "' /dev/null | tr -d '\\r' > /tmp/out");
+    const auto shown = [](int columns, const std::string &what) {
+        shell("script -qec 'stty cols " + std::to_string(columns) + "; TERM=dumb tavisched " +
+              what + "' /dev/null | tr -d '\\r' > /tmp/out");
         return readFile("/tmp/out");
     };
     const auto fits = [&](int columns, const std::string &what) {
@@ -824,10 +784,8 @@ TEST_F(CommandLine, FitsTheTerminal) {
     for (const char *const command : {"list", "next", "calendar"}) {
         EXPECT_THAT(done(std::string(command) + " --all"), HasSubstr("Task 2"));
     }
-    EXPECT_THAT(shown(70, "list", "xterm NO_COLOR=1"),
-                AllOf(Not(HasSubstr("\033")), HasSubstr("ID  NAME        STATE"),
-                      HasSubstr(" 1  \\u001b[2J…  enabled")));
-    EXPECT_THAT(shown(70, "list", "xterm"), HasSubstr("\033[1mNAME"));
+    EXPECT_THAT(shown(70, "list"), AllOf(Not(HasSubstr("\033")), HasSubstr("ID  NAME        STATE"),
+                                         HasSubstr(" 1  \\u001b[2J…  enabled")));
     // With a power schedule and long texts in it, nothing wraps, and what matters most stays.
     TAVISchedTaskRemove(1);
     EXPECT_EQ(done("calendar"), "There are no tasks to show; --all shows all.\n");
@@ -835,7 +793,6 @@ TEST_F(CommandLine, FitsTheTerminal) {
     done("add --name 'A name that is rather long, longer than others' --command x --every 3");
     EXPECT_THAT(shown(80, "list"), AllOf(HasSubstr("STATE"), HasSubstr("OWNER")));
     EXPECT_THAT(shown(40, "list"), AllOf(HasSubstr("90622300"), HasSubstr("NEXT RUN")));
-    EXPECT_THAT(done("list"), HasSubstr("90622300  PowerOff task 0  enabled  Mon-Fri 23:00  "));
     const std::pair<const char *, int> narrowest[] = {{"list", 40},
                                                       {"calendar --days 30", 30},
                                                       {"calendar --days 1 --past 0", 30},
@@ -848,16 +805,18 @@ TEST_F(CommandLine, FitsTheTerminal) {
     EXPECT_THAT(readFile("/tmp/out"), HasSubstr("A column is 1 h."));
 }
 
+// What keeps tasks from running is told by every command that has to do with them.
 TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
     const struct {
         const char *harm, *found;
         bool repaired;
         int problems = 1;
+        int listed = -1; // how a list ends, where it is told there too
     } cases[] = {
-        {"rm /run/crond.pid", "cron is not running", false},
+        {"rm /run/crond.pid", "cron is not running", false, 1, 0},
         {"echo 999999 > /run/crond.pid", "cron is not running", false},
         {"rm /tmp/tavischedtask", "tavischedtask is missing", true},
-        {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true},
+        {"ln -sf /nowhere /tmp/tavischedtask", "tavischedtask is missing", true, 1, 0},
         {"chown -h bin /tmp/tavischedtask", "belongs to another user", true},
         {"cd ..; mkdir -m 775 g; chgrp bin g; cp bin/tavischedtask g; ln -sf $PWD/g/tavischedtask "
          "/tmp",
@@ -874,7 +833,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"rm -r /tmp/lock; ln -s /etc /tmp/lock", "/tmp/lock must belong to root", true},
         {"chmod 777 /tmp/lock", "/tmp/lock must belong to root", true},
         {"rm /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
-        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true},
+        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true, 1, 1},
         {"chmod 666 /tmp/scheduled_tasks", "as root runs what it says", true},
         {"mkfifo /tmp/f; mv /tmp/f /tmp/scheduled_tasks", "as root runs what it says", true},
         {"chown bin scheduled_tasks", "etc/scheduled_tasks must belong to root", false},
@@ -886,12 +845,15 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"truncate -s 0 $BOTH", "that no task asks for", false},
         {"rm scheduled_tasks", "lost when the machine restarts", true},
         {"sed -i s/daily/weekly/ scheduled_tasks", "differ", false},
+        {"tavisched add --command x > /run/x; sed -i '1,/^.2]/{/2]/!d}' /tmp/scheduled_tasks",
+         "outlives a restart, differ", false, 2, 1},
         {"touch scheduled_tasks.bak", "put aside", false},
         {"sed -i /id=1/d /etc/crontab", "lacks a task's line", true},
         {"echo '# /tmp/tavischedtask' >> /etc/crontab", "that no task asks for", true},
         {"sed -i 's/^0.23/1\\t23/' /etc/crontab", "has other power-off lines", true},
         {"printf x >> /etc/crontab", "has no line feed", false, 2},
-        {"sed -i '1i60 * * * * root x' /etc/crontab", "for its line 1: the minute \"60\"", false},
+        {"sed -i '1i60 * * * * root x' /etc/crontab", "for its line 1: the minute \"60\"", false, 1,
+         0},
         {"rm /etc/crontab", "cannot be read", false},
         {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
         {"sed -i 's/^run hour=.*/run hour=x/' $BOTH", "can be read: \"run hour\": \"x\"", false, 2},
@@ -925,47 +887,27 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         ASSERT_THAT(done("check"), AllOf(HasSubstr("All is well."), Not(HasSubstr("aside"))));
         shell("rm -rf /run/etc; cp -a /usr/tavi/etc /run");
         shell("cd /usr/tavi/etc; { " + std::string(c.harm) + "; } 2> /dev/null");
+        for (const char *const command :
+             {"list", "add --command x", "edit 1 --at 1:00", "enable 1", "sync"}) {
+            if (c.listed >= 0) {
+                const bool succeeds = c.listed == 0 && command != "sync"s;
+                const std::string said = ended(succeeds ? 0 : 1, command);
+                EXPECT_THAT(said, ContainsRegex(c.found + "[^\n]*; [a-z\"]"s)) << command;
+                EXPECT_LE(std::count(said.begin(), said.end(), '\n'), 4) << said;
+            }
+        }
         failed("check");
-        EXPECT_EQ(shell("exit $(grep ^problem: /tmp/out | tee /tmp/problems | wc -l)"), c.problems);
+        EXPECT_EQ(shell("exit $(grep ^problem: /tmp/out | tee /tmp/problems | wc -l)"), c.problems)
+            << c.harm;
         EXPECT_THAT(readFile("/tmp/problems"), HasSubstr(c.found)) << c.harm;
         const std::string said = ended(c.repaired ? 0 : 1, "check --repair");
         EXPECT_TRUE(!c.repaired || said.find("repaired: ") != std::string::npos) << c.harm;
         // Nothing was lost by it, and cron's file is as good as before.
         EXPECT_THAT(said, Not(HasSubstr("the hour")));
         EXPECT_TRUE(!c.repaired || done("list").find("Task 1") != std::string::npos) << c.harm;
-        EXPECT_THAT(readFile(kCrontab), HasSubstr(c.repaired ? "id=1\n" : "")) << c.harm;
+        const bool isKept = c.repaired || c.listed >= 0;
+        EXPECT_THAT(readFile(kCrontab), HasSubstr(isKept ? "id=1\n" : "")) << c.harm;
         shell("umount -n /usr/tavi/etc 2>/dev/null");
-    }
-}
-
-TEST_F(CommandLine, TellsWhenNothingRuns) {
-    const struct {
-        const char *harm, *said;
-        int listStatus;
-    } cases[] = {
-        {"rm /run/crond.pid", "warning: cron is not running, so that no task runs; start it: ", 0},
-        {"ln -sfn /nowhere /tmp/tavischedtask",
-         "tavischedtask is missing, so that no task runs; \"tavisched check --repair\"", 0},
-        {"sed -i '1i60 * * * * root x' /etc/crontab",
-         "warning: cron ignores all of /etc/crontab for its line 1: the minute \"60\"", 0},
-        {": > /tmp/scheduled_tasks", "from which tasks are read, is missing or empty; \"", 1},
-        {"sed -i '/^.2]/,$d' /tmp/scheduled_tasks", "outlives a restart, differ; compare them", 1},
-    };
-    for (const auto &c : cases) {
-        SetUp();
-        done("add --command x");
-        done("add --command x");
-        shell(c.harm);
-        for (const char *const command :
-             {"list", "add --command x", "edit 1 --at 1:00", "enable 1", "sync"}) {
-            const bool reports = c.listStatus != 0 || std::string(command) == "sync";
-            const std::string said = ended(reports ? 1 : 0, command);
-            EXPECT_THAT(said, HasSubstr(c.said)) << command;
-            EXPECT_LE(std::count(said.begin(), said.end(), '\n'), 4) << said;
-        }
-        // What only one of the files has is not taken out of the crontab.
-        run("check --repair");
-        EXPECT_THAT(readFile(kCrontab), HasSubstr("id=2\n")) << c.harm;
     }
 }
 

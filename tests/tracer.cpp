@@ -2,7 +2,6 @@
 #include "tracer.h"
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstddef>
@@ -37,7 +36,6 @@ constexpr int kNone = -1;
 struct Kind {
     int path = kNone;       // the argument that is a path
     int descriptor = kNone; // or a descriptor
-    int length = kNone;     // the argument that says how much is written
     int flags = kNone;      // an open's flags
     bool onlyFailing = false;
     std::map<long, const char *> names{}; // by number
@@ -65,12 +63,11 @@ const std::vector<Kind> kKinds = {
                CALL(fchownat)}},
     {.path = 2, .names = {CALL(symlinkat)}},
     {.path = 0, .names = {CALL(truncate)}},
-    {.descriptor = 0, .length = 2, .names = {CALL(write), CALL(pwrite64)}},
-    {.descriptor = 0, .length = 3, .names = {CALL(sendfile)}},
-    {.descriptor = 2, .length = 4, .names = {CALL(copy_file_range)}},
     {.descriptor = 0,
-     .names = {CALL(writev), CALL(fallocate), CALL(ftruncate), CALL(fchmod), CALL(fchown),
-               CALL(utimensat), CALL(fsync), CALL(fdatasync)}},
+     .names = {CALL(write), CALL(pwrite64), CALL(sendfile), CALL(writev), CALL(fallocate),
+               CALL(ftruncate), CALL(fchmod), CALL(fchown), CALL(utimensat), CALL(fsync),
+               CALL(fdatasync)}},
+    {.descriptor = 2, .names = {CALL(copy_file_range)}},
     {.descriptor = 0,
      .onlyFailing = true,
      .names = {CALL(read), CALL(pread64), CALL(fstat), CALL(getdents64), CALL(flock)}},
@@ -121,42 +118,24 @@ std::string pathOfDescriptor(pid_t pid, uint64_t number) {
 }
 
 #if defined(__x86_64__)
-constexpr bool kCanChange = true;
-bool setArgument(pid_t pid, int argument, uint64_t value) {
-    constexpr std::array<size_t, 6> kOffsets = {offsetof(user, regs.rdi), offsetof(user, regs.rsi),
-                                                offsetof(user, regs.rdx), offsetof(user, regs.r10),
-                                                offsetof(user, regs.r8),  offsetof(user, regs.r9)};
-    return ptrace(PTRACE_POKEUSER, pid, kOffsets[static_cast<size_t>(argument)], value) == 0;
-}
 bool failCall(pid_t pid, int error) {
     return ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.orig_rax), -1L) == 0 &&
            ptrace(PTRACE_POKEUSER, pid, offsetof(user, regs.rax), -static_cast<long>(error)) == 0;
 }
 #elif defined(__aarch64__)
-constexpr bool kCanChange = true;
-bool setRegister(pid_t pid, int number, uint64_t value) {
-    user_regs_struct registers{};
-    iovec all{&registers, sizeof registers};
-    if (ptrace(PTRACE_GETREGSET, pid, NT_PRSTATUS, &all) != 0) {
-        return false;
-    }
-    registers.regs[number] = value;
-    return ptrace(PTRACE_SETREGSET, pid, NT_PRSTATUS, &all) == 0;
-}
-bool setArgument(pid_t pid, int argument, uint64_t value) {
-    return setRegister(pid, argument, value);
-}
 bool failCall(pid_t pid, int error) {
     int none = -1;
     iovec number{&none, sizeof none};
-    return ptrace(PTRACE_SETREGSET, pid, NT_ARM_SYSTEM_CALL, &number) == 0 &&
-           setRegister(pid, 0, static_cast<uint64_t>(-static_cast<int64_t>(error)));
+    user_regs_struct registers{};
+    iovec all{&registers, sizeof registers};
+    if (ptrace(PTRACE_SETREGSET, pid, NT_ARM_SYSTEM_CALL, &number) != 0 ||
+        ptrace(PTRACE_GETREGSET, pid, NT_PRSTATUS, &all) != 0) {
+        return false;
+    }
+    registers.regs[0] = static_cast<uint64_t>(-static_cast<int64_t>(error));
+    return ptrace(PTRACE_SETREGSET, pid, NT_PRSTATUS, &all) == 0;
 }
-#else
-constexpr bool kCanChange = false;
-bool setArgument(pid_t, int, uint64_t) {
-    return false;
-}
+#else // kills alone work here
 bool failCall(pid_t, int) {
     return false;
 }
@@ -177,7 +156,8 @@ class Following {
                 run_.status = pid == caller_ ? status : run_.status;
                 run_.crashed = run_.crashed || (WIFSIGNALED(status) && WTERMSIG(status) != SIGKILL);
             } else {
-                resume(pid, onStop(pid, status));
+                const int signal = onStop(pid, status);
+                ptrace(PTRACE_CONT, pid, nullptr, static_cast<long>(signal));
             }
         }
         return run_;
@@ -200,9 +180,6 @@ class Following {
             if (programs_.contains(pid)) {
                 programs_.insert(static_cast<pid_t>(child));
             }
-        } else if (WSTOPSIG(status) == (SIGTRAP | 0x80)) {
-            cut_ = 0; // the shortened write has been done
-            kill(processes_);
         } else if (event == 0) {
             return WSTOPSIG(status);
         }
@@ -226,7 +203,7 @@ class Following {
         ++run_.points;
         if (plan_.isPoint && plan_.isPoint(call, run_.points) && !run_.acted) {
             run_.call = call;
-            act(*kind, pid, info);
+            act(pid);
         }
     }
 
@@ -245,11 +222,10 @@ class Following {
         }
         return {.name = kind.names.at(static_cast<long>(info.seccomp.nr)),
                 .path = std::move(path),
-                .isPrograms = programs_.contains(pid),
-                .isWrite = kind.length != kNone};
+                .isPrograms = programs_.contains(pid)};
     }
 
-    void act(const Kind &kind, pid_t pid, const Info &info) {
+    void act(pid_t pid) {
         run_.acted = true;
         if (plan_.act == Act::KillAll) {
             kill(processes_);
@@ -257,21 +233,7 @@ class Following {
             kill({plan_.act == Act::KillCaller ? caller_ : pid});
         } else if (plan_.act == Act::Fail) {
             run_.acted = failCall(pid, plan_.error);
-        } else if (plan_.act == Act::HalfThenKillAll) {
-            run_.acted =
-                kind.length != kNone && setArgument(pid, kind.length, halfOf(kind, pid, info));
-            cut_ = run_.acted ? pid : 0;
         }
-    }
-
-    // Programs ask for more than there is.
-    static uint64_t halfOf(const Kind &kind, pid_t pid, const Info &info) {
-        const uint64_t length = info.seccomp.args[kind.length];
-        const uint64_t from = info.seccomp.args[info.seccomp.nr == __NR_copy_file_range ? 0 : 1];
-        std::error_code error;
-        return kind.length > 2
-                   ? std::min(length, fs::file_size(pathOfDescriptor(pid, from), error)) / 2
-                   : length / 2;
     }
 
     static void kill(const std::set<pid_t> &processes) {
@@ -280,21 +242,14 @@ class Following {
         }
     }
 
-    void resume(pid_t pid, int signal) const {
-        ptrace(pid == cut_ ? PTRACE_SYSCALL : PTRACE_CONT, pid, nullptr, static_cast<long>(signal));
-    }
-
     pid_t caller_;
     const Plan &plan_;
     std::set<pid_t> processes_;
     std::set<pid_t> programs_; // started by the caller, not forks of it
-    pid_t cut_ = 0;            // the process whose shortened write is being done
     Run run_;
 };
 
 } // namespace
-
-const bool kCanChangeCalls = kCanChange;
 
 Run run(const std::function<int()> &operation, const Plan &plan) {
     const pid_t caller = fork();
@@ -306,8 +261,8 @@ Run run(const std::function<int()> &operation, const Plan &plan) {
     waitpid(caller, nullptr, WUNTRACED);
     if (ptrace(PTRACE_SEIZE, caller, nullptr,
                static_cast<long>(PTRACE_O_TRACEFORK | PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE |
-                                 PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP |
-                                 PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL)) != 0) {
+                                 PTRACE_O_TRACEEXEC | PTRACE_O_TRACESECCOMP | PTRACE_O_EXITKILL)) !=
+        0) {
         std::abort();
     }
     kill(caller, SIGCONT);

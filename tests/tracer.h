@@ -1,5 +1,5 @@
 // Runs an operation in a child process, follows every process that it starts, and acts at its n-th
-// system call of a kind: kills, cuts a write short, or makes the call fail.
+// system call of a kind: kills, or makes the call fail.
 #pragma once
 
 #include <functional>
@@ -8,9 +8,6 @@
 
 namespace tracer {
 
-// False where the tracer cannot change a system call's numbers: kills alone work there.
-extern const bool kCanChangeCalls;
-
 // Which calls count.
 enum class Calls {
     Changing, // those that change files, folders or their attributes, and flushes
@@ -18,13 +15,12 @@ enum class Calls {
               // and its forks also opens, reads and the start of programs
 };
 
-enum class Act { None, KillAll, KillCaller, KillProgram, HalfThenKillAll, Fail };
+enum class Act { None, KillAll, KillCaller, KillProgram, Fail };
 
 struct Call {
     std::string name;
     std::string path; // the first that it names, or that of its descriptor
     bool isPrograms = false;
-    bool isWrite = false; // of a length that can be cut short
 };
 
 // Whether to act at a call; the first that counts is 1.

@@ -343,6 +343,7 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
     EXPECT_THAT(done("next 1 --until 7d"), HasSubstr("Nothing will run until then."));
     EXPECT_EQ(done("next --until 24h | awk 'NR > 1 { print $4 }' | sort -u | xargs"),
               "71270700 91270400\n");
+    EXPECT_THAT(done("next 71270700 -n 1 --json"), HasSubstr("\"power\": \"on\""));
     EXPECT_THAT(done("next 1 -n 1 --json"),
                 MatchesRegex("\\{.*\"owner\": \"root\",\"power\": null,\"task\": 1,\"time\": "
                              "\"2098-03-04T05:00:00[+-]..:..\"\\}\n"));
@@ -355,6 +356,7 @@ TEST_F(CommandLine, ShowsWhenTasksWillReallyRun) {
         EXPECT_THAT(done(std::string("edit 1 --daily --at 05:00") + how), HasSubstr(off)) << how;
     }
     EXPECT_THAT(done("disable 1; tavisched enable 1"), HasSubstr(off));
+    EXPECT_THAT(run("list --json"), HasSubstr("into hours in which the power"));
     EXPECT_THAT(done("add --command x --at 5:00 --app a"), AllOf(HasSubstr(off), HasSubstr(meets)));
     const std::string dry = done("edit 3 --at 05:01 --dry-run --json");
     EXPECT_THAT(dry, AllOf(HasSubstr("\"runMinute\": 1,"), HasSubstr("machine off")));
@@ -442,7 +444,18 @@ TEST_F(CommandLine, ImportsWhatPeopleWrite) {
         const char *json, *said;
         int status;
     } cases[] = {
-        {R"({"command": "x"})", "task 1 (Task 1)\n", 0},
+        {R"(
+      ^[1mID^[0m  ^[1mNAME^[0m                      ^[1mSTATE^[0m     ^[1mSCHEDULE^[0m                           ^[1mNEXT RUN^[0m          ^[1mOWNER^[0m  ^[1mLAST RUN^[0m
+       1  Backup                    enabled   daily 22:00                        2024-03-31 22:00  bin    ^[32mok yesterday^[0m
+       2  Grüße, lang wie ein Satz  enabled   daily 00:30 every 2 h until 16:30  2024-03-31 00:30  root   ^[31mfailed: exit 2 3 min ago^[0m
+       3  Once                      enabled   once on 2024-04-02 at 22:00        2024-04-02 22:00  root   ^[31mmissed just now^[0m
+       4  Scan                      enabled   daily 04:30 every 6 h until 23:30  2024-03-31 04:30  root   ^[31mfailed: interrupted 6 min ago^[0m
+       5  Quiet                     ^[2mdisabled^[0m  monthly on day 9 at 00:00          -                 4646   ^[31mfailed: not started: no such user…^[0m
+       6  Past                      done      once on 2024-03-01 at 00:00        never             root   ^[31mfailed: killed by signal 9 2 days…^[0m
+71270700  PowerOn task 0            enabled   daily 07:00                        2024-03-31 07:00  root   -
+91270400  PowerOff task 0           enabled   daily 04:00                        2024-03-31 04:00  root   -
+)",
+         "task 1 (Task 1)\n", 0},
         {R"([{"command": "x", "type": "weekly", "week": ["Mon", "Fri"], "runHour": 7}])", "", 0},
         {R"({"command": "x", "owner": "daemon", "ownerId": 77})",
          "; the owner daemon has the number 1 here, not 77\n", 0},
@@ -601,7 +614,7 @@ TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
     faults().now = at("2024-02-01 12:00");
     for (const char *const task :
          {"Backup --at 22:00 --owner bin --app Web",
-          "'Grüße, lang wie ein Satz' --at 00:30 --every 2 --until 12",
+          "'Grüße, lang wie ein Satz' --at 00:30 --every 2 --until 16",
           "Once --once 2024-04-02 --at 22:00 --app Web", "Scan --at 04:30 --every 6",
           "Quiet --monthly 9 --disabled --owner ghost", "Past --once 2024-03-01"}) {
         ended(0, "add --command true --name "s + task, fixed);
@@ -609,29 +622,30 @@ TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
     shell("sed -i /^ghost:/d /etc/passwd");
     faults().now = at("2024-03-30 21:40");
     run("run 5 --wait", fixed); // makes the database
-    recorded("DELETE FROM runs; WITH given(task, age, result, number, lasted, waited, waited_for) "
-             "AS (VALUES (1, 7295, 3, 0, 3725, 90, 8), (2, 185, 7, 2, 70, 0, 0),"
-             " (2, 99999, 34, 0, 0, 0, 9), (3, -5, 40, 0, 0, 0, 0), (4, 365, 2, 0, 0, 0, 0),"
-             " (5, 5, 37, 0, 0, 0, 0), (6, 180000, 6, 9, 0, 0, 0)), "
-             "timed AS (SELECT *, 1000 * (" +
-             std::to_string(faults().now) +
-             " - age) AS asked FROM given) "
-             "INSERT INTO runs SELECT NULL, task, 0, task = 1, 0, result, number, 0, asked,"
-             " iif(result < 32, asked + 1000 * waited, 0),"
-             " iif(result = 2, 0, asked + 1000 * (waited + lasted)),"
-             " 1000 * lasted, iif(waited, asked, 0), waited, waited_for, 0, 1, 0, '', 'x'"
-             " FROM timed");
+    recorded(
+        "DELETE FROM runs; WITH given(task, age, result, number, lasted, waited, waited_for) "
+        "AS (VALUES (1, 88090, 3, 0, 3725, 90, 8), (2, 185, 7, 2, 70, 0, 0),"
+        " (2, 99999, 34, 0, 0, 0, 9), (3, -5, 40, 0, 0, 0, 0), (4, 365, 2, 0, 0, 0, 0),"
+        " (5, 900000, 3, 0, 0, 0, 0), (6, 180000, 6, 9, 0, 0, 0), (3, 200000, 37, 0, 0, 0, 0)), "
+        "timed AS (SELECT *, 1000 * (" +
+        std::to_string(faults().now) +
+        " - age) AS asked FROM given) "
+        "INSERT INTO runs SELECT NULL, task, 0, task = 1, 0, result, number, 0, asked,"
+        " iif(result < 32, asked + 1000 * waited, 0),"
+        " iif(result = 2, 0, asked + 1000 * (waited + lasted)),"
+        " 1000 * lasted, iif(waited, asked, 0), waited, waited_for, 0, 1, 0, '', 'x'"
+        " FROM timed");
     const Texts cases = {
         {"list", R"(
-      ^[1mID^[0m  ^[1mNAME^[0m                     ^[1mSTATE^[0m     ^[1mSCHEDULE^[0m                  ^[1mNEXT RUN^[0m          ^[1mOWNER^[0m  ^[1mLAST RUN^[0m
-       1  Backup                   enabled   daily 22:00               2024-03-31 22:00  bin    ^[32mok 2 h ago^[0m
-       2  Grüße, lang wie ein Sa…  enabled   daily 00:30 every 2 h u…  2024-03-31 00:30  root   ^[31mfailed: exit 2 3 min ago^[0m
-       3  Once                     enabled   once on 2024-04-02 at 2…  2024-04-02 22:00  root   ^[31mmissed just now^[0m
-       4  Scan                     enabled   daily 04:30 every 6 h u…  2024-03-31 04:30  root   ^[31mfailed: interrupted 6 m…^[0m
-       5  Quiet                    ^[2mdisabled^[0m  monthly on day 9 at 00:…  -                 4646   ^[31mfailed: not started: no…^[0m
-       6  Past                     done      once on 2024-03-01 at 0…  never             root   ^[31mfailed: killed by signa…^[0m
-71270700  PowerOn task 0           enabled   daily 07:00               2024-03-31 07:00  root   -
-91270400  PowerOff task 0          enabled   daily 04:00               2024-03-31 04:00  root   -
+      ^[1mID^[0m  ^[1mNAME^[0m                      ^[1mSTATE^[0m     ^[1mSCHEDULE^[0m                           ^[1mNEXT RUN^[0m          ^[1mOWNER^[0m  ^[1mLAST RUN^[0m
+       1  Backup                    enabled   daily 22:00                        2024-03-31 22:00  bin    ^[32mok yesterday^[0m
+       2  Grüße, lang wie ein Satz  enabled   daily 00:30 every 2 h until 16:30  2024-03-31 00:30  root   ^[31mfailed: exit 2 3 min ago^[0m
+       3  Once                      enabled   once on 2024-04-02 at 22:00        2024-04-02 22:00  root   ^[31mmissed just now^[0m
+       4  Scan                      enabled   daily 04:30 every 6 h until 23:30  2024-03-31 04:30  root   ^[31mfailed: interrupted 6 min ago^[0m
+       5  Quiet                     ^[2mdisabled^[0m  monthly on day 9 at 00:00          -                 4646   ^[32mok 2024-03-20^[0m
+       6  Past                      done      once on 2024-03-01 at 00:00        never             root   ^[31mfailed: killed by signal 9 2 days…^[0m
+71270700  PowerOn task 0            enabled   daily 07:00                        2024-03-31 07:00  root   -
+91270400  PowerOff task 0           enabled   daily 04:00                        2024-03-31 04:00  root   -
 )"},
         {"next 2 4 --number 4", R"(
 ^[1mSTART^[0m                 ^[1mID^[0m  ^[1mNAME^[0m                      ^[1mOWNER^[0m
@@ -643,75 +657,77 @@ Sun 2024-03-31 06:30   2  Grüße, lang wie ein Satz  root
         {"history", R"(
 ^[1mRUN^[0m  ^[1mTASK^[0m  ^[1mNAME^[0m  ^[1mSTART^[0m                ^[1mEND^[0m                  ^[1mDURATION^[0m    ^[1mWAITED^[0m      ^[1mSTARTED BY^[0m  ^[1mRESULT^[0m
   4     3  x     2024-03-30 22:40:05  2024-03-30 22:40:05  -           -           root        ^[31mmissed^[0m
-  6     5  x     2024-03-30 22:39:55  2024-03-30 22:39:55  -           -           root        ^[31mnot started: no such user^[0m
   2     2  x     2024-03-30 22:36:55  2024-03-30 22:38:05  1 min 10 s  -           root        ^[31mexit 2^[0m
   5     4  x     2024-03-30 22:33:55  -                    -           -           root        ^[31minterrupted^[0m
-  1     1  x     2024-03-30 20:39:55  2024-03-30 21:42:00  1 h 2 min   1 min 30 s  cron        ^[32mok^[0m
-  3     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           -           root        ^[31mgiven up, task 9 was run…^[0m
+  1     1  x     2024-03-29 22:13:20  2024-03-29 23:15:25  1 h 2 min   1 min 30 s  cron        ^[32mok^[0m
+  3     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           -           root        ^[31mgiven up, task 9 was running^[0m
   7     6  x     2024-03-28 20:40:00  2024-03-28 20:40:00  0 s         -           root        ^[31mkilled by signal 9^[0m
+  8     3  x     2024-03-28 15:06:40  2024-03-28 15:06:40  -           -           root        ^[31mnot started: no such user^[0m
+  6     5  x     2024-03-20 12:40:00  2024-03-20 12:40:00  0 s         -           root        ^[32mok^[0m
 )"},
         {"history 1 --json",
-         R"J({"asked":"2024-03-30T20:38:25+01:00","byCron":true,"due":null,"duration":3725.0,
-"end":"2024-03-30T21:42:00+01:00","name":"x","number":0,"outputKept":0,"outputSize":0,
-"owner":"root","pid":1,"result":"ok","run":1,"start":"2024-03-30T20:39:55+01:00",
+         R"J({"asked":"2024-03-29T22:11:50+01:00","byCron":true,"due":null,"duration":3725.0,
+"end":"2024-03-29T23:15:25+01:00","name":"x","number":0,"outputKept":0,"outputSize":0,
+"owner":"root","pid":1,"result":"ok","run":1,"start":"2024-03-29T22:13:20+01:00",
 "startedBy":null,"statusCode":3,"task":1,"taskRemoved":false,"waited":90,"waitedFor":8,
-"waitingSince":"2024-03-30T20:38:25+01:00"})J"},
+"waitingSince":"2024-03-29T22:11:50+01:00"})J"},
         {"calendar --days 2", R"(
                            ^[1mFri 2024-03-29          Sat 2024-03-30          Sun 2024-03-31^[0m
                            ^[2m0  3  6  9  12 15 18 21 0  3  6  9  12 15 18 21 0  3  6  9  12 15 18 21^[0m
 ^[2mnow^[0m                                                                      v
-1 Backup                   ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m             ^[32m+^[0m   ^[2m│^[0m   ^[2m░░░^[0m               ^[1mo^[0m
-2 Grüße, lang wie ein Satz ^[2m│^[0m   ^[2m░░░^[0m           ^[31mx^[0m     ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[1mo^[0m   ^[31m!^[0m^[2m░^[0m^[31m!^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m
+1 Backup                   ^[2m│^[0m   ^[2m░░░^[0m               ^[32m+^[0m ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[1mo^[0m
+2 Grüße, lang wie ein Satz ^[2m│^[0m   ^[2m░░░^[0m           ^[31mx^[0m     ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[1mo^[0m   ^[31m!^[0m^[2m░^[0m^[31m!^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m ^[1mo^[0m
 3 Once                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31m?^[0m ^[2m│^[0m   ^[2m░░░^[0m
 4 Scan                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[2m│^[0m   ^[31m!^[0m^[2m░░^[0m   ^[1mo^[0m     ^[1mo^[0m     ^[1mo^[0m
-5 Quiet                    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m               ^[31mx^[0m ^[2m│^[0m   ^[2m░░░^[0m
+5 Quiet                    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m
 6 Past                     ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m
 71270700 PowerOn task 0    ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m^[1mo^[0m
 91270400 PowerOff task 0   ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[2m░░░^[0m                 ^[2m│^[0m   ^[1mo^[0m^[2m░░^[0m
-^[2msame minute^[0m                                                                    *     *
+^[2msame minute^[0m                                                                    *     *     *
 
 A column is 1 h.  o start  + ok  x failed  ? missed  ! start while the machine is off  ░ machine off
 Same minute: Sun 2024-03-31 04:30, tasks 2 4
 Same minute: Sun 2024-03-31 10:30, tasks 2 4
+Same minute: Sun 2024-03-31 16:30, tasks 2 4
 )"},
         {"calendar --days 15 --past 0", R"(
                            Sa 30 Su 31 Mo 01 Tu 02 We 03 Th 04 Fr 05 Sa 06 Su 07 Mo 08 Tu 09 We 10 Th 11 Fr 12 Sa 13
                            0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12 0  12
 now                             v
-1 Backup                   │░   +│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o
-2 Grüße, lang wie ein Satz │░   xo!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o  2!2o
+1 Backup                   │░    │░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o│░   o
+2 Grüße, lang wie ein Satz │░   xo!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o 2!22o
 3 Once                     │░   ?│░    │░    │░   o│░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
 4 Scan                     │░   x│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo│!o oo
-5 Quiet                    │░   x│░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
+5 Quiet                    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
 6 Past                     │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░    │░
 71270700 PowerOn task 0    │░    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o
 91270400 PowerOff task 0   │░    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o    │o
-same minute                       **    **    **  * **    **    **    **    **    **    **    **    **    **    **
+same minute                       ** *  ** *  ** ** ** *  ** *  ** *  ** *  ** *  ** *  ** *  ** *  ** *  ** *  ** *
 
-A column is 4 h.  o start  2 several, # ten or more  + ok  x failed  ? missed  ! start while the machine is off
-░ machine off
+A column is 4 h.  o start  2 several, # ten or more  x failed  ? missed  ! start while the machine is off  ░ machine off
 Same minute: Sun 2024-03-31 04:30, tasks 2 4
 Same minute: Sun 2024-03-31 10:30, tasks 2 4
-Same minute: Mon 2024-04-01 04:30, tasks 2 4
-and 26 more, which --json lists
+Same minute: Sun 2024-03-31 16:30, tasks 2 4
+and 40 more, which --json lists
 )"},
         {"calendar --days 2 --past 0 --json",
          R"J({"busy":[{"tasks":[2,4],"time":"2024-03-31T04:30:00+02:00"},{"tasks":[2,4],
-"time":"2024-03-31T10:30:00+02:00"}],"days":["2024-03-30T00:00:00+01:00",
-"2024-03-31T00:00:00+01:00"],"from":"2024-03-30T00:00:00+01:00",
-"now":"2024-03-30T22:40:00+01:00","off":[{"from":"2024-03-30T04:00:00+01:00",
-"until":"2024-03-30T07:00:00+01:00"},{"from":"2024-03-31T04:00:00+02:00",
-"until":"2024-03-31T07:00:00+02:00"}],"tasks":[{"id":1,"name":"Backup","owner":"bin",
-"power":null,"runs":[...],"schedule":"daily22:00","starts":["2024-03-31T22:00:00+02:00"],
-"state":"enabled"},{"id":2,"name":"Grüße,langwieeinSatz","owner":"root","power":null,
-"runs":[...],"schedule":"daily00:30every2huntil12:30","starts":["2024-03-31T00:30:00+01:00",
-"2024-03-31T04:30:00+02:00","2024-03-31T06:30:00+02:00","2024-03-31T08:30:00+02:00",
-"2024-03-31T10:30:00+02:00","2024-03-31T12:30:00+02:00"],"state":"enabled"},{"id":3,
+"time":"2024-03-31T10:30:00+02:00"},{"tasks":[2,4],"time":"2024-03-31T16:30:00+02:00"}],
+"days":["2024-03-30T00:00:00+01:00","2024-03-31T00:00:00+01:00"],
+"from":"2024-03-30T00:00:00+01:00","now":"2024-03-30T22:40:00+01:00",
+"off":[{"from":"2024-03-30T04:00:00+01:00","until":"2024-03-30T07:00:00+01:00"},
+{"from":"2024-03-31T04:00:00+02:00","until":"2024-03-31T07:00:00+02:00"}],"tasks":[{"id":1,
+"name":"Backup","owner":"bin","power":null,"runs":[],"schedule":"daily22:00",
+"starts":["2024-03-31T22:00:00+02:00"],"state":"enabled"},{"id":2,"name":"Grüße,langwieeinSatz",
+"owner":"root","power":null,"runs":[...],"schedule":"daily00:30every2huntil16:30",
+"starts":["2024-03-31T00:30:00+01:00","2024-03-31T04:30:00+02:00","2024-03-31T06:30:00+02:00",
+"2024-03-31T08:30:00+02:00","2024-03-31T10:30:00+02:00","2024-03-31T12:30:00+02:00",
+"2024-03-31T14:30:00+02:00","2024-03-31T16:30:00+02:00"],"state":"enabled"},{"id":3,
 "name":"Once","owner":"root","power":null,"runs":[...],"schedule":"onceon2024-04-02at22:00",
 "starts":[],"state":"enabled"},{"id":4,"name":"Scan","owner":"root","power":null,"runs":[...],
 "schedule":"daily04:30every6huntil23:30","starts":["2024-03-31T04:30:00+02:00",
 "2024-03-31T10:30:00+02:00","2024-03-31T16:30:00+02:00","2024-03-31T22:30:00+02:00"],
-"state":"enabled"},{"id":5,"name":"Quiet","owner":"4646","power":null,"runs":[...],
+"state":"enabled"},{"id":5,"name":"Quiet","owner":"4646","power":null,"runs":[],
 "schedule":"monthlyonday9at00:00","starts":[],"state":"disabled"},{"id":6,"name":"Past",
 "owner":"root","power":null,"runs":[],"schedule":"onceon2024-03-01at00:00","starts":[],
 "state":"enabled"},{"id":71270700,"name":"PowerOntask0","owner":"root","power":"on","runs":[],
@@ -738,7 +754,7 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
         const std::string json = strstr(command, "--json")
                                      ? " | tr -d ' \\n' | sed 's/\"runs\":.{[^]]*/\"runs\":[.../g'"
                                      : "";
-        shell("script -qec 'stty cols 120; TERM=xterm " + fixed +
+        shell("script -qec 'stty cols 140; TERM=xterm " + fixed +
               (strstr(command, "--past") ? "NO_COLOR=1 " : "") + "tavisched " + command +
               "' /dev/null | tr -d '\\r' | sed 's/\033/^/g; s/ *$//'" + json + " > /tmp/out");
         std::string expected = whole;
@@ -750,7 +766,7 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
     const Texts filters = {{"2", "exit 2|given up, task 9 was running|"},
                            {"2 --since 24h", "exit 2|"},
                            {"1 --since 2020-01-01", "ok|"},
-                           {"--failed --limit 3", "missed|not started: no such user|exit 2|"},
+                           {"--failed --limit 3", "missed|exit 2|interrupted|"},
                            {"1 --failed", "There are no such runs of task 1 (Backup) on record.|"}};
     for (const auto &[options, results] : filters) {
         const std::string filter = " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'";

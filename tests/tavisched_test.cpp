@@ -121,7 +121,8 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"--app: it holds", {"--app \"$(printf '\\033[2J')\""}},
         {"accepted: on or off", {"add --power of"}},
         {"--command: a power schedule has none", {"add --power on --command x"}},
-        {"there is such a schedule already", {"add --power off --at 23:00 --weekly Mon"}},
+        {"there is such a schedule already: task 90022300 (",
+         {"add --power off --at 23:00 --weekly Mon"}},
         {"nothing is to be changed", {"edit 1"}},
         {"hour 20 is before the first run of the day at hour 21", {"edit 1 --at 21:00"}},
         {"this is no power schedule", {"edit 1 --power on"}},
@@ -264,7 +265,8 @@ TEST_F(CommandLine, PowerSchedulesAreEditedAndRefused) {
     // Beside a damaged entry the library would store and then fail.
     const std::string damaged = "[power off]\n000=1 9 99 99\n";
     writeFile(kPower, damaged);
-    for (const char *const change : {"add --power off", "sync", "export"}) {
+    for (const char *const change :
+         {"add --power off", "add --power off --dry-run", "sync", "export"}) {
         EXPECT_THAT(failed(change), HasSubstr("power schedules")) << change;
     }
     done("edit 1 --at 01:00");
@@ -624,7 +626,7 @@ TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
     run("run 5 --wait", fixed); // makes the database
     recorded(
         "DELETE FROM runs; WITH given(task, age, result, number, lasted, waited, waited_for) "
-        "AS (VALUES (1, 88090, 3, 0, 3725, 90, 8), (2, 185, 7, 2, 70, 0, 0),"
+        "AS (VALUES (1, 88090, 3, 0, 3725, 90, 8), (2, 185, 7, 2, 70, 0, 0), (2, 300, 3, 0, 1, 0, 0),"
         " (2, 99999, 34, 0, 0, 0, 9), (3, -5, 40, 0, 0, 0, 0), (4, 365, 2, 0, 0, 0, 0),"
         " (5, 900000, 3, 0, 0, 0, 0), (6, 180000, 6, 9, 0, 0, 0), (3, 200000, 37, 0, 0, 0, 0)), "
         "timed AS (SELECT *, 1000 * (" +
@@ -656,14 +658,15 @@ Sun 2024-03-31 06:30   2  Grüße, lang wie ein Satz  root
 )"},
         {"history", R"(
 ^[1mRUN^[0m  ^[1mTASK^[0m  ^[1mNAME^[0m  ^[1mSTART^[0m                ^[1mEND^[0m                  ^[1mDURATION^[0m    ^[1mWAITED^[0m      ^[1mSTARTED BY^[0m  ^[1mRESULT^[0m
-  4     3  x     2024-03-30 22:40:05  2024-03-30 22:40:05  -           -           root        ^[31mmissed^[0m
+  5     3  x     2024-03-30 22:40:05  2024-03-30 22:40:05  -           -           root        ^[31mmissed^[0m
   2     2  x     2024-03-30 22:36:55  2024-03-30 22:38:05  1 min 10 s  -           root        ^[31mexit 2^[0m
-  5     4  x     2024-03-30 22:33:55  -                    -           -           root        ^[31minterrupted^[0m
+  3     2  x     2024-03-30 22:35:00  2024-03-30 22:35:01  1 s         -           root        ^[32mok^[0m
+  6     4  x     2024-03-30 22:33:55  -                    -           -           root        ^[31minterrupted^[0m
   1     1  x     2024-03-29 22:13:20  2024-03-29 23:15:25  1 h 2 min   1 min 30 s  cron        ^[32mok^[0m
-  3     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           -           root        ^[31mgiven up, task 9 was running^[0m
-  7     6  x     2024-03-28 20:40:00  2024-03-28 20:40:00  0 s         -           root        ^[31mkilled by signal 9^[0m
-  8     3  x     2024-03-28 15:06:40  2024-03-28 15:06:40  -           -           root        ^[31mnot started: no such user^[0m
-  6     5  x     2024-03-20 12:40:00  2024-03-20 12:40:00  0 s         -           root        ^[32mok^[0m
+  4     2  x     2024-03-29 18:53:21  2024-03-29 18:53:21  -           -           root        ^[31mgiven up, task 9 was running^[0m
+  8     6  x     2024-03-28 20:40:00  2024-03-28 20:40:00  0 s         -           root        ^[31mkilled by signal 9^[0m
+  9     3  x     2024-03-28 15:06:40  2024-03-28 15:06:40  -           -           root        ^[31mnot started: no such user^[0m
+  7     5  x     2024-03-20 12:40:00  2024-03-20 12:40:00  0 s         -           root        ^[32mok^[0m
 )"},
         {"history 1 --json",
          R"J({"asked":"2024-03-29T22:11:50+01:00","byCron":true,"due":null,"duration":3725.0,
@@ -742,7 +745,7 @@ and 40 more, which --json lists
 "editDialog":"TAVI.VEX.TaskScheduler.EditDialog","editForm":"","id":3,
 "lastRun":{"asked":"2024-03-30T22:40:05+01:00","byCron":false,"due":null,"duration":null,
 "end":"2024-03-30T22:40:05+01:00","name":"x","number":0,"outputKept":0,"outputSize":0,
-"owner":"root","pid":1,"result":"missed","run":4,"start":null,"startedBy":"root",
+"owner":"root","pid":1,"result":"missed","run":5,"start":null,"startedBy":"root",
 "statusCode":40,"task":3,"taskRemoved":false,"waited":0,"waitedFor":null,"waitingSince":null},
 "lastWorkHour":0,"listable":true,"name":"Once","nextRun":"2024-04-0222:00",
 "nextStart":"2024-04-02T22:00:00+02:00","notes":["task1,ofthesameapplication,
@@ -763,8 +766,8 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
         }
         EXPECT_EQ((json.empty() ? "\n" : "") + readFile("/tmp/out"), expected) << command;
     }
-    const Texts filters = {{"2", "exit 2|given up, task 9 was running|"},
-                           {"2 --since 24h", "exit 2|"},
+    const Texts filters = {{"2", "exit 2|ok|given up, task 9 was running|"},
+                           {"2 --since 24h", "exit 2|ok|"},
                            {"1 --since 2020-01-01", "ok|"},
                            {"--failed --limit 3", "missed|exit 2|interrupted|"},
                            {"1 --failed", "There are no such runs of task 1 (Backup) on record.|"}};

@@ -738,6 +738,9 @@ and 40 more, which --json lists
 {"id":91270400,"name":"PowerOfftask0","owner":"root","power":"off","runs":[],
 "schedule":"daily04:00","starts":["2024-03-31T04:00:00+02:00"],"state":"enabled"}],
 "until":"2024-04-01T00:00:00+02:00"})J"},
+        {"show 4 | grep Last", R"(
+Last run       interrupted, started 2024-03-30 22:33:55 (6 min ago)
+)"},
         {"show 3 --json",
          R"J({"action":"","app":"Web","appArgs":"","appName":"","backend":-2,"canDeleteFromUI":true,
 "canEditFromUI":true,"canEditName":true,"canEditOwner":true,"canRunAppSameTime":true,
@@ -919,6 +922,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         EXPECT_EQ(shell("exit $(grep ^problem: /tmp/out | tee /tmp/problems | wc -l)"), c.problems)
             << c.harm;
         EXPECT_THAT(readFile("/tmp/problems"), HasSubstr(c.found)) << c.harm;
+        EXPECT_THAT(readFile("/tmp/out"), ContainsRegex("problem: .*\n  to do: ")) << c.harm;
         const std::string said = ended(c.repaired ? 0 : 1, "check --repair");
         EXPECT_TRUE(!c.repaired || said.find("repaired: ") != std::string::npos) << c.harm;
         // Nothing was lost by it, and cron's file is as good as before.

@@ -350,8 +350,6 @@ bool sched::RunRecords::openOnce(Mode mode) {
     }
     sqlite3_busy_handler(handle, onBusy, this);
     // Leaving the log to whoever writes enough saves every run two flushes.
-    int keep = 1;
-    sqlite3_file_control(handle, nullptr, SQLITE_FCNTL_PERSIST_WAL, &keep);
     sqlite3_db_config(handle, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
     const auto version = number("PRAGMA user_version", {});
     if (!version || *version > kSchema) {

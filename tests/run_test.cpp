@@ -111,9 +111,9 @@ TEST_F(Run, SkipsAndFailures) {
     change(TAVI_SCHED_STATE_NOT_EXISTED);
     EXPECT_EQ(failure(run(1)), 0x2000U);
     EXPECT_EQ(lastLog(), "sched_task_run.cpp:* task [1] does not exist. ");
-    // A backend that cannot run its tasks leaves code 0.
     change(TAVI_SCHED_STATE_DISABLED); // but not for people
     EXPECT_EQ(run(1), 0);
+    // A backend that cannot run its tasks leaves code 0.
     auto *const operation = std::exchange(SchedBackends[0].run, nullptr);
     EXPECT_EQ(run(1), 0);
     SchedBackends[0].run = operation;

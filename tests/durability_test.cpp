@@ -168,6 +168,27 @@ TEST_F(Durability, UnreadableCopyBesideTheRecord) {
     EXPECT_THAT(logs(), Contains(testing::ContainsRegex("is taken back, process [1-9]")));
 }
 
+// What cannot be told as done is taken back.
+TEST_F(Durability, RecordThatCannotGo) {
+    const State old = stateNow();
+    for (const char *const name : {"rename", "fsync"}) {
+        bool isLast = false; // the folder is flushed before, too
+        const auto run =
+            tracer::run([] { return created("new"); },
+                        {.calls = tracer::Calls::Failing,
+                         .act = tracer::Act::Fail,
+                         .isPoint =
+                             [&](const tracer::Call &call, size_t) {
+                                 isLast = isLast || (call.name == "rename" && call.path == kRecord);
+                                 return isLast && call.name == name;
+                             },
+                         .error = EIO});
+        EXPECT_EQ(WEXITSTATUS(run.status), run.acted ? 1 : 0) << name;
+        EXPECT_THAT(listOfFreshProcess(), HasSubstr("three"));
+        EXPECT_TRUE(!run.acted || stateNow() == old) << name;
+    }
+}
+
 // ---- Full file systems ----
 
 // A small file system over a folder, with what was in it.

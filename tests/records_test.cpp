@@ -466,6 +466,8 @@ TEST_F(Records, LimitsAndPruning) {
         return failure(static_cast<int>(TAVISchedRunOutputRead(run, &offset, &byte, 1, nullptr)));
     };
     EXPECT_EQ(readFrom(1, 0), 0x2000U);
+    TAVI_SCHED_RUN gone{};
+    EXPECT_EQ(failure(TAVISchedRunGet(1, &gone)), 0x2000U);
     EXPECT_EQ(readFrom(5, -1), 0x0D00U);
     logs();
     writeFile(kLimits, "[limits]\nruns_per_task=-2\nruns=x\nskipped=2\n");

@@ -204,6 +204,17 @@ TEST_F(StatusDatabase, ALockIsWaitedForAHundredTimes) {
     EXPECT_EQ(TAVISchedDBSetStatus(db_, 1, 0, 3, nullptr), -1);
     EXPECT_THAT(pauses(), IsEmpty());
     EXPECT_THAT(lastLog(), HasSubstr("error: no such table: task_status\n"));
+    int code = 0;
+    TAVI_SCHED_STATUS status{};
+    for (const int result :
+         {TAVISchedDBAddRecord(db_, newTask().get(), &code),
+          TAVISchedDBGetStatusByTaskID(db_, 1, nullptr, &code, nullptr, 0),
+          TAVISchedDBGetStatusByStatusID(db_, 1, &code, nullptr, 0),
+          TAVISchedDBIsTaskRunning(db_, 1, &status), TAVISchedDBIsAppRunning(db_, "a", &status),
+          TAVISchedDBListStatus(db_, 1, Taken::take, nullptr),
+          TAVISchedDBListLastStatus(db_, Taken::take, nullptr)}) {
+        EXPECT_EQ(result, -1);
+    }
 }
 
 // Runners that start together on a fresh machine do not trip over each other's first files.

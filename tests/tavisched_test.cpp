@@ -596,7 +596,8 @@ TEST_F(CommandLine, DoesWithoutRecords) {
     }
 }
 
-// Whole outputs, in the night before clocks go forward; "^" is an escape.
+// Whole outputs, in the night before clocks go forward; "^" is an escape. Those with --past are
+// without colours, and JSON is without blanks.
 TEST_F(CommandLine, ShowsTheSameAtTheSameTime) {
     shell("ln -sf /usr/share/zoneinfo/Europe/Berlin /etc/localtime;"
           "echo ghost:x:4646:4646::/:/bin/sh >> /etc/passwd");

@@ -153,14 +153,16 @@ TEST_F(Run, DueInThisMinute) {
 // Neither what is not due nor, when it is, what is disabled.
 TEST_F(Run, RunnerLooksAtStateAndTime) {
     const auto minute = static_cast<uint32_t>(time(nullptr) / 60);
-    Task task = storedTask();
+    storedTask();
+    Task task = storedTask(); // the only one in the end, so that no other id will do
+    TAVISchedTaskRemove(1);
     task->repeatHour = 1;
     task->lastWorkHour = 23;
     for (const uint32_t minutesFromNow : {30, 0}) {
         task->runMin = (minute + minutesFromNow) % 60;
         task->state = minutesFromNow > 0 ? TAVI_SCHED_STATE_ENABLED : TAVI_SCHED_STATE_DISABLED;
         TAVISchedTaskEdit(task.get());
-        EXPECT_EQ(shell("'" RUNNER "' --run id=1"), 0);
+        EXPECT_EQ(shell("'" RUNNER "' --run id=2"), 0);
         waitForChildren();
         EXPECT_EQ(rows(), "");
     }

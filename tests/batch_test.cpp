@@ -3,6 +3,7 @@
 #include "tavisdk.h"
 
 #include <array>
+#include <functional>
 
 namespace {
 
@@ -107,9 +108,22 @@ TEST_F(Batch, HandlersAreToldAtTheEnd) {
 // What the process starts would wait for it, and it for them.
 TEST_F(Batch, ItsOwnChildrenAreRefusedAtOnce) {
     ASSERT_EQ(TAVISchedChangeBegin(), 0);
+    const Task first = newTask();
+    first->id = 1;
     const Task second = storedTask();
-    EXPECT_EQ(inChild([] { return failure(TAVISchedTaskCreate(newTask().get())) != 0x0400; }), 0);
-    EXPECT_THAT(logs(), Contains(HasSubstr("a change waits for this process")));
+    const std::function<int()> changes[] = {
+        [] { return TAVISchedTaskCreate(newTask().get()); },
+        [&] { return TAVISchedTaskEdit(first.get()); },
+        [] { return TAVISchedTaskRemove(1); },
+        [] { return SchedBackends[0].sync(); },
+        [] { return SchedBackends[1].sync(); },
+        [] { return TAVISchedTaskCreate(powerTask("poweroff", 1, 2).get()); },
+        [] { return TAVISchedChangeBegin(); },
+        [] { return TAVISchedStart(); }};
+    for (const auto &change : changes) {
+        EXPECT_EQ(inChild([&] { return failure(change()) != 0x0400; }), 0);
+        EXPECT_THAT(logs(), Contains(HasSubstr("a change waits for this process")));
+    }
     // One that waits for the end of the batch changes tasks like any other process.
     std::array<int, 2> ends{};
     ASSERT_EQ(pipe(ends.data()), 0);

@@ -8,6 +8,7 @@
 #include <set>
 #include <sstream>
 #include <sys/mman.h>
+#include <thread>
 
 namespace {
 
@@ -99,6 +100,36 @@ TEST_F(Concurrency, WritersReadersAndRunners) {
     EXPECT_EQ(linesWith("--run id=", kCrontab), ids.size());
     EXPECT_GT(shared().looks, kReaders);
     EXPECT_EQ(shared().wrong, 0) << "of " << shared().looks;
+}
+
+// Filters of two processes change what both of them read: each waits for the other's change, and
+// none for what the other reads. What one goes on reading stays as it is.
+TEST_F(Concurrency, FiltersChangeWhatOthersRead) {
+    new (&shared()) Shared{};
+    storedTask();
+    const auto changeWhileListing = [] {
+        TAVI_SCHED_TASK *list = nullptr;
+        const int count = TAVISchedTaskListGet(&list, [](TAVI_SCHED_TASK *) {
+            for (++shared().looks; shared().looks < 2;) {
+                std::this_thread::yield();
+            }
+            shared().wrong += created("by a filter");
+            return shell(
+                       "grep -q \"READ .*:$(stat -c %i /usr/tavi/etc/scheduled_tasks.reading) 1 1\" "
+                       "/proc/locks") == 0
+                       ? 1
+                       : 0;
+        });
+        TAVISchedTaskListFree(&list);
+        return count >= 1 ? 0 : 1;
+    };
+    const auto begin = steady_clock::now();
+    const pid_t others[] = {start(changeWhileListing), start(changeWhileListing)};
+    EXPECT_EQ(exitOf(others[0]) + exitOf(others[1]), 0) << testing::PrintToString(logs());
+    EXPECT_EQ(changeWhileListing(), 0); // alone
+    EXPECT_LT(steady_clock::now() - begin, std::chrono::seconds(15));
+    EXPECT_EQ(shared().wrong, 0);
+    EXPECT_EQ(listedIds().size(), 6U);
 }
 
 // ---- Plug-in handlers ----

@@ -1,7 +1,9 @@
 // A task's hash form, and the list sort, which reads the same field table.
 #include "support.h"
 
+#include <cstring>
 #include <sstream>
+#include <utility>
 
 namespace {
 
@@ -79,6 +81,62 @@ TEST_F(Convert, TaskTakesDefaultsClampsNumbersAndIgnoresStrangers) {
         EXPECT_EQ(task.owner, 4294967295) << owner;
     }
     EXPECT_THAT(logs(), IsEmpty());
+}
+
+// Whichever allocation fails: what comes of a conversion is whole, or it has failed.
+TEST_F(Convert, WithoutMemory) {
+    const Task task = newTask();
+    ASSERT_EQ(TAVISchedInitHashFromTask(&hash_, task.get()), 0);
+    const auto texts = [&] {
+        return values({"action",
+                       "app",
+                       "app args",
+                       "app name",
+                       "can delete from ui",
+                       "can edit from ui",
+                       "can edit name",
+                       "can edit owner",
+                       "can run app same time",
+                       "can run from ui",
+                       "can run task same time",
+                       "cmd",
+                       "edit dialog",
+                       "edit form",
+                       "id",
+                       "last work hour",
+                       "listable",
+                       "name",
+                       "owner",
+                       "repeat hour",
+                       "run hour",
+                       "run min",
+                       "simple edit form",
+                       "start day",
+                       "start month",
+                       "start year",
+                       "state",
+                       "type",
+                       "week"});
+    };
+    const std::string whole = texts();
+    TAVI_SCHED_TASK read{};
+    ASSERT_EQ(TAVISchedInitTaskFromHash(hash_, &read), 0);
+    size_t failures = 0;
+    for (bool failed = true; failed;) {
+        PLATCSZHASH *const stored = std::exchange(hash_, nullptr);
+        TAVI_SCHED_TASK back{};
+        fail(Fault::Memory, ++failures);
+        hash_ = PLATCSzHashAlloc(4);
+        const bool made = hash_ && TAVISchedInitHashFromTask(&hash_, task.get()) == 0;
+        const bool taken = TAVISchedInitTaskFromHash(stored, &back) == 0;
+        failed = faults().calls[static_cast<size_t>(Fault::Memory)] >= failures;
+        fail(Fault::None);
+        EXPECT_EQ(made, hash_ && texts() == whole) << failures;
+        EXPECT_EQ(taken, std::memcmp(&back, &read, sizeof read) == 0) << failures;
+        PLATCSzHashFree(hash_);
+        hash_ = stored;
+    }
+    EXPECT_GT(failures, 20U);
 }
 
 // The conversion is the judge: what has no fault comes back as it was, and nothing else does.

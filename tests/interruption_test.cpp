@@ -464,6 +464,11 @@ TEST_P(Failing, Calls) {
     answerInChild();
     std::vector<size_t> counts(faults().calls.begin(), faults().calls.end());
     fail(Fault::None);
+    const auto isFork = [](const Call &call) {
+        return !call.isPrograms && (call.name.ends_with("fork") || call.name == "clone");
+    };
+    tryAll("a fork failed", pointsOf(tracer::Calls::Failing, 99, isFork), End::Failure,
+           failSystemCall);
     for (const auto &row : rows) {
         if (row.fault == Fault::None) {
             tryAll(row.what, pointsOf(tracer::Calls::Failing, 2 * kMost, isOurs), End::Failure,

@@ -422,6 +422,14 @@ TEST_F(Records, MissedTimes) {
     EXPECT_THAT(missed("2024-07-06 07:05"), StartsWith("04 07:00 "));
     recorded("UPDATE runs SET result=40 WHERE result=-1"); // none is awaited any more
     EXPECT_THAT(missed("2024-07-06 07:05"), StartsWith("04 07:00 "));
+    // A removal looks, too.
+    const int32_t midnight = storedTask()->id;
+    faults().now = at("2024-07-07 00:05");
+    EXPECT_EQ(TAVISchedTaskRemove(midnight), 0);
+    const auto all = runs(ofTask(-1));
+    EXPECT_TRUE(std::any_of(all.begin(), all.end(), [](const TAVI_SCHED_RUN &run) {
+        return run.isOfRemovedTask == 1 && run.due == at("2024-07-07 00:00") * 1000;
+    }));
     // Records that went were no missed times.
     writeFile(kLimits, "[limits]\nruns_per_task=1\n");
     for (const char *const moment : {"2024-07-07 07:00", "2024-07-08 07:00"}) {

@@ -144,6 +144,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"--after: Value -1 not in range", {"stop 1 --after -1"}, "\"after\""},
         {"there is no command \"frobnicate\"\n\"tavisched --help\"", {"frobnicate"}},
         {"there is no command \"lsit\"; did you mean \"list\"?", {"lsit 3"}},
+        {"did you mean \"calendar\"?", {"caalleendar", "cleendar", "caleddr", "calenddxr"}},
         {"\"--nmae foo --bar\" is not understood; did you mean \"--name\"",
          {"add --nmae foo --bar"}},
         {"did you mean \"--yes\"?\n\"tavisched remove --help\"", {"rm 1 --ye"}, "null"},
@@ -572,10 +573,10 @@ TEST_F(CommandLine, MakesUpForMissedTimes) {
     }
     EXPECT_EQ(done("run --missed"), "No task has missed its last time.\n");
     shell("touch -d '2 days ago' $RUNS/last_look");
-    done("disable 3"); // looks for them, as every change does
+    done("remove 4 --yes"); // looks for them, as every change does
     EXPECT_THAT(done("list"), ContainsRegex("1  Task 1 .*  missed "));
     run("run 2 --wait");
-    done("remove 4 --yes");
+    done("disable 3");
     EXPECT_EQ(done("run --missed --wait"),
               "task 1 (Task 1): started\nmade up\ntask 1 (Task 1): ok\n");
     EXPECT_THAT(done("history"), ContainsRegex("4  Task 4 .removed.  2.* missed\n"));
@@ -805,6 +806,12 @@ TEST_F(CommandLine, FitsTheTerminal) {
     done("add --name 'A name that is rather long, longer than others' --command x --every 3");
     EXPECT_THAT(shown(80, "list"), AllOf(HasSubstr("STATE"), HasSubstr("OWNER")));
     EXPECT_THAT(shown(40, "list"), AllOf(HasSubstr("90622300"), HasSubstr("NEXT RUN")));
+    // Each part begins with its first day, and no day is shown in part.
+    EXPECT_THAT(shown(40, "calendar --days 35 --past 0"),
+                AllOf(ContainsRegex("^ +([0-9]{2} ){9}[0-9]{2}\n"),
+                      ContainsRegex("\n +[0-9]{2} [0-9]{2}\n")));
+    EXPECT_THAT(shown(80, "calendar --hours"),
+                ContainsRegex("\n +0  3 .* 21\n[^x]*\n +0  3 .* 21\n"));
     const std::pair<const char *, int> narrowest[] = {{"list", 40},
                                                       {"calendar --days 30", 30},
                                                       {"calendar --days 1 --past 0", 30},
@@ -837,7 +844,10 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
          "others than root can replace", true},
         {"rm -r /tmp/lock", "/tmp/lock is missing", true},
         {"rm /tmp/tavischedtask; mkdir /tmp/tavischedtask", "is not the program", true},
-        {"touch /tmp/scheduled_tasks.tmp.999999", "whose process is gone", true},
+        {"touch /tmp/scheduled_tasks.tmp.999999", "999999 was left by a change whose process",
+         true},
+        {"cd /tmp; touch scheduled_tasks.tmp.999998 scheduled_tasks.tmp.999999",
+         "and 1 more were left by a change", true},
         {"mount -n -t tmpfs -o size=4k small $PWD; cp -a /run/etc/scheduled_tasks $PWD",
          "the file system of /usr/tavi/etc has no room left (bytes)", false, 3},
         {"ln -sf /bin/true /tmp/tavischedtask", "is not the program tavischedtask", true},

@@ -360,7 +360,7 @@ std::vector<std::string> commandsOf(const CLI::App &app) {
 }
 
 std::string explainExtras(const CLI::App &app, const CLI::App *sub) {
-    const std::vector<std::string> extras = app.remaining(true);
+    const std::vector<std::string> extras = app.remaining();
     const std::string first = extras.empty() ? "" : extras.front();
     if (!first.starts_with('-')) {
         return sub ? "\"" + join(extras, " ") + "\" is not expected"

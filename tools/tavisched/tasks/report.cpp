@@ -29,10 +29,9 @@ std::string effectOf(const TAVI_SCHED_TASK &task) {
 } // namespace
 
 Task asListed(const TAVI_SCHED_TASK &task, const Tasks &stored) {
-    const TAVI_SCHED_TASK *const same =
-        isPower(task) ? findSameSchedule(stored.all(), task) : stored.find(task.id);
-    Task listed = copyOf(same ? *same : task);
-    if (!same) {
+    const TAVI_SCHED_TASK *const found = stored.find(task.id);
+    Task listed = copyOf(found ? *found : task);
+    if (!found) {
         computeNextRun(*listed);
     }
     return listed;

@@ -17,6 +17,8 @@ namespace {
 constexpr size_t kMinutesOfDay = 1440;
 constexpr size_t kWidthElsewhere = 80; // than on a terminal
 constexpr std::string_view kDate = "YYYY-MM-DD";
+constexpr size_t kNumber = 2;         // digits of a day, and of an hour
+constexpr size_t kRoom = kNumber + 1; // with a blank
 
 size_t width() {
     return terminalWidth().value_or(kWidthElsewhere);
@@ -192,42 +194,40 @@ void printFields(const Fields &fields, size_t begin, size_t end) {
     std::printf("\n");
 }
 
-// A line of texts at columns; what does not fit before the next one is cut.
+// A line of texts at columns. What does not fit at its end is left out: a part of a number
+// misleads.
 void printTitles(const std::map<size_t, std::string> &titles, size_t begin, size_t end,
                  Style style) {
     std::string line;
-    for (auto title = titles.begin(); title != titles.end(); ++title) {
-        const size_t next = std::next(title) == titles.end() ? end : std::next(title)->first;
-        if (title->first < begin || title->first >= end) {
-            continue;
+    for (const auto &[column, title] : titles) {
+        if (column == begin || (column > begin && column + title.size() <= end)) {
+            line.resize(column - begin, ' ');
+            line += title.substr(0, std::max(end - column, kNumber));
         }
-        const std::string text = title->second.substr(0, std::min(next, end) - title->first);
-        line.resize(title->first - begin, ' ');
-        line += text;
     }
     std::printf("%s\n", styled(line, style).c_str());
 }
 
 // As much of a day as there is room for, with a blank behind it; of narrow days not every one.
-std::map<size_t, std::string> dayTitles(const Calendar &calendar, const Grid &grid) {
-    constexpr size_t kRoom = 3; // for two digits and a blank
+std::map<size_t, std::string> dayTitles(const Calendar &calendar, const Grid &grid, size_t begin) {
     const size_t width = grid.perDay();
     std::map<size_t, std::string> titles;
-    for (size_t day = 0; day < calendar.days.size(); day += (kRoom + width - 1) / width) {
+    for (size_t day = begin / width; day < calendar.days.size();
+         day += (kRoom + width - 1) / width) {
         const std::string name = weekDayOf(calendar.days[day]);
         const std::string date = localMinute(calendar.days[day]).substr(0, kDate.size());
         const std::string number = date.substr(kDate.find("DD"));
-        titles[day * width] = width > name.size() + 1 + date.size()     ? name + " " + date
-                              : width > name.size() + 1 + number.size() ? name + " " + number
-                              : width > number.size() + 3 ? name.substr(0, 2) + " " + number
-                                                          : number;
+        titles[std::max(day * width, begin)] =
+            width > name.size() + 1 + date.size()     ? name + " " + date
+            : width > name.size() + 1 + number.size() ? name + " " + number
+            : width > number.size() + 3               ? name.substr(0, 2) + " " + number
+                                                      : number;
     }
     return titles;
 }
 
 // Empty when the columns are too long for it.
 std::map<size_t, std::string> hourTitles(const Grid &grid) {
-    constexpr size_t kRoom = 3; // for two digits and a blank
     std::map<size_t, std::string> titles;
     for (const size_t hours : {1, 2, 3, 6, 12}) {
         const size_t step = hours * 60 / grid.minutes;
@@ -319,7 +319,7 @@ class Timeline {
 
     void printPart(size_t begin, size_t end) const {
         printLabel("", width_);
-        printTitles(dayTitles(calendar_, grid_), begin, end, Style::Strong);
+        printTitles(dayTitles(calendar_, grid_, begin), begin, end, Style::Strong);
         if (const auto hours = hourTitles(grid_); !hours.empty()) {
             printLabel("", width_);
             printTitles(hours, begin, end, Style::Faint);

@@ -187,6 +187,11 @@ TEST_F(Durability, RecordThatCannotGo) {
         EXPECT_THAT(listOfFreshProcess(), HasSubstr("three"));
         EXPECT_TRUE(!run.acted || stateNow() == old) << name;
     }
+    // Nor can a file be put back then.
+    cutOff(isCopyTo(kWorking));
+    fakes.renameFails = true;
+    EXPECT_EQ(inChild([] { return failure(SchedBackends[0].sync()) != 0x2800; }), 0);
+    EXPECT_TRUE(fs::exists(kRecord));
 }
 
 // ---- Full file systems ----

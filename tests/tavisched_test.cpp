@@ -769,6 +769,7 @@ startsinthesameminute,firston2024-04-0222:00"],"owner":"root","ownerId":0,"repea
         const std::string filter = " | sed '/RESULT/d; s/.*  //' | tr '\\n' '|'";
         EXPECT_EQ(ended(0, "history " + (options + filter), fixed), results);
     }
+    EXPECT_THAT(ended(1, "log 3", fixed), HasSubstr("no run on record that printed")); // or began
     EXPECT_EQ(ended(0, "disable 6", fixed),
               "task 6 (Past): once on 2024-03-01 at 00:00, disabled\n");
     EXPECT_THAT(ended(2, "enable 6", fixed), HasSubstr("has passed"));
@@ -880,7 +881,9 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"rm /usr/tavi/bin/tavi_poweroff_feasible_check", "missing or no program", false},
         {"sed -i 's/^run hour=.*/run hour=x/' $BOTH", "can be read: \"run hour\": \"x\"", false, 2},
         {"sed -i '/^cmd=/d' $BOTH", "\"cmd\" is missing", false, 2},
-        {"sed -i 's/^owner=.*/owner=54321/' $BOTH", "no user with the id 54321", false},
+        {"sed -i 's/^owner=.*/owner=54321/' $BOTH",
+         "problem: task 1 (Task 1): its \"owner\" is wrong: there is no user with the id 54321",
+         false},
         {"sed -i 's/^\\[1]/[5]/' $BOTH", "section [5] of /tmp/scheduled_tasks says that", false},
         {"sed -i 's/^\\[1]/[1/' $BOTH", "line 1: damaged header: [1", false, 2},
         {"echo \"$(cat scheduled_tasks)\" | tee -a $BOTH > /run/x", "[1] stands more than", false},
@@ -991,6 +994,8 @@ TEST_F(CommandLine, SaysWhatStandsInItsWay) {
     for (const char *const command : {"list", "add --command z", "check", "run 1", "export"}) {
         EXPECT_THAT(ended(1, command, "setpriv --reuid=1 "), HasSubstr("run by root"));
     }
+    shell("chmod 666 $BOTH");
+    EXPECT_THAT(failed("list"), HasSubstr("the tasks cannot be read: error 0x"));
 }
 
 } // namespace

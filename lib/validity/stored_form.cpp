@@ -84,7 +84,7 @@ Fault faultOfCommand(const Field &field, std::string_view text) {
                           std::to_string(TAVI_SCHED_MAX_COMMAND) + " bytes"};
 }
 
-Fault faultOfText(const Field &field, std::string_view text) {
+Fault faultOfStoredText(const Field &field, std::string_view text) {
     if (text.size() >= field.size) {
         return ValueFault{TAVI_SCHED_FAULT_VALUE, std::to_string(text.size()) +
                                                       " bytes; accepted: at most " +
@@ -98,7 +98,8 @@ Fault faultOfText(const Field &field, std::string_view text) {
 Fault faultOfValue(const Field &field, const char *text) {
     switch (field.kind) {
     case FieldKind::Text:
-        return sched::isCommand(field) ? faultOfCommand(field, text) : faultOfText(field, text);
+        return sched::isCommand(field) ? faultOfCommand(field, text)
+                                       : faultOfStoredText(field, text);
     case FieldKind::Enum:
         return faultOfName(field, text);
     default:

@@ -458,16 +458,20 @@ TEST_F(Records, LimitsAndPruning) {
     EXPECT_EQ(
         shell("cd /var/lib/tavischeduler; test -e runs.sqlite-wal -a $(stat -c %a output) = 700"),
         0); // the log is left to whoever writes enough
+    recorded("CREATE TRIGGER kept BEFORE DELETE ON runs BEGIN SELECT RAISE(ABORT, ''); END");
+    run(4);
+    EXPECT_THAT(logs(), Contains(HasSubstr("old records are not removed")));
+    recorded("DROP TRIGGER kept; DELETE FROM runs WHERE task_id=4");
     run(4);
     EXPECT_EQ(results(ofTask(-1)), "7:4 7:3 7:2 7:1 7:1 ");
     // Numbers go on, whatever a loss of power took: their file, records, or the last of its bytes.
-    shell("cd /var/lib/tavischeduler; rm run_number; touch output/8; touch -d @0 output/99");
+    shell("cd /var/lib/tavischeduler; rm run_number; touch output/9; touch -d @0 output/99");
     run(4);
-    EXPECT_EQ(newest(4).run, 9);
+    EXPECT_EQ(newest(4).run, 10);
     writeFile("/var/lib/tavischeduler/run_number", "3\n");
     ASSERT_EQ(TAVISchedStart(), 0);
     run(4);
-    EXPECT_EQ(newest(4).run, 10);
+    EXPECT_EQ(newest(4).run, 11);
     EXPECT_EQ(access(fileOf(99).c_str(), F_OK), -1); // nobody's
     const auto readFrom = [](int64_t run, int64_t offset) {
         char byte = 0;

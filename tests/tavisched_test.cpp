@@ -134,7 +134,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"--next: \"24\" is not accepted; accepted: a time such as 30m", {"list --next 24"}},
         {"/nowhere", {"import /nowhere"}, "null"},
         {"--sort: colour not in", {"list --sort colour"}},
-        {"task 4 (Task 4) is kept under another number", {"edit 4 --at 08:00"}},
+        {"task 4 (Task 4) is kept under another number", {"edit 4 --at 08:00", "show 4"}},
         {"\"01x\" is no id; accepted", {"remove 01x --yes"}},
         {"--limit: Value 0 not in range", {"history --limit 0"}},
         {"--since: \"2026-02-30\" is not accepted; accepted: a time",
@@ -143,7 +143,7 @@ TEST_F(CommandLine, RefusesSlipsAndChangesNothing) {
         {"\"1x\" is no run", {"log 1 --run 1x"}},
         {"--after: Value -1 not in range", {"stop 1 --after -1"}, "\"after\""},
         {"there is no command \"frobnicate\"\n\"tavisched --help\"", {"frobnicate"}},
-        {"there is no command \"lsit\"; did you mean \"list\"?", {"lsit 3"}},
+        {"\"; did you mean \"list\"?\n\"tavisched --help\"", {"lsit 3", "ilst"}},
         {"did you mean \"calendar\"?", {"caalleendar", "cleendar", "caleddr", "calenddxr"}},
         {"\"--nmae foo --bar\" is not understood; did you mean \"--name\"",
          {"add --nmae foo --bar"}},
@@ -565,6 +565,9 @@ TEST_F(CommandLine, ShowsOutputsAndStops) {
     EXPECT_THAT(failed("log 3"), HasSubstr("that printed anything"));
     shell("rm $RUNS/*/*");
     EXPECT_THAT(failed("log 2 --run 2"), HasSubstr("the output of run 2 is no longer kept"));
+    ended(0, "run 2", "prlimit --sigpending=0 ");
+    EXPECT_THAT(failed("stop 2"), HasSubstr("could not be stopped: "));
+    shell("pkill -f 'sleep 1000'");
 }
 
 TEST_F(CommandLine, MakesUpForMissedTimes) {

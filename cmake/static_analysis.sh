@@ -42,8 +42,8 @@ if [ "$found" -ne 0 ]; then
 fi
 {
     printf '%s:' "$name.ok"
-    sed '1s#^[^:]*:##' "$name.d" | sed '$s/$/ \\/'
-    printf ' %q' "${parts[@]}"
+    printf ' %s' "${parts[@]// /\\ }"
+    sed '1s#^[^:]*:##' "$name.d"
 } > "$name.d.all"
 mv "$name.d.all" "$name.d"
 touch "$name.ok"

@@ -187,7 +187,7 @@ TEST_F(Durability, RecordThatCannotGo) {
         EXPECT_THAT(listOfFreshProcess(), HasSubstr("three"));
         EXPECT_TRUE(!run.acted || stateNow() == old) << name;
     }
-    // Nor can a file be put back then.
+    // Nor does it go while a file cannot be put back.
     cutOff(isCopyTo(kWorking));
     fakes.renameFails = true;
     EXPECT_EQ(inChild([] { return failure(SchedBackends[0].sync()) != 0x2800; }), 0);

@@ -267,8 +267,8 @@ TEST_F(Run, GivesUpSilentlyAfterTwentyWaits) {
                                         std::to_string(seconds) + " secs."));
     }
     EXPECT_EQ(rows(), "1:2: ");
-    query(
-        "DELETE FROM task_status; CREATE TRIGGER kept BEFORE UPDATE ON task_status BEGIN SELECT RAISE(ABORT, ''); END");
+    query("DELETE FROM task_status; CREATE TRIGGER kept BEFORE UPDATE ON task_status "
+          "BEGIN SELECT RAISE(ABORT, ''); END");
     EXPECT_EQ(run(1), 0);
     EXPECT_THAT(lastLog(), HasSubstr("Update status record failed. id:[1][0x"));
 

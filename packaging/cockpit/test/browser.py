@@ -19,6 +19,7 @@ class Page:
             options.add_argument(argument)
         options.add_experimental_option("prefs", {"download.default_directory": DOWNLOADS})
         options.set_capability("goog:loggingPrefs", {"browser": "ALL"})
+        self.pages = 0
         self.driver = webdriver.Chrome(options=options, service=Service("/usr/bin/chromedriver"))
         self.size(1280, 900)
 
@@ -28,8 +29,8 @@ class Page:
 
     def open(self, path, wait_for, port=machine.PORT):
         """Opens a view of a new page and waits until it shows a text."""
-        self.driver.get("about:blank")
-        self.driver.get(f"{ADDRESS.format(port=port)}#/{path}")
+        self.pages += 1  # another address, as another view of the same one would be no new page
+        self.driver.get(f"{ADDRESS.format(port=port)}?{self.pages}#/{path}")
         self.until_text(wait_for)
 
     def style(self, name):

@@ -10,7 +10,12 @@
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
+#include <fstream>
 #include <functional>
+#include <regex>
+#include <set>
+#include <sstream>
+#include <syslog.h>
 #ifdef __SANITIZE_ADDRESS__
 #include <sanitizer/lsan_interface.h>
 #endif
@@ -27,7 +32,7 @@ constexpr int kInstead = 4;
 
 struct Operation {
     const char *name;
-    const char *suites;                               // 'k'illed, 't'aken back, 'f'ailing
+    const char *suites;                               // 'k'illed, 't'aken back, 'f'ailing, 'l'og
     std::function<int()> run;                         // 0, 1, or kInstead
     std::function<void()> prepare = [] {};            // on top of three tasks and a power schedule
     std::function<std::string(int)> faults = nullptr; // what else is wrong after an answer
@@ -180,13 +185,13 @@ std::string faultsOfMissed(int) {
 
 std::vector<Operation> operations(char suite) {
     std::vector<Operation> all = {
-        {"create", "kf", [] { return created("new"); }},
+        {"create", "kfl", [] { return created("new"); }},
         {"edit", "kf", editedName},
-        {"remove", "kf", [] { return -TAVISchedTaskRemove(2); }},
-        {"save", "kf", [] { return saved(); }, [] {}, nullptr, [] { return saved(1); }},
+        {"remove", "kfl", [] { return -TAVISchedTaskRemove(2); }},
+        {"save", "kfl", [] { return saved(); }, [] {}, nullptr, [] { return saved(1); }},
         {.name = "batch", .suites = "ktf", .run = batchDone, .isBatch = true},
-        {.name = "power", .suites = "kf", .run = [] { return powerCreated(); }, .isPower = true},
-        {"sync", "ktf", [] { return -TAVISchedTaskSync(); }},
+        {.name = "power", .suites = "kfl", .run = [] { return powerCreated(); }, .isPower = true},
+        {"sync", "ktfl", [] { return -TAVISchedTaskSync(); }},
         {"first_create", "ktf", [] { return created("new"); },
          [] { shell("rm -r /tmp/* /usr/tavi/etc/*; sed -i /tavi/d /etc/crontab"); }},
         {"create_with_differing_files", "kt", [] { return created("new"); },
@@ -195,9 +200,9 @@ std::vector<Operation> operations(char suite) {
         {"tool_disable", "k", [] { return tool("disable", "1", "3"); }},
         {"tool_import", "f", [] { return tool("import", "--replace", "/run/tasks.json"); },
          exportTasks, faultsOfTool, nullptr, true},
-        {"list", "f", listed},
+        {"list", "fl", listed},
         {"get", "f", readById},
-        {"get_json", "f", readJson,
+        {"get_json", "fl", readJson,
          [] { TAVISchedTaskConvertToJsonById(3, jsonOf3.data(), jsonOf3.size()); }},
         {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
         {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
@@ -233,7 +238,8 @@ Try tryOf(const tracer::Run &run) {
     return tried;
 }
 
-class Interruption : public SchedTest, public testing::WithParamInterface<Operation> {
+// A machine with three tasks and a power schedule.
+class OnMachine : public SchedTest {
   protected:
     void SetUp() override {
         SchedTest::SetUp();
@@ -252,6 +258,13 @@ class Interruption : public SchedTest, public testing::WithParamInterface<Operat
         task.runMin = 17;
         ASSERT_EQ(TAVISchedTaskConvertToJson(&task, jsonOf3.data(), jsonOf3.size()), 0);
         writeFile("/run/crond.pid", std::to_string(getpid()));
+    }
+};
+
+class Interruption : public OnMachine, public testing::WithParamInterface<Operation> {
+  protected:
+    void SetUp() override {
+        OnMachine::SetUp();
         GetParam().prepare();
         start_.emplace();
         old_ = stateNow(listOfFreshProcess());
@@ -482,6 +495,86 @@ TEST_P(Failing, Calls) {
                    fail(Fault::None);
                    return Try{.acted = true, .where = "", .answer = answered};
                });
+    }
+}
+
+// ---- What is told of failures ----
+
+using Lines = std::set<std::string>;
+const std::vector<std::string> kNone;
+
+// A line of the log without what differs from try to try. Where a line's number is no stable one,
+// and what set a code, does not count.
+std::string toldBy(std::string line) {
+    static const std::pair<std::regex, const char *> kParts[] = {
+        {std::regex("\n$"), ""},
+        {std::regex("(tmp\\.|process )\\d+"), "$1*"},
+        {std::regex("^(?!backends/backend_tavischedule)([^:]*):\\d+ "), "$1:* "},
+        {std::regex(" ?\\[0x([0-9A-F]+) [^ ]*\\]$"), " | $1"}};
+    for (const auto &[part, instead] : kParts) {
+        line = std::regex_replace(line, part, instead);
+    }
+    return line;
+}
+
+// A line of the file stands for one with each of its codes.
+Lines expectedLines() {
+    std::ifstream file(FAILURES);
+    Lines lines;
+    for (std::string line; std::getline(file, line);) {
+        const size_t end = line.find(" | ");
+        std::istringstream codes(end == std::string::npos ? "" : line.substr(end + 2));
+        for (std::string code; codes >> code;) {
+            lines.insert(line.substr(0, end + 3) + code);
+        }
+        if (end == std::string::npos && !line.starts_with("#")) {
+            lines.insert(line);
+        }
+    }
+    return lines;
+}
+
+std::string onlyIn(const Lines &some, const Lines &others) {
+    std::string text;
+    for (const std::string &line : some) {
+        text += others.contains(line) ? "" : line + "\n";
+    }
+    return text;
+}
+
+class Failures : public OnMachine {};
+
+// Whatever call fails on the way.
+TEST_F(Failures, AreLogged) {
+    const Snapshot before;
+    Lines told;
+    for (const Operation &operation : operations('l')) {
+        const auto run = [&] {
+            PLATCErrSetEx(0, "", 0);
+            const int answer = operation.run();
+            if (answer != 0) {
+                syslog(LOG_ERR, "%s answers %d [0x%04X ]", operation.name, answer, PLATCErrGet());
+            }
+            return answer;
+        };
+        tracer::Plan plan{.calls = tracer::Calls::Failing, .act = Act::Fail, .error = EIO};
+        operation.prepare();
+        size_t point = 0;
+        for (bool acted = true; acted; point += kStep) {
+            before.restore();
+            logs();
+            plan.isPoint = tracer::at(point + 1);
+            const auto tried = tracer::run(run, plan);
+            acted = tried.acted;
+            for (const std::string &line : isOurs(tried.call) ? logs(true) : kNone) {
+                told.insert(toldBy(line));
+            }
+        }
+    }
+    const Lines expected = expectedLines();
+    EXPECT_EQ(onlyIn(told, expected), "") << "are not in " << FAILURES;
+    if (kStep == 1) {
+        EXPECT_EQ(onlyIn(expected, told), "") << "are not logged";
     }
 }
 

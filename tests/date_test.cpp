@@ -109,15 +109,18 @@ TEST_F(Dates, NextTriggerTime) {
     setenv("TZ", kSummerTime, 1);
     Task task = taskOf({"2024-07-01 23:30", Daily, {}, {}, 0, 0, "", "2024-07-03 00:00"});
     task->id = 7;
-    for (const int result : {0, -1}) {
-        fail(result != 0 ? Fault::Time : Fault::None);
-        EXPECT_EQ(TAVISchedNextTriggerTime(task.get()), result);
+    for (const size_t failing : {0, 1, 2}) {
+        fail(failing > 0 ? Fault::Time : Fault::None, failing);
+        EXPECT_EQ(TAVISchedNextTriggerTime(task.get()), failing > 0 ? -1 : 0);
         EXPECT_STREQ(task->nextTriggerTime, "2024-07-03 00:00");
     }
-    EXPECT_THAT(logs(), ElementsAre(HasSubstr("sched_util.cpp:* localtime failed. "),
-                                    "sched_date.cpp:* get date failed. [0x2A00 sched_util.cpp:*]",
-                                    "sched_date.cpp:* get trigger date failed. [7] "
-                                    "[0x2A00 sched_util.cpp:*]"));
+    EXPECT_THAT(logs(),
+                ElementsAre(HasSubstr("sched_util.cpp:* localtime failed. "),
+                            "sched_date.cpp:* get date failed. [0x2A00 sched_util.cpp:*]",
+                            HasSubstr("get trigger date failed. [7] [0x2A00 sched_util.cpp:*]"),
+                            HasSubstr("sched_date.cpp:* mktime failed. "),
+                            HasSubstr("date normalization failed. [0x2A00 sched_date.cpp:*]"),
+                            HasSubstr("get trigger date failed. [7] [0x2A00 sched_date.cpp:*]")));
 }
 
 } // namespace

@@ -200,7 +200,7 @@ std::vector<Operation> operations(char suite) {
         {"tool_disable", "k", [] { return tool("disable", "1", "3"); }},
         {"tool_import", "f", [] { return tool("import", "--replace", "/run/tasks.json"); },
          exportTasks, faultsOfTool, nullptr, true},
-        {"list", "fl", listed},
+        {"list", "f", listed},
         {"get", "f", readById},
         {"get_json", "fl", readJson,
          [] { TAVISchedTaskConvertToJsonById(3, jsonOf3.data(), jsonOf3.size()); }},
@@ -238,8 +238,7 @@ Try tryOf(const tracer::Run &run) {
     return tried;
 }
 
-// A machine with three tasks and a power schedule.
-class OnMachine : public SchedTest {
+class Interruption : public SchedTest, public testing::WithParamInterface<Operation> {
   protected:
     void SetUp() override {
         SchedTest::SetUp();
@@ -258,13 +257,6 @@ class OnMachine : public SchedTest {
         task.runMin = 17;
         ASSERT_EQ(TAVISchedTaskConvertToJson(&task, jsonOf3.data(), jsonOf3.size()), 0);
         writeFile("/run/crond.pid", std::to_string(getpid()));
-    }
-};
-
-class Interruption : public OnMachine, public testing::WithParamInterface<Operation> {
-  protected:
-    void SetUp() override {
-        OnMachine::SetUp();
         GetParam().prepare();
         start_.emplace();
         old_ = stateNow(listOfFreshProcess());
@@ -397,6 +389,49 @@ TEST_P(TakingBack, Killed) {
     }
 }
 
+// ---- What is told of failures ----
+
+using Lines = std::set<std::string>;
+
+// A line of the log without what differs from try to try. Where a line's number is no stable one,
+// and what set a code, does not count.
+std::string toldBy(std::string line) {
+    static const std::pair<std::regex, const char *> kParts[] = {
+        {std::regex("\n$"), ""},
+        {std::regex("(tmp\\.|process )\\d+"), "$1*"},
+        {std::regex("^(?!backends/backend_tavischedule)([^:]*):\\d+ "), "$1:* "},
+        {std::regex(" ?\\[0x([0-9A-F]+) [^ ]*\\]$"), " | $1"}};
+    for (const auto &[part, instead] : kParts) {
+        line = std::regex_replace(line, part, instead);
+    }
+    return line;
+}
+
+// A line of the operation's file stands for one with each of its codes.
+Lines expectedOf(const std::string &operation) {
+    std::ifstream file(FAILURES + operation);
+    Lines lines;
+    for (std::string line; std::getline(file, line);) {
+        const size_t end = line.find(" | ");
+        std::istringstream codes(end == std::string::npos ? "" : line.substr(end + 2));
+        for (std::string code; codes >> code;) {
+            lines.insert(line.substr(0, end + 3) + code);
+        }
+        if (end == std::string::npos && !line.starts_with("#")) {
+            lines.insert(line);
+        }
+    }
+    return lines;
+}
+
+std::string onlyIn(const Lines &some, const Lines &others) {
+    std::string text;
+    for (const std::string &line : some) {
+        text += others.contains(line) ? "" : line + "\n";
+    }
+    return text;
+}
+
 // ---- Failing ----
 
 // Those of a program's libraries and of its start are not ours.
@@ -416,6 +451,9 @@ int answer() {
     PLATCErrSetEx(0, "", 0);
     const int answer = testing::WithParamInterface<Operation>::GetParam().run();
     const bool isKnown = std::find(kCodes.begin(), kCodes.end(), PLATCErrGet()) != kCodes.end();
+    if (answer != 0) {
+        syslog(LOG_ERR, "answers %d [0x%04X ]", answer, PLATCErrGet());
+    }
     return answer == 1 && !isKnown ? 3 : answer;
 }
 
@@ -438,12 +476,10 @@ int answerInChild() {
     return answered;
 }
 
-Try failSystemCall(size_t point) {
+Try failSystemCallWith(size_t point, const std::function<int(const Call &)> &errorAt) {
     tracer::Plan plan{.calls = tracer::Calls::Failing, .act = Act::Fail};
     plan.isPoint = [&](const Call &call, size_t number) {
-        constexpr std::array<int, 3> kOpening = {ENOSPC, EMFILE, EACCES};
-        constexpr std::array<int, 3> kOthers = {EIO, ENOMEM, ENOSPC};
-        plan.error = (call.name.starts_with("open") ? kOpening : kOthers)[point % 3];
+        plan.error = errorAt(call);
         return number == point;
     };
     const auto run = tracer::run(answer, plan);
@@ -453,6 +489,14 @@ Try failSystemCall(size_t point) {
     Try tried = tryOf(run);
     tried.acted = tried.acted && isOurs(run.call); // a minute may have passed
     return tried;
+}
+
+Try failSystemCall(size_t point) {
+    return failSystemCallWith(point, [point](const Call &call) {
+        constexpr std::array<int, 3> kOpening = {ENOSPC, EMFILE, EACCES};
+        constexpr std::array<int, 3> kOthers = {EIO, ENOMEM, ENOSPC};
+        return (call.name.starts_with("open") ? kOpening : kOthers)[point % 3];
+    });
 }
 
 class Failing : public Interruption {};
@@ -498,88 +542,29 @@ TEST_P(Failing, Calls) {
     }
 }
 
-// ---- What is told of failures ----
+class Telling : public Interruption {};
 
-using Lines = std::set<std::string>;
-const std::vector<std::string> kNone;
-
-// A line of the log without what differs from try to try. Where a line's number is no stable one,
-// and what set a code, does not count.
-std::string toldBy(std::string line) {
-    static const std::pair<std::regex, const char *> kParts[] = {
-        {std::regex("\n$"), ""},
-        {std::regex("(tmp\\.|process )\\d+"), "$1*"},
-        {std::regex("^(?!backends/backend_tavischedule)([^:]*):\\d+ "), "$1:* "},
-        {std::regex(" ?\\[0x([0-9A-F]+) [^ ]*\\]$"), " | $1"}};
-    for (const auto &[part, instead] : kParts) {
-        line = std::regex_replace(line, part, instead);
-    }
-    return line;
-}
-
-// A line of the file stands for one with each of its codes.
-Lines expectedLines() {
-    std::ifstream file(FAILURES);
-    Lines lines;
-    for (std::string line; std::getline(file, line);) {
-        const size_t end = line.find(" | ");
-        std::istringstream codes(end == std::string::npos ? "" : line.substr(end + 2));
-        for (std::string code; codes >> code;) {
-            lines.insert(line.substr(0, end + 3) + code);
-        }
-        if (end == std::string::npos && !line.starts_with("#")) {
-            lines.insert(line);
-        }
-    }
-    return lines;
-}
-
-std::string onlyIn(const Lines &some, const Lines &others) {
-    std::string text;
-    for (const std::string &line : some) {
-        text += others.contains(line) ? "" : line + "\n";
-    }
-    return text;
-}
-
-class Failures : public OnMachine {};
-
-// Whatever call fails on the way.
-TEST_F(Failures, AreLogged) {
-    const Snapshot before;
+// What is logged and answered when any of the system calls fails: nothing else, and all of it.
+TEST_P(Telling, Failures) {
+    constexpr size_t kMost = kStep == 1 ? 9999 : 2;
     Lines told;
-    for (const Operation &operation : operations('l')) {
-        const auto run = [&] {
-            PLATCErrSetEx(0, "", 0);
-            const int answer = operation.run();
-            if (answer != 0) {
-                syslog(LOG_ERR, "%s answers %d [0x%04X ]", operation.name, answer, PLATCErrGet());
-            }
-            return answer;
-        };
-        tracer::Plan plan{.calls = tracer::Calls::Failing, .act = Act::Fail, .error = EIO};
-        operation.prepare();
-        size_t point = 0;
-        for (bool acted = true; acted; point += kStep) {
-            before.restore();
-            logs();
-            plan.isPoint = tracer::at(point + 1);
-            const auto tried = tracer::run(run, plan);
-            acted = tried.acted;
-            for (const std::string &line : isOurs(tried.call) ? logs(true) : kNone) {
-                told.insert(toldBy(line));
-            }
+    const auto points = pointsOf(tracer::Calls::Failing, kMost, isOurs);
+    tryAll("a system call failed", points, End::Failure, [&](size_t point) {
+        Try tried = failSystemCallWith(point, [](const Call &) { return EIO; });
+        for (const std::string &line : logs(true)) {
+            told.insert(toldBy(line));
+            tried.where += "\n" + line;
         }
-    }
-    const Lines expected = expectedLines();
-    EXPECT_EQ(onlyIn(told, expected), "") << "are not in " << FAILURES;
-    if (kStep == 1) {
-        EXPECT_EQ(onlyIn(expected, told), "") << "are not logged";
-    }
+        return tried;
+    });
+    const Lines expected = expectedOf(GetParam().name);
+    EXPECT_EQ(onlyIn(told, expected), "") << "is not in " << FAILURES << GetParam().name;
+    EXPECT_EQ(kStep == 1 ? onlyIn(expected, told) : "", "") << "is missing";
 }
 
 INSTANTIATE_TEST_SUITE_P(Operations, Interruption, testing::ValuesIn(operations('k')), nameOf);
 INSTANTIATE_TEST_SUITE_P(Operations, TakingBack, testing::ValuesIn(operations('t')), nameOf);
 INSTANTIATE_TEST_SUITE_P(Operations, Failing, testing::ValuesIn(operations('f')), nameOf);
+INSTANTIATE_TEST_SUITE_P(Operations, Telling, testing::ValuesIn(operations('l')), nameOf);
 
 } // namespace

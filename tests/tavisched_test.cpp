@@ -861,7 +861,7 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {": > /tmp/scheduled_tasks", "from which tasks are read, is missing", true, 1, 1},
         {"chmod 666 /tmp/scheduled_tasks", "as root runs what it says", true},
         {"mkfifo /tmp/f; mv /tmp/f /tmp/scheduled_tasks", "as root runs what it says", true},
-        {"chown bin scheduled_tasks", "etc/scheduled_tasks must belong to root", false},
+        {"chmod 664 scheduled_tasks", "etc/scheduled_tasks must belong to root", false},
         {"chmod 775 .", "/usr/tavi/etc must belong to root", false},
         {"echo bad > /tmp/sched_status.sqlite", "no task runs without its status database", true},
         {"chmod 664 /etc/crontab", "cron ignores /etc/crontab, which must be", false},
@@ -902,6 +902,8 @@ TEST_F(CommandLine, FindsAndRepairsWhatIsWrong) {
         {"echo no database > $RUNS/runs.sqlite", "runs.sqlite are damaged", true},
         {"head -c 4096 /dev/zero | dd of=$RUNS/runs.sqlite bs=4096 seek=1 conv=notrunc",
          "runs.sqlite are damaged", true},
+        {"printf '\\143' | dd of=$RUNS/runs.sqlite bs=1 seek=63 conv=notrunc", // a later version
+         "runs.sqlite cannot be read, and runs are not recorded", false},
         {"printf '[limits]\nruns_per_tasks=9\n' > run_records", "name runs_per_tasks", false},
     };
     for (const auto &c : cases) {

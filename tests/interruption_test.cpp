@@ -41,6 +41,10 @@ struct Operation {
     bool isPower = false;
 };
 
+void PrintTo(const Operation &operation, std::ostream *out) {
+    *out << operation.name;
+}
+
 int editedName() {
     return edited("a name of quite another length than the one it had");
 }
@@ -204,7 +208,7 @@ std::vector<Operation> operations(char suite) {
         {"get", "f", readById},
         {"get_json", "fl", readJson,
          [] { TAVISchedTaskConvertToJsonById(3, jsonOf3.data(), jsonOf3.size()); }},
-        {"first_run", "f", [] { return ran(3); }, [] {}, faultsOfRun},
+        {"first_run", "fl", [] { return ran(3); }, [] {}, faultsOfRun},
         {"run", "f", [] { return ran(3); }, runOther, faultsOfRun},
         {"missed", "f", [] { return -TAVISchedMissedRunsFind(); }, missRuns, faultsOfMissed}};
     std::erase_if(
@@ -393,13 +397,15 @@ TEST_P(TakingBack, Killed) {
 
 using Lines = std::set<std::string>;
 
-// A line of the log without what differs from try to try. Where a line's number is no stable one,
-// and what set a code, does not count.
+// A line of the log without what differs from try to try, and the code that it ends with. Numbers
+// of lines stay where they are stable ones, that of what set the code behind it.
 std::string toldBy(std::string line) {
     static const std::pair<std::regex, const char *> kParts[] = {
         {std::regex("\n$"), ""},
-        {std::regex("(tmp\\.|process )\\d+"), "$1*"},
+        {std::regex("(tmp\\.|process |sleep )\\d+"), "$1*"},
+        {std::regex("sql:\\[([A-Z]+ [^ ]+).*"), "sql:[$1 *"},
         {std::regex("^(?!backends/backend_tavischedule)([^:]*):\\d+ "), "$1:* "},
+        {std::regex(" ?\\[0x([0-9A-F]+) backends/backend_tavischedule.cpp(:\\d+)\\]$"), " | $1$2"},
         {std::regex(" ?\\[0x([0-9A-F]+) [^ ]*\\]$"), " | $1"}};
     for (const auto &[part, instead] : kParts) {
         line = std::regex_replace(line, part, instead);

@@ -403,6 +403,7 @@ std::string toldBy(std::string line) {
     static const std::pair<std::regex, const char *> kParts[] = {
         {std::regex("\n$"), ""},
         {std::regex("(tmp\\.|process )\\d+"), "$1*"},
+        {std::regex("tavischedtask .*;"), "tavischedtask *;"}, // who may replace it
         {std::regex("^(?!backends/backend_tavischedule)([^:]*):\\d+ "), "$1:* "},
         {std::regex(" ?\\[0x([0-9A-F]+) backends/backend_tavischedule.cpp(:\\d+)\\]$"), " | $1$2"},
         {std::regex(" ?\\[0x([0-9A-F]+) [^ ]*\\]$"), " | $1"}};

@@ -533,9 +533,12 @@ TEST_F(CommandLine, RunsNowAndFollows) {
     EXPECT_EQ(done("run 1"), "task 1 (Task 1): started\n");
     EXPECT_THAT(done("show 3"), ContainsRegex("RESULT\n6  3  Task 3 .*\n[1-5]  3  Task 3 .* 9\n$"));
     EXPECT_EQ(done("history 6"), "There are no runs of task 6 (Task 6) on record.\n");
+    const std::string second =
+        std::to_string(runs(ofTask(2)).at(0).run); // which began when it could
     done("remove 2 --yes");
     done("add --command x");
-    EXPECT_THAT(run("log 2 --run 2"), HasSubstr("run 2 is of a removed task, Task 2\n"));
+    EXPECT_THAT(run("log 2 --run " + second),
+                HasSubstr("run " + second + " is of a removed task, Task 2\n"));
     shell("pkill -x sleep");
 }
 
